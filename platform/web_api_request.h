@@ -1,0 +1,104 @@
+// Web API requests: how a program calls a method of a server's Web API.
+//
+// A server is described by a credential record (credential_store.h) with three fields set:
+// protocol, host and port. The protocols are
+//     "https"  HTTP over TLS; the server's certificate and name are verified
+//     "http"   plain HTTP
+//     "fld"    HTTPS through the platform's relay
+// and any other value fails. A request is built, sent once with Process, and read.
+//
+// What holds for every operation
+//   - Only http and https are ever spoken, a redirect is never followed, and a token goes only to
+//     the host and port of the record.
+//   - Every exchange ends by itself: connecting is limited, a stalled transfer is ended, and a reply
+//     body has a largest size.
+//   - No operation throws, except that one which returns a std::string may throw std::bad_alloc.
+//   - Connections stay open between requests of one process and are used again. A child process
+//     after fork makes its own. Requests may be used in several threads at once, each request by one
+//     thread at a time.
+//   - A failure sets the last error (last_error.h).
+
+#ifndef ZELO_PLATFORM_WEB_API_REQUEST_H
+#define ZELO_PLATFORM_WEB_API_REQUEST_H
+
+#include <json/value.h>
+
+#include <memory>
+#include <string>
+
+#include "api.h"
+#include "credential_store.h"
+
+namespace ZELO {
+
+// How the request's parameters are protected on top of what the transport does.
+enum _tag_CRED_REQ_CRYPTO {
+    CRED_REQ_CRYPTO_NONE = 0,
+    CRED_REQ_CRYPTO_TRANSPORT = 1,  // the transport's own protection is enough
+    CRED_REQ_CRYPTO_PARAMS = 2      // the parameters are to be protected themselves
+};
+
+class CredRequest;
+
+namespace CredRequestUtil {
+
+// Asks the server that pCred describes for the path under which it serves the Web API szApi, in one
+// exchange. Returns that path (it begins with "/"), or the empty string when the server cannot be
+// reached, does not answer as a server of this kind, or does not know the API.
+ZELO_PLATFORM_API std::string GetWebAPIPath(const ZELO_CRED *pCred, const std::string &api);
+
+// Makes the request a call of the method of version ver of the API on the server that pCred
+// describes: sets the request's URL. Returns true when it is set. A path that this process learnt
+// from the same server before is used again; otherwise the server is asked as by GetWebAPIPath.
+ZELO_PLATFORM_API bool SetWebAPIURL(const ZELO_CRED *pCred, const std::string &api, int ver,
+                                    const std::string &method, CredRequest *pRequest);
+
+}  // namespace CredRequestUtil
+
+// One call of a Web API method.
+class ZELO_PLATFORM_API CredRequest {
+  public:
+    // An empty request. Made with new (std::nothrow), it is null when memory is short. The creator
+    // owns it.
+    CredRequest() noexcept;
+    ~CredRequest();
+    CredRequest(const CredRequest &) = delete;
+    CredRequest &operator=(const CredRequest &) = delete;
+
+    // Adds the members of an object to the parameters of the call; a member given again replaces the
+    // earlier one. Returns false when params is no object.
+    bool AddPostParam(const Json::Value &params);
+
+    // Chooses how the parameters are protected. Returns true when the mode is accepted.
+    bool SetEncryptMode(_tag_CRED_REQ_CRYPTO mode);
+
+    // Sends the request and takes the whole reply. blKeepConnection: the connection may stay open for
+    // later requests. timeout_s: a limit for the whole exchange in seconds, 0 for the platform's own.
+    //
+    // Returns true when a reply arrived, whatever its HTTP status and body; false when the request
+    // has no URL or no whole reply arrived.
+    bool Process(bool blKeepConnection, int timeout_s);
+
+    // The body of the reply, empty before a successful Process.
+    std::string GetResponse() const;
+
+    // The request's URL, empty before it is set.
+    std::string GetURL() const;
+
+  private:
+    struct Impl;
+    friend bool CredRequestUtil::SetWebAPIURL(const ZELO_CRED *pCred, const std::string &api,
+                                              int ver, const std::string &method,
+                                              CredRequest *pRequest);
+    std::unique_ptr<Impl> m_pImpl;
+};
+
+namespace APIValidator {
+
+// Whether a number is a port number: 0 to 65535. 0 is valid and says "this port is not used".
+ZELO_PLATFORM_API bool IsPort(const int &port);
+
+}  // namespace APIValidator
+}  // namespace ZELO
+
+#endif
