@@ -1,0 +1,127 @@
+#include "json_text.h"
+
+#include <json/reader.h>
+#include <json/writer.h>
+
+#include <algorithm>
+#include <cstring>
+
+namespace json_text {
+namespace {
+
+bool IsTooDeep(const Json::Value &value, int depthLeft) {
+    if (!value.isArray() && !value.isObject()) {
+        return false;
+    }
+    if (depthLeft == 0) {
+        return true;
+    }
+    return std::any_of(value.begin(), value.end(), [depthLeft](const Json::Value &element) {
+        return IsTooDeep(element, depthLeft - 1);
+    });
+}
+
+// JsonCpp reports "* Line 3, Column 5\n  Missing ':' after object member name\nSee …": one line of it
+// is enough for a person.
+std::string OneLine(const std::string &strReport) {
+    std::string strLine;
+    for (char c : strReport) {
+        if (c == '\n' || c == ' ' || c == '*') {
+            if (!strLine.empty() && strLine.back() != ' ') {
+                strLine += ' ';
+            }
+            continue;
+        }
+        strLine += c;
+    }
+    while (!strLine.empty() && strLine.back() == ' ') {
+        strLine.pop_back();
+    }
+    return strLine;
+}
+
+}  // namespace
+
+bool ToString(const Json::Value &value, std::string &strText) {
+    if (IsTooDeep(value, kMaxDepth)) {
+        return false;
+    }
+    try {
+        Json::StreamWriterBuilder builder;
+        builder["indentation"] = "";
+        builder["commentStyle"] = "None";
+        strText = Json::writeString(builder, value);
+        return true;
+    } catch (const Json::Exception &) {
+        return false;
+    }
+}
+
+std::string ToLogText(const Json::Value &value) {
+    std::string strText = "...";
+    ToString(value, strText);
+    return strText;
+}
+
+bool FromString(const std::string &strText, Json::Value &value, std::string *pstrError) {
+    try {
+        Json::Reader reader;
+        Json::Value parsed;
+        if (reader.parse(strText, parsed, true)) {
+            value.swap(parsed);
+            return true;
+        }
+        if (pstrError != nullptr) {
+            *pstrError = OneLine(reader.getFormattedErrorMessages());
+        }
+    } catch (const Json::Exception &) {
+        if (pstrError != nullptr) {
+            *pstrError = "nested too deeply";
+        }
+    }
+    return false;
+}
+
+const Json::Value &Member(const Json::Value &object, const char *szKey) {
+    if (!object.isObject()) {
+        return Json::Value::nullSingleton();
+    }
+    return object[szKey];
+}
+
+bool HasMember(const Json::Value &object, const char *szKey) {
+    return object.isObject() && object.isMember(szKey);
+}
+
+const char *Text(const Json::Value &value) {
+    const char *szBegin = nullptr;
+    const char *szEnd = nullptr;
+    if (!value.isString() || !value.getString(&szBegin, &szEnd)) {
+        return nullptr;
+    }
+    const auto cb = static_cast<std::size_t>(szEnd - szBegin);
+    return std::memchr(szBegin, '\0', cb) == nullptr ? szBegin : nullptr;
+}
+
+bool ReadInt(const Json::Value &value, int &n) {
+    const bool blInteger = value.type() == Json::intValue || value.type() == Json::uintValue;
+    if (!blInteger || !value.isInt()) {
+        return false;
+    }
+    n = value.asInt();
+    return true;
+}
+
+bool IsTrue(const Json::Value &value) {
+    switch (value.type()) {
+        case Json::booleanValue:
+        case Json::intValue:
+        case Json::uintValue:
+        case Json::realValue:
+            return value.asBool();
+        default:
+            return false;
+    }
+}
+
+}  // namespace json_text
