@@ -1,0 +1,87 @@
+#include "appliance_ca.h"
+
+#include <openssl/bio.h>
+#include <openssl/err.h>
+#include <openssl/pem.h>
+#include <sys/stat.h>
+#include <syslog.h>
+
+#include <filesystem>
+#include <memory>
+#include <system_error>
+
+namespace host {
+namespace {
+
+namespace fs = std::filesystem;
+
+constexpr const char *kFile = "appliance_ca";
+constexpr const char *kFolder = "/usr/zelo/etc/ssl/ca.d";
+
+struct FreeBio {
+    void operator()(BIO *pBio) const { BIO_free(pBio); }
+};
+struct FreeCertificate {
+    void operator()(X509 *pCertificate) const { X509_free(pCertificate); }
+};
+
+bool IsPemName(const fs::path &path) {
+    return path.extension() == ".pem" || path.extension() == ".crt";
+}
+
+// True when the file holds at least one certificate and nothing broken.
+bool AddFile(X509_STORE *pStore, const std::string &strPath) {
+    const std::unique_ptr<BIO, FreeBio> pFile(BIO_new_file(strPath.c_str(), "r"));
+    if (pFile == nullptr) {
+        return false;
+    }
+    int count = 0;
+    while (true) {
+        const std::unique_ptr<X509, FreeCertificate> pCertificate(
+            PEM_read_bio_X509(pFile.get(), nullptr, nullptr, nullptr));
+        if (pCertificate == nullptr) {
+            // The end of the file shows as a missing start line.
+            return count > 0 && ERR_GET_REASON(ERR_peek_last_error()) == PEM_R_NO_START_LINE;
+        }
+        if (X509_STORE_add_cert(pStore, pCertificate.get()) != 1) {
+            return false;
+        }
+        ++count;
+    }
+}
+
+}  // namespace
+
+bool AddApplianceCa(X509_STORE *pStore) {
+    std::error_code error;
+    fs::directory_iterator entries(kFolder, error);
+    if (error == std::errc::no_such_file_or_directory) {
+        return true;
+    }
+    bool blAll = !error;
+    std::string strPath = kFolder;
+    for (; blAll && entries != fs::directory_iterator(); entries.increment(error)) {
+        if (IsPemName(entries->path())) {
+            strPath = entries->path().string();
+            blAll = AddFile(pStore, strPath);
+        }
+        blAll = blAll && !error;
+    }
+    ERR_clear_error();
+    if (!blAll) {
+        syslog(LOG_ERR, "%s:%d cannot read certificates from '%s': mend or remove it", kFile,
+               __LINE__, strPath.c_str());
+    }
+    return blAll;
+}
+
+std::string ApplianceCaState() {
+    struct stat status = {};
+    if (stat(kFolder, &status) != 0) {
+        return "none";
+    }
+    return std::to_string(status.st_dev) + ':' + std::to_string(status.st_ino) + ':' +
+           std::to_string(status.st_mtim.tv_sec) + '.' + std::to_string(status.st_mtim.tv_nsec);
+}
+
+}  // namespace host

@@ -1,0 +1,359 @@
+// HTTP exchanges on pooled libcurl handles.
+
+#include "http_exchange.h"
+
+#include <curl/curl.h>
+#include <openssl/ssl.h>
+#include <pthread.h>
+#include <sys/socket.h>
+#include <syslog.h>
+#include <unistd.h>
+
+#include <array>
+#include <memory>
+#include <mutex>
+#include <new>
+#include <set>
+
+#include "appliance_ca.h"
+#include "key_value_lookup.h"
+#include "last_error.h"
+
+namespace host {
+namespace {
+
+constexpr const char *kFile = "http_exchange";
+
+constexpr long kConnectTimeout_s = 10;
+constexpr long kStallBytesPerSecond = 1;
+constexpr long kStallTime_s = 30;
+constexpr long kWholeTimeout_s = 300;
+constexpr std::size_t kMaxBody = 16 * 1024 * 1024;
+
+// More idle handles than this are not kept.
+constexpr std::size_t kMaxIdle = 8;
+
+struct CleanupEasy {
+    void operator()(CURL *pEasy) const { curl_easy_cleanup(pEasy); }
+};
+struct FreeList {
+    void operator()(curl_slist *pList) const { curl_slist_free_all(pList); }
+};
+struct CleanupUrl {
+    void operator()(CURLU *pUrl) const { curl_url_cleanup(pUrl); }
+};
+struct FreeText {
+    void operator()(char *sz) const { curl_free(sz); }
+};
+
+// A handle with the connections that it keeps. The sockets are known by number, so that a child
+// process can close its copies without a word on the wire.
+struct Connection {
+    std::set<curl_socket_t> sockets;
+    std::string strCaState;
+    // Goes first: cleaning it up closes its sockets, which calls back to the set above.
+    std::unique_ptr<CURL, CleanupEasy> pEasy;
+};
+
+// All handles of the process, idle and in use. Never destroyed: other threads may still be in an
+// exchange while the process ends.
+struct Pool {
+    std::mutex mutex;
+    std::vector<std::unique_ptr<Connection>> idle;
+    std::set<Connection *> inUse;
+    std::vector<Connection *> abandoned;
+};
+
+Pool &ThePool() {
+    static auto *const pPool = new Pool;
+    return *pPool;
+}
+
+void LockBeforeFork() { ThePool().mutex.lock(); }
+
+void UnlockInParent() { ThePool().mutex.unlock(); }
+
+// The child closes its copies of the sockets and forgets the handles without cleaning them up: an
+// orderly end of a TLS connection would end the parent's.
+void AbandonInChild() {
+    Pool &pool = ThePool();
+    for (auto &pConnection : pool.idle) {
+        pool.abandoned.push_back(pConnection.release());
+    }
+    pool.abandoned.insert(pool.abandoned.end(), pool.inUse.begin(), pool.inUse.end());
+    pool.idle.clear();
+    pool.inUse.clear();
+    for (Connection *pConnection : pool.abandoned) {
+        for (curl_socket_t fd : pConnection->sockets) {
+            close(fd);
+        }
+        pConnection->sockets.clear();
+    }
+    pool.mutex.unlock();
+}
+
+const int g_forkHandlers = pthread_atfork(LockBeforeFork, UnlockInParent, AbandonInChild);
+
+// --- Callbacks: they run inside libcurl, so nothing may be thrown out of them ----------------------
+
+curl_socket_t OpenSocket(void *pContext, curlsocktype /*purpose*/, curl_sockaddr *pAddress) {
+    const int fd =
+        socket(pAddress->family, pAddress->socktype | SOCK_CLOEXEC, pAddress->protocol);
+    if (fd < 0) {
+        return CURL_SOCKET_BAD;
+    }
+    try {
+        const std::lock_guard<std::mutex> lock(ThePool().mutex);
+        static_cast<Connection *>(pContext)->sockets.insert(fd);
+        return fd;
+    } catch (const std::bad_alloc &) {
+        close(fd);
+        return CURL_SOCKET_BAD;
+    }
+}
+
+int CloseSocket(void *pContext, curl_socket_t fd) {
+    const std::lock_guard<std::mutex> lock(ThePool().mutex);
+    static_cast<Connection *>(pContext)->sockets.erase(fd);
+    return close(fd);
+}
+
+size_t TakeBody(char *pData, size_t size, size_t count, void *pContext) {
+    auto *const pstrBody = static_cast<std::string *>(pContext);
+    const size_t cb = size * count;
+    if (cb > kMaxBody - pstrBody->size()) {
+        return 0;
+    }
+    try {
+        pstrBody->append(pData, cb);
+        return cb;
+    } catch (const std::bad_alloc &) {
+        return 0;
+    }
+}
+
+CURLcode AddAuthorities(CURL * /*pEasy*/, void *pSslContext, void * /*pContext*/) {
+    try {
+        X509_STORE *pStore = SSL_CTX_get_cert_store(static_cast<SSL_CTX *>(pSslContext));
+        return AddApplianceCa(pStore) ? CURLE_OK : CURLE_SSL_CACERT_BADFILE;
+    } catch (const std::bad_alloc &) {
+        return CURLE_OUT_OF_MEMORY;
+    }
+}
+
+// --- Pool ---------------------------------------------------------------------------------------
+
+// A handle borrowed from the pool, given back when the exchange is over.
+class Borrowed {
+  public:
+    Borrowed() {
+        static const CURLcode globalInit = curl_global_init(CURL_GLOBAL_DEFAULT);
+        if (globalInit != CURLE_OK) {
+            return;
+        }
+        const std::string strCaState = ApplianceCaState();
+        m_pConnection = TakeIdle(strCaState);
+        if (m_pConnection == nullptr) {
+            m_pConnection = std::make_unique<Connection>();
+            m_pConnection->pEasy.reset(curl_easy_init());
+            m_pConnection->strCaState = strCaState;
+        }
+        const std::lock_guard<std::mutex> lock(ThePool().mutex);
+        ThePool().inUse.insert(m_pConnection.get());
+    }
+    ~Borrowed() {
+        if (m_pConnection == nullptr) {
+            return;
+        }
+        if (m_pConnection->pEasy != nullptr) {
+            curl_easy_reset(m_pConnection->pEasy.get());
+        }
+        Pool &pool = ThePool();
+        const std::lock_guard<std::mutex> lock(pool.mutex);
+        pool.inUse.erase(m_pConnection.get());
+        if (pool.idle.size() < pool.idle.capacity() && m_pConnection->pEasy != nullptr) {
+            pool.idle.push_back(std::move(m_pConnection));
+        }
+    }
+    Borrowed(const Borrowed &) = delete;
+    Borrowed &operator=(const Borrowed &) = delete;
+
+    CURL *Easy() const { return m_pConnection == nullptr ? nullptr : m_pConnection->pEasy.get(); }
+    Connection *Get() const { return m_pConnection.get(); }
+
+  private:
+    // Connections verified against another set of authorities are not used again.
+    static std::unique_ptr<Connection> TakeIdle(const std::string &strCaState) {
+        Pool &pool = ThePool();
+        std::unique_ptr<Connection> pConnection;
+        while (true) {
+            {
+                const std::lock_guard<std::mutex> lock(pool.mutex);
+                pool.idle.reserve(kMaxIdle);
+                if (pool.idle.empty()) {
+                    return nullptr;
+                }
+                pConnection = std::move(pool.idle.back());
+                pool.idle.pop_back();
+            }
+            if (pConnection->strCaState == strCaState) {
+                return pConnection;
+            }
+            // Outside the lock: closing a connection calls back into the pool.
+            pConnection.reset();
+        }
+    }
+
+    std::unique_ptr<Connection> m_pConnection;
+};
+
+// --- Options ------------------------------------------------------------------------------------
+
+void SetTransport(CURL *pEasy, Connection *pConnection) {
+    curl_easy_setopt(pEasy, CURLOPT_NOSIGNAL, 1L);
+    curl_easy_setopt(pEasy, CURLOPT_PROTOCOLS_STR, "http,https");
+    curl_easy_setopt(pEasy, CURLOPT_FOLLOWLOCATION, 0L);
+    curl_easy_setopt(pEasy, CURLOPT_HTTP_VERSION, static_cast<long>(CURL_HTTP_VERSION_1_1));
+    curl_easy_setopt(pEasy, CURLOPT_CONNECTTIMEOUT, kConnectTimeout_s);
+    curl_easy_setopt(pEasy, CURLOPT_LOW_SPEED_LIMIT, kStallBytesPerSecond);
+    curl_easy_setopt(pEasy, CURLOPT_LOW_SPEED_TIME, kStallTime_s);
+    curl_easy_setopt(pEasy, CURLOPT_OPENSOCKETFUNCTION, OpenSocket);
+    curl_easy_setopt(pEasy, CURLOPT_OPENSOCKETDATA, pConnection);
+    curl_easy_setopt(pEasy, CURLOPT_CLOSESOCKETFUNCTION, CloseSocket);
+    curl_easy_setopt(pEasy, CURLOPT_CLOSESOCKETDATA, pConnection);
+    curl_easy_setopt(pEasy, CURLOPT_SSLVERSION, static_cast<long>(CURL_SSLVERSION_TLSv1_2));
+    curl_easy_setopt(pEasy, CURLOPT_SSL_VERIFYPEER, 1L);
+    curl_easy_setopt(pEasy, CURLOPT_SSL_VERIFYHOST, 2L);
+    curl_easy_setopt(pEasy, CURLOPT_SSL_CTX_FUNCTION, AddAuthorities);
+}
+
+// Chooses the way: through the relay, as the environment says where the configuration allows it, or
+// direct. False when the relay is asked for and none is named.
+bool SetWay(CURL *pEasy, bool blRelay) {
+    std::string strValue;
+    if (blRelay) {
+        if (LookUpKey(kConfigFile, "farlink_relay", strValue) != LookUp::kFound ||
+            strValue.empty()) {
+            return false;
+        }
+        curl_easy_setopt(pEasy, CURLOPT_PROXY, ("http://" + strValue).c_str());
+        curl_easy_setopt(pEasy, CURLOPT_NOPROXY, "");
+        curl_easy_setopt(pEasy, CURLOPT_HTTPPROXYTUNNEL, 1L);
+        curl_easy_setopt(pEasy, CURLOPT_SUPPRESS_CONNECT_HEADERS, 1L);
+        return true;
+    }
+    const bool blEnvironment =
+        LookUpKey(kConfigFile, "use_proxy_environment", strValue) == LookUp::kFound &&
+        strValue == "yes";
+    if (!blEnvironment) {
+        curl_easy_setopt(pEasy, CURLOPT_PROXY, "");
+    }
+    return true;
+}
+
+bool AppendHeader(std::unique_ptr<curl_slist, FreeList> &pList, const char *szHeader) {
+    curl_slist *pLonger = curl_slist_append(pList.get(), szHeader);
+    if (pLonger == nullptr) {
+        return false;
+    }
+    static_cast<void>(pList.release());
+    pList.reset(pLonger);
+    return true;
+}
+
+bool BuildHeaders(const HttpRequest &request, std::unique_ptr<curl_slist, FreeList> &pList) {
+    bool blAll = AppendHeader(pList, "Accept: application/json");
+    if (request.blPost) {
+        // No waiting for a "100 Continue" that some servers never send.
+        blAll = blAll && AppendHeader(pList, "Content-Type: application/json") &&
+                AppendHeader(pList, "Expect:");
+    }
+    for (const std::string &strHeader : request.headers) {
+        blAll = blAll && AppendHeader(pList, strHeader.c_str());
+    }
+    return blAll;
+}
+
+void SetRequest(CURL *pEasy, const HttpRequest &request, const curl_slist *pHeaders) {
+    curl_easy_setopt(pEasy, CURLOPT_URL, request.strUrl.c_str());
+    curl_easy_setopt(pEasy, CURLOPT_HTTPHEADER, pHeaders);
+    curl_easy_setopt(pEasy, CURLOPT_TIMEOUT,
+                     request.timeout_s > 0 ? static_cast<long>(request.timeout_s)
+                                           : kWholeTimeout_s);
+    curl_easy_setopt(pEasy, CURLOPT_FORBID_REUSE, request.blKeepConnection ? 0L : 1L);
+    if (request.blPost) {
+        curl_easy_setopt(pEasy, CURLOPT_POSTFIELDS, request.strBody.c_str());
+        curl_easy_setopt(pEasy, CURLOPT_POSTFIELDSIZE_LARGE,
+                         static_cast<curl_off_t>(request.strBody.size()));
+    }
+}
+
+bool Fail(unsigned int code, const HttpRequest &request, const char *szReason, int line) {
+    // The query names nothing that helps, and it came from a caller.
+    const std::string strUrl = request.strUrl.substr(0, request.strUrl.find('?'));
+    syslog(LOG_WARNING, "%s:%d %s%s: %s", kFile, line, strUrl.c_str(),
+           request.blRelay ? " through the relay" : "", szReason);
+    YLIBCErrSetEx(code, kFile, line);
+    return false;
+}
+
+}  // namespace
+
+bool Perform(const HttpRequest &request, HttpReply &reply) {
+    const Borrowed connection;
+    CURL *const pEasy = connection.Easy();
+    std::unique_ptr<curl_slist, FreeList> pHeaders;
+    if (pEasy == nullptr || !BuildHeaders(request, pHeaders)) {
+        return Fail(YLIBC_ERR_OUT_OF_MEMORY, request, "out of memory", __LINE__);
+    }
+    SetTransport(pEasy, connection.Get());
+    if (!SetWay(pEasy, request.blRelay)) {
+        return Fail(YLIBC_ERR_NETWORK, request,
+                    "no relay: set farlink_relay=\"host:port\" in /etc/zeloinfo.conf", __LINE__);
+    }
+    SetRequest(pEasy, request, pHeaders.get());
+
+    std::string strBody;
+    std::array<char, CURL_ERROR_SIZE> reason = {};
+    curl_easy_setopt(pEasy, CURLOPT_WRITEFUNCTION, TakeBody);
+    curl_easy_setopt(pEasy, CURLOPT_WRITEDATA, &strBody);
+    curl_easy_setopt(pEasy, CURLOPT_ERRORBUFFER, reason.data());
+    const CURLcode result = curl_easy_perform(pEasy);
+    if (result == CURLE_WRITE_ERROR) {
+        return Fail(YLIBC_ERR_REPLY, request, "the reply is larger than 16 MiB", __LINE__);
+    }
+    if (result != CURLE_OK) {
+        return Fail(YLIBC_ERR_NETWORK, request,
+                    reason[0] != '\0' ? reason.data() : curl_easy_strerror(result), __LINE__);
+    }
+    curl_easy_getinfo(pEasy, CURLINFO_RESPONSE_CODE, &reply.status);
+    reply.strBody.swap(strBody);
+    return true;
+}
+
+std::string BuildUrl(const std::string &strScheme, const std::string &strHost, long port,
+                     const std::string &strPath, const std::string &strQuery) {
+    if (port < 1 || port > 65535) {
+        return {};
+    }
+    const bool blBareIPv6 = strHost.find(':') != std::string::npos && strHost.front() != '[';
+    const std::string strUrlHost = blBareIPv6 ? '[' + strHost + ']' : strHost;
+    const std::unique_ptr<CURLU, CleanupUrl> pUrl(curl_url());
+    if (pUrl == nullptr ||
+        curl_url_set(pUrl.get(), CURLUPART_SCHEME, strScheme.c_str(), 0) != CURLUE_OK ||
+        curl_url_set(pUrl.get(), CURLUPART_HOST, strUrlHost.c_str(), 0) != CURLUE_OK ||
+        curl_url_set(pUrl.get(), CURLUPART_PORT, std::to_string(port).c_str(), 0) != CURLUE_OK ||
+        curl_url_set(pUrl.get(), CURLUPART_PATH, strPath.c_str(), 0) != CURLUE_OK ||
+        (!strQuery.empty() && curl_url_set(pUrl.get(), CURLUPART_QUERY, strQuery.c_str(),
+                                           CURLU_URLENCODE) != CURLUE_OK)) {
+        return {};
+    }
+    char *szRaw = nullptr;
+    if (curl_url_get(pUrl.get(), CURLUPART_URL, &szRaw, 0) != CURLUE_OK) {
+        return {};
+    }
+    const std::unique_ptr<char, FreeText> szUrl(szRaw);
+    return szUrl.get();
+}
+
+}  // namespace host

@@ -1,0 +1,21 @@
+// Key-value look-up for the host platform's own settings.
+
+#ifndef ZELO_HOST_KEY_VALUE_LOOKUP_H
+#define ZELO_HOST_KEY_VALUE_LOOKUP_H
+
+#include <optional>
+#include <string>
+
+namespace host {
+
+// The host platform's own settings stand beside the appliance's.
+constexpr const char *kConfigFile = "/etc/zeloinfo.conf";
+
+enum class LookUp { kFound, kAbsent, kUnreadable };
+
+// Looks the key up in the file; strValue is set, whole, when it is found.
+LookUp LookUpKey(const char *szPath, const char *szKey, std::string &strValue);
+
+}  // namespace host
+
+#endif

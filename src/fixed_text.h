@@ -1,0 +1,39 @@
+// Fixed-size text buffers: the one place where text is cut to fit.
+
+#ifndef ZELO_FIXED_TEXT_H
+#define ZELO_FIXED_TEXT_H
+
+#include <cstdarg>
+#include <cstddef>
+#include <cstdio>
+
+// A zeroed buffer of N bytes that holds zero-terminated text of at most N - 1 bytes.
+template <std::size_t N>
+class FixedText {
+  public:
+    // For a platform getter, which fills the buffer and takes its size.
+    char *Buffer() { return m_sz; }
+    static constexpr int Size() { return static_cast<int>(N); }
+
+    const char *sz() const { return m_sz; }
+    bool Empty() const { return m_sz[0] == '\0'; }
+
+    // Formats into the buffer, cut to fit. Returns the length that the whole text has.
+    std::size_t Format(const char *szFormat, ...) __attribute__((format(printf, 2, 3))) {
+        va_list args;
+        va_start(args, szFormat);
+        const std::size_t cbWhole = FormatV(szFormat, args);
+        va_end(args);
+        return cbWhole;
+    }
+
+    std::size_t FormatV(const char *szFormat, va_list args) __attribute__((format(printf, 2, 0))) {
+        const int cb = std::vsnprintf(m_sz, N, szFormat, args);
+        return cb < 0 ? 0 : static_cast<std::size_t>(cb);
+    }
+
+  private:
+    char m_sz[N] = {};
+};
+
+#endif

@@ -1,0 +1,103 @@
+#include "qrm_client_description.h"
+
+#include <unistd.h>
+
+#include <cstdlib>
+#include <cstring>
+
+#include "fixed_text.h"
+#include "key_value_file.h"
+#include "serial_number.h"
+
+namespace client_description {
+namespace {
+
+constexpr const char *kConfig = "/etc/zeloinfo.conf";
+constexpr const char *kDefaults = "/etc.defaults/zeloinfo.conf";
+constexpr const char *kVersion = "/etc.defaults/VERSION";
+
+// The platform gives a custom serial number fewer bytes than its own.
+constexpr int kCustomSerialSize = 31;
+
+using FactText = FixedText<1024>;
+using VersionText = FixedText<16>;
+
+template <std::size_t N>
+bool ReadKey(const char *szPath, const char *szKey, FixedText<N> &value) {
+    return YLIBCFileGetKeyValue(szPath, szKey, value.Buffer(), FixedText<N>::Size(), 0) > 0;
+}
+
+bool ReadPort(const char *szKey, long &port) {
+    FactText value;
+    if (!ReadKey(kConfig, szKey, value)) {
+        return false;
+    }
+    port = std::strtol(value.sz(), nullptr, 10);
+    return true;
+}
+
+}  // namespace
+
+bool ReadHostName(std::string &strHostName) {
+    FactText name;
+    // A name that fills the buffer need not be terminated: the last byte stays ours.
+    if (gethostname(name.Buffer(), FactText::Size()) < 0) {
+        return false;
+    }
+    name.Buffer()[FactText::Size() - 1] = '\0';
+    strHostName = name.sz();
+    return !strHostName.empty();
+}
+
+bool ReadModel(std::string &strModel) {
+    FactText model;
+    if (!ReadKey(kDefaults, "upnpmodelname", model)) {
+        return false;
+    }
+    strModel = model.sz();
+    return true;
+}
+
+bool ReadVersion(Json::Value &description) {
+    VersionText major;
+    VersionText minor;
+    VersionText smallFix;
+    VersionText build;
+    if (!ReadKey(kVersion, "majorversion", major) || !ReadKey(kVersion, "minorversion", minor)) {
+        return false;
+    }
+    if (!ReadKey(kVersion, "smallfixnumber", smallFix)) {
+        smallFix.Format("0");
+    }
+    if (!ReadKey(kVersion, "buildnumber", build)) {
+        return false;
+    }
+
+    FactText version;
+    if (std::strcmp(smallFix.sz(), "0") == 0) {
+        version.Format("NVO %s.%s-%s", major.sz(), minor.sz(), build.sz());
+    } else {
+        version.Format("NVO %s.%s-%s Update %s", major.sz(), minor.sz(), build.sz(), smallFix.sz());
+    }
+    description["build_number"] = static_cast<Json::Int64>(std::strtol(build.sz(), nullptr, 10));
+    description["nvo_version"] = version.sz();
+    return true;
+}
+
+bool ReadAdminPort(long &port) { return ReadPort("admin_port", port); }
+
+bool ReadSecureAdminPort(long &port) { return ReadPort("secure_admin_port", port); }
+
+bool IsHttpsServed() { return YLIBCFileCheckKeyValue(kConfig, "runHTTPS", "yes", 0) == 1; }
+
+bool ReadSerialNumber(std::string &strSerial) {
+    FixedText<36> serial;
+    bool blRead = true;
+    if (YLIBGetCustomSerialNumber(serial.Buffer(), kCustomSerialSize) < 0 || serial.Empty()) {
+        blRead = YLIBGetSerialNumber(serial.Buffer(), FixedText<36>::Size()) >= 0;
+    }
+    strSerial = serial.sz();
+    return blRead;
+}
+
+}  // namespace client_description

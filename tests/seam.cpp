@@ -1,0 +1,115 @@
+#include "seam.h"
+
+#include <gtest/gtest.h>
+#include <syslog.h>
+
+#include <cstdarg>
+#include <cstddef>
+#include <ctime>
+#include <map>
+#include <new>
+#include <type_traits>
+
+#include "credential_store.h"
+#include "key_value_file.h"
+#include "serial_number.h"
+#include "web_api_request.h"
+
+namespace seam {
+namespace {
+
+struct Observation {
+    Outcome outcome;
+    Fault fault;
+    std::map<std::string, int> counts;
+};
+
+thread_local Observation *t_pObservation = nullptr;
+
+// Whether this call is the one that the fault names.
+bool Enter(const char *szName) {
+    if (t_pObservation == nullptr) {
+        return false;
+    }
+    t_pObservation->outcome.calls.emplace_back(szName);
+    const int nth = ++t_pObservation->counts[szName];
+    return t_pObservation->fault.strOperation == szName && t_pObservation->fault.nth == nth;
+}
+
+bool IsForced() { return t_pObservation->fault.blForceResult; }
+
+template <typename Result>
+Result Force(Result result) {
+    if constexpr (std::is_integral_v<Result>) {
+        return static_cast<Result>(t_pObservation->fault.result);
+    } else {
+        return result;
+    }
+}
+
+void AddRecords(int count) {
+    if (t_pObservation != nullptr) {
+        t_pObservation->outcome.recordsLeft += count;
+    }
+}
+
+void WriteLog(int level, const char *szFormat, va_list args) {
+    char szLine[16384];
+    std::vsnprintf(szLine, sizeof(szLine), szFormat, args);
+    if (t_pObservation == nullptr) {
+        return;
+    }
+    const std::string strLine = szLine;
+    const std::size_t colon = strLine.find(':');
+    const std::size_t blank = strLine.find(' ');
+    ASSERT_TRUE(colon < blank && blank != std::string::npos) << strLine;
+    EXPECT_GT(std::atoi(strLine.c_str() + colon + 1), 0) << strLine;
+    t_pObservation->outcome.logs.push_back(
+        {level, strLine.substr(0, colon), strLine.substr(blank + 1)});
+}
+
+}  // namespace
+
+Outcome Observe(const std::function<void()> &body) { return Observe(Fault(), body); }
+
+Outcome Observe(const Fault &fault, const std::function<void()> &body) {
+    Observation observation;
+    observation.fault = fault;
+    t_pObservation = &observation;
+    body();
+    t_pObservation = nullptr;
+    return observation.outcome;
+}
+
+}  // namespace seam
+
+#define SEAM(symbol, name, Result, parameters, arguments, failure, gained)     \
+    Result Real_##name parameters asm("__real_" symbol);                       \
+    Result Wrap_##name parameters asm("__wrap_" symbol);                       \
+    Result Wrap_##name parameters {                                            \
+        const bool blHit = seam::Enter(#name);                                 \
+        if (blHit && !seam::IsForced()) {                                      \
+            return failure;                                                    \
+        }                                                                      \
+        Result result = Real_##name arguments;                                 \
+        seam::AddRecords(gained);                                              \
+        return blHit ? seam::Force<Result>(result) : result;                   \
+    }
+
+#define SEAM_RELEASE(symbol, name, parameters, arguments, lost) \
+    void Real_##name parameters asm("__real_" symbol);          \
+    void Wrap_##name parameters asm("__wrap_" symbol);          \
+    void Wrap_##name parameters {                               \
+        seam::AddRecords(-static_cast<int>(lost));              \
+        Real_##name arguments;                                  \
+    }
+
+#include "seam_operations.inc"
+
+void Wrap_syslog(int level, const char *szFormat, ...) asm("__wrap_syslog");
+void Wrap_syslog(int level, const char *szFormat, ...) {
+    va_list args;
+    va_start(args, szFormat);
+    seam::WriteLog(level, szFormat, args);
+    va_end(args);
+}

@@ -1,0 +1,39 @@
+// A harness at the platform seam: it sees every platform operation and system call that the library
+// makes, in order, and makes chosen ones fail. The calls go to the real host platform; only the
+// library's own are seen, not those that the platform makes, and only on the observing thread.
+
+#ifndef ZELO_TESTS_SEAM_H
+#define ZELO_TESTS_SEAM_H
+
+#include <functional>
+#include <string>
+#include <vector>
+
+namespace seam {
+
+struct LogLine {
+    int level;
+    std::string strFile;
+    std::string strMessage;
+};
+
+struct Outcome {
+    std::vector<std::string> calls;  // names of all calls but releases and log lines
+    std::vector<LogLine> logs;
+    int recordsLeft = 0;             // records allocated and not released
+};
+
+struct Fault {
+    std::string strOperation;
+    int nth = 1;                // which call of the operation, counted from 1
+    bool blForceResult = false; // false: the call is not made and gives its failure value
+    long result = 0;            // true: the call is made, and this takes the place of its result
+};
+
+// Runs the body on this thread and reports what the library did.
+Outcome Observe(const std::function<void()> &body);
+Outcome Observe(const Fault &fault, const std::function<void()> &body);
+
+}  // namespace seam
+
+#endif
