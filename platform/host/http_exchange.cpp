@@ -345,7 +345,7 @@ std::string BuildUrl(const std::string &strScheme, const std::string &strHost, l
         curl_url_set(pUrl.get(), CURLUPART_PORT, std::to_string(port).c_str(), 0) != CURLUE_OK ||
         curl_url_set(pUrl.get(), CURLUPART_PATH, strPath.c_str(), 0) != CURLUE_OK ||
         (!strQuery.empty() && curl_url_set(pUrl.get(), CURLUPART_QUERY, strQuery.c_str(),
-                                           CURLU_URLENCODE) != CURLUE_OK)) {
+                                           CURLU_APPENDQUERY | CURLU_URLENCODE) != CURLUE_OK)) {
         return {};
     }
     char *szRaw = nullptr;

@@ -31,7 +31,8 @@ struct HttpReply {
 // the last error, writes one log line with the URL and the reason, and leaves reply as it was.
 bool Perform(const HttpRequest &request, HttpReply &reply);
 
-// Builds an URL; the host may be a name, an IPv4 or an IPv6 address. Empty when a part does not fit
+// Builds an URL; the host may be a name, an IPv4 or an IPv6 address, the query empty or "name=value"
+// with a value that is encoded here. Empty when a part does not fit
 // into an URL: a host that holds more than a host, a port out of range.
 std::string BuildUrl(const std::string &strScheme, const std::string &strHost, long port,
                      const std::string &strPath, const std::string &strQuery);

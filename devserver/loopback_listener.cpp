@@ -1,0 +1,127 @@
+#include "loopback_listener.h"
+
+#include <arpa/inet.h>
+#include <httplib.h>
+#include <sys/socket.h>
+
+#include <chrono>
+#include <limits>
+
+#ifdef __SANITIZE_THREAD__
+// The HTTP library is not built with the sanitizer, which therefore does not see that the library's
+// function-local statics are made under a guard. Races in the handlers are still found.
+extern "C" __attribute__((visibility("default"))) const char *__tsan_default_suppressions() {
+    return "race_top:libcpp-httplib.so\n";
+}
+#endif
+
+namespace devserver {
+namespace {
+
+// Each open connection, idle or not, keeps one of the threads.
+constexpr std::size_t kThreads = 32;
+constexpr time_t kIdleConnection_s = 60;
+constexpr std::size_t kMaxRequestBody = 16UL << 20U;
+constexpr const char *kAnyPath = "[\\s\\S]*";
+
+// The HTTP library waits for the next request of an idle connection until its time is over, even
+// when it is stopped, and does not tell which sockets it accepted: they are those whose own port is
+// the one listened on. Descriptors beyond select()'s limit it does not wait for.
+void ShutDownConnections(int port) {
+    for (int fd = 0; fd < FD_SETSIZE; ++fd) {
+        // The port stands at the same place in the addresses of both families.
+        sockaddr_in6 local{};
+        socklen_t cb = sizeof(local);
+        if (getsockname(fd, reinterpret_cast<sockaddr *>(&local), &cb) == 0 &&
+            (local.sin6_family == AF_INET || local.sin6_family == AF_INET6) &&
+            ntohs(local.sin6_port) == port) {
+            shutdown(fd, SHUT_RDWR);
+        }
+    }
+}
+
+std::unique_ptr<httplib::Server> MakeServer(const ServerCertificate *pCertificate) {
+    if (pCertificate == nullptr) {
+        return std::make_unique<httplib::Server>();
+    }
+    return std::make_unique<httplib::SSLServer>([pCertificate](SSL_CTX &context) {
+        return SSL_CTX_set_min_proto_version(&context, TLS1_2_VERSION) == 1 &&
+               SSL_CTX_use_certificate(&context, pCertificate->pCertificate.get()) == 1 &&
+               SSL_CTX_use_PrivateKey(&context, pCertificate->pKey.get()) == 1;
+    });
+}
+
+void SetUp(httplib::Server &server, const LoopbackListener::Handler &handler) {
+    server.Get(kAnyPath, handler).Post(kAnyPath, handler).Delete(kAnyPath, handler);
+    server.set_tcp_nodelay(true);
+    server.set_keep_alive_max_count(std::numeric_limits<std::size_t>::max());
+    server.set_keep_alive_timeout(kIdleConnection_s);
+    server.set_payload_max_length(kMaxRequestBody);
+    server.new_task_queue = [] { return new httplib::ThreadPool(kThreads); };
+    // The library's own choice would share a port with another server instead of failing.
+    server.set_socket_options([](int fd) {
+        const int yes = 1;
+        setsockopt(fd, SOL_SOCKET, SO_REUSEADDR, &yes, sizeof(yes));
+    });
+}
+
+}  // namespace
+
+bool IsLoopback(const std::string &strAddress) {
+    in_addr address{};
+    if (inet_pton(AF_INET, strAddress.c_str(), &address) == 1) {
+        return ntohl(address.s_addr) >> 24U == IN_LOOPBACKNET;
+    }
+    in6_addr address6{};
+    return inet_pton(AF_INET6, strAddress.c_str(), &address6) == 1 &&
+           IN6_IS_ADDR_LOOPBACK(&address6);
+}
+
+LoopbackListener::LoopbackListener() = default;
+
+LoopbackListener::~LoopbackListener() {
+    Stop();
+}
+
+bool LoopbackListener::Start(const std::string &strHost, int port,
+                             const ServerCertificate *pCertificate, const Handler &handler,
+                             std::string &strReason) {
+    m_pServer = MakeServer(pCertificate);
+    if (!m_pServer->is_valid()) {
+        strReason = "OpenSSL does not take the server's certificate";
+        return false;
+    }
+    SetUp(*m_pServer, handler);
+    if (port == 0) {
+        m_port = m_pServer->bind_to_any_port(strHost);
+    } else {
+        m_port = m_pServer->bind_to_port(strHost, port) ? port : -1;
+    }
+    if (m_port <= 0) {
+        strReason = "cannot listen on " + strHost + " port " + std::to_string(port) +
+                    ": it is taken or not allowed; name another port, or 0 for a free one";
+        return false;
+    }
+    m_done = std::async(std::launch::async, [this] { return m_pServer->listen_after_bind(); });
+    // Stopping a server that does not run yet would go unnoticed.
+    while (!m_pServer->is_running()) {
+        if (m_done.wait_for(std::chrono::milliseconds(1)) == std::future_status::ready) {
+            strReason = "cannot serve on " + strHost + " port " + std::to_string(m_port);
+            return false;
+        }
+    }
+    return true;
+}
+
+void LoopbackListener::Stop() {
+    if (!m_done.valid()) {
+        return;
+    }
+    m_pServer->stop();
+    while (m_done.wait_for(std::chrono::milliseconds(20)) != std::future_status::ready) {
+        ShutDownConnections(m_port);
+    }
+    m_done = {};
+}
+
+}  // namespace devserver

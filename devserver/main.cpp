@@ -1,0 +1,139 @@
+// The development QRM server as a program: listens, says where in the ports file, and serves until
+// it is told to end (SIGINT or SIGTERM).
+
+#include <pthread.h>
+#include <unistd.h>
+
+#include <CLI/CLI.hpp>
+#include <csignal>
+#include <cstdio>
+#include <cstdlib>
+#include <fstream>
+#include <iostream>
+
+#include "dev_server.h"
+#include "json_text.h"
+
+namespace {
+
+constexpr int kExitFailed = 1;
+constexpr int kExitUsage = 2;
+constexpr std::size_t kMaxToken = 4096;
+
+struct Files {
+    std::string token;
+    std::string ports;
+    std::string ca;
+};
+
+bool Complain(const std::string &strLine) {
+    std::cerr << "qrm-devserver: " << strLine << std::endl;
+    return false;
+}
+
+bool ReadToken(const std::string &strFile, std::string &strToken) {
+    std::ifstream file(strFile, std::ios::binary);
+    std::string strText(kMaxToken + 1, '\0');
+    file.read(strText.data(), static_cast<std::streamsize>(strText.size()));
+    if (!file.eof() && !file.good()) {
+        return Complain("cannot read token file '" + strFile + "': name a file that can be read");
+    }
+    strText.resize(static_cast<std::size_t>(file.gcount()));
+    if (!strText.empty() && strText.back() == '\n') {
+        strText.pop_back();
+    }
+    if (strText.empty() || strText.size() >= kMaxToken ||
+        strText.find_first_of(std::string("\n\0", 2)) != std::string::npos) {
+        return Complain("cannot use token file '" + strFile +
+                        "': it has to hold the access token as its one line of text");
+    }
+    strToken = strText;
+    return true;
+}
+
+// A reader sees the whole file or none; in its first moment it has another name.
+bool WriteFile(const std::string &strFile, const std::string &strText) {
+    std::string strTemporary = strFile + ".XXXXXX";
+    const int fd = mkstemp(strTemporary.data());
+    const bool blWritten = fd >= 0 && write(fd, strText.data(), strText.size()) ==
+                                          static_cast<ssize_t>(strText.size());
+    const bool blClosed = fd >= 0 && close(fd) == 0;
+    if (blWritten && blClosed && std::rename(strTemporary.c_str(), strFile.c_str()) == 0) {
+        return true;
+    }
+    const int error = errno;
+    if (fd >= 0) {
+        unlink(strTemporary.c_str());
+    }
+    return Complain("cannot write '" + strFile + "': " + std::strerror(error));
+}
+
+bool Announce(const devserver::DevServer &server, const std::string &strHost, const Files &files) {
+    Json::Value ports;
+    std::string strPorts;
+    ports["http_port"] = server.HttpPort();
+    ports["https_port"] = server.HttpsPort();
+    json_text::ToString(ports, strPorts);
+    // Who waits for the ports file finds the authority's certificate in place.
+    if ((!files.ca.empty() && !WriteFile(files.ca, server.CaPem())) ||
+        (!files.ports.empty() && !WriteFile(files.ports, strPorts + "\n"))) {
+        return false;
+    }
+    const bool blColons = strHost.find(':') != std::string::npos;
+    const std::string strUrlHost = blColons ? "[" + strHost + "]" : strHost;
+    std::cout << "qrm-devserver: http://" << strUrlHost << ":" << server.HttpPort() << " https://"
+              << strUrlHost << ":" << server.HttpsPort() << std::endl;
+    return true;
+}
+
+int Serve(const devserver::Options &options, const Files &files) {
+    // Blocked before the server's threads start, so that no thread but this one gets them.
+    sigset_t ends;
+    sigemptyset(&ends);
+    sigaddset(&ends, SIGINT);
+    sigaddset(&ends, SIGTERM);
+    pthread_sigmask(SIG_BLOCK, &ends, nullptr);
+
+    devserver::DevServer server(options);
+    std::string strReason;
+    if (!server.Start(strReason)) {
+        Complain(strReason);
+        return kExitFailed;
+    }
+    if (!Announce(server, options.host, files)) {
+        return kExitFailed;
+    }
+    int signal = 0;
+    sigwait(&ends, &signal);
+    if (!files.ports.empty()) {
+        unlink(files.ports.c_str());
+    }
+    return EXIT_SUCCESS;
+}
+
+}  // namespace
+
+int main(int argc, char **argv) {
+    devserver::Options options;
+    Files files;
+    CLI::App app("A QRM server for development, on loopback");
+    app.add_option("--token-file", files.token, "File with the access token")->required();
+    app.add_option("--http-port", options.http_port, "Port for HTTP, 0 for a free one")
+        ->check(CLI::Range(0, 65535));
+    app.add_option("--https-port", options.https_port, "Port for HTTPS, 0 for a free one")
+        ->check(CLI::Range(0, 65535));
+    app.add_option("--ports-file", files.ports, "File to write the ports to, as JSON");
+    app.add_option("--ca-file", files.ca, "File to write the authority's certificate to, as PEM");
+    app.add_option("--host", options.host, "Loopback address to listen on")
+        ->check([](const std::string &strHost) {
+            return devserver::IsLoopback(strHost)
+                       ? std::string()
+                       : "'" + strHost + "' is no loopback address; name 127.0.0.1 or ::1";
+        });
+    try {
+        app.parse(argc, argv);
+    } catch (const CLI::ParseError &error) {
+        return app.exit(error) == EXIT_SUCCESS ? EXIT_SUCCESS : kExitUsage;
+    }
+    return ReadToken(files.token, options.token) ? Serve(options, files) : kExitFailed;
+}

@@ -1,0 +1,415 @@
+// Finding a connection and joining, over real HTTPS against the development server.
+
+#include <gtest/gtest.h>
+#include <unistd.h>
+
+#include <filesystem>
+#include <fstream>
+
+#include "dev_server.h"
+#include "json_text.h"
+#include "stored.h"
+#include "torture.h"
+#include "zeloqrmclient.h"
+
+namespace {
+
+constexpr const char *kFile = "qrm_send_createclient";
+constexpr const char *kApi = "ZELO.QRM.RPC";
+constexpr const char *kConfig = "/etc/zeloinfo.conf";
+constexpr const char *kDefaults = "/etc.defaults/zeloinfo.conf";
+constexpr const char *kVersion = "/etc.defaults/VERSION";
+constexpr const char *kToken = "se/cr\"et-0123456789";
+
+void Write(const char *szPath, const std::string &strText) { std::ofstream(szPath) << strText; }
+
+void WriteFacts() {
+    Write(kConfig, "admin_port=\"5000\"\nsecure_admin_port=\"5001\"\nrunHTTPS=\"yes\"\n");
+    Write(kDefaults, "upnpmodelname=\"NVO-918\"\n");
+    Write(kVersion,
+          "majorversion=\"6\"\nminorversion=\"2\"\nbuildnumber=\"123\"\nsmallfixnumber=\"4\"\n");
+}
+
+std::string HostName() {
+    char sz[1024] = {};
+    gethostname(sz, sizeof(sz));
+    return sz;
+}
+
+class Join : public testing::Test {
+  protected:
+    static void SetUpTestSuite() {
+        s_pServer = new devserver::DevServer([] {
+            devserver::Options options;
+            options.token = kToken;
+            return options;
+        }());
+        std::string strReason;
+        ASSERT_TRUE(s_pServer->Start(strReason)) << strReason;
+        std::filesystem::create_directories("/usr/zelo/etc/ssl/ca.d");
+        Write("/usr/zelo/etc/ssl/ca.d/server.pem", s_pServer->CaPem());
+    }
+    static void TearDownTestSuite() {
+        delete s_pServer;
+        s_pServer = nullptr;
+    }
+    void SetUp() override {
+        WriteFacts();
+        stored::Clear();
+        s_pServer->ForgetRequests();
+    }
+
+    static Json::Value Candidate(int httpPort, int httpsPort) {
+        Json::Value candidate;
+        candidate["host"] = "localhost";
+        candidate["http_port"] = httpPort;
+        candidate["https_port"] = httpsPort;
+        return candidate;
+    }
+    static Json::Value JoinInfo() {
+        Json::Value info;
+        info["sn"] = "SN1";
+        info["access_token"] = kToken;
+        info["server_host"] = "localhost";
+        info["server_http_port"] = s_pServer->HttpPort();
+        info["server_https_port"] = s_pServer->HttpsPort();
+        return info;
+    }
+    static std::string Stored(const char *szProtocol = "https") {
+        const int port =
+            szProtocol[4] == 's' ? s_pServer->HttpsPort() : s_pServer->HttpPort();
+        return std::string(szProtocol) + "://localhost:" + std::to_string(port) + " ?";
+    }
+    static std::string Messages(const seam::Outcome &outcome) {
+        std::string strAll;
+        for (const seam::LogLine &line : outcome.logs) {
+            strAll += line.strMessage;
+        }
+        return strAll;
+    }
+
+    static devserver::DevServer *s_pServer;
+};
+
+devserver::DevServer *Join::s_pServer = nullptr;
+
+TEST_F(Join, TheFirstAnsweringConnectionWins) {
+    const int http = s_pServer->HttpPort();
+    const int https = s_pServer->HttpsPort();
+    Json::Value relay = Candidate(http, https);
+    relay["farlink_direct"] = true;
+    Json::Value noHost = Candidate(http, https);
+    noHost["host"] = "";
+    Json::Value numericHost = noHost;
+    numericHost["host"] = 5;
+    Json::Value textPort = Candidate(http, https);
+    textPort["https_port"] = std::to_string(https);
+    Json::Value doublePort = Candidate(http, https);
+    doublePort["http_port"] = http + 0.0;
+    Json::Value longHost = noHost;
+    longHost["host"] = std::string(2000, 'h');
+    Json::Value inject = noHost;
+    inject["host"] = "localhost/x?";
+    const std::string strHttps = "https " + std::to_string(https);
+    const std::string strHttp = "http " + std::to_string(http);
+    const struct {
+        const char *szFact;
+        std::vector<Json::Value> candidates;
+        std::string strWinner;
+    } rows[] = {
+        {"secure before plain", {Candidate(http, https)}, strHttps},
+        {"plain when the secure port is 0", {Candidate(http, 0)}, strHttp},
+        {"plain when the secure attempt fails", {Candidate(http, http)}, strHttp},
+        {"no plain attempt at port 0", {Candidate(0, http)}, ""},
+        {"the earlier one", {Candidate(http, 0), Candidate(0, https)}, strHttp},
+        {"a relay without a relay named falls back", {relay}, strHttp},
+        {"passed over, however usable the rest is",
+         {noHost, numericHost, textPort, doublePort, Json::Value(7), Json::Value(),
+          Candidate(http, 65536), Candidate(-1, https), longHost, inject},
+         ""},
+        {"the good one behind bad ones", {textPort, Candidate(0, https)}, strHttps},
+    };
+    for (const auto &row : rows) {
+        SCOPED_TRACE(row.szFact);
+        Json::Value list(Json::arrayValue);
+        for (const Json::Value &candidate : row.candidates) {
+            list.append(candidate);
+        }
+        Json::Value out;
+        out["own"] = 1;
+        const seam::Outcome outcome = seam::Observe([&] {
+            EXPECT_EQ(ZELOQRMClientTestConnect(list, kApi, out), !row.strWinner.empty());
+        });
+        EXPECT_TRUE(outcome.logs.empty());
+        EXPECT_EQ(outcome.recordsLeft, 0);
+        EXPECT_EQ(out.size(), row.strWinner.empty() ? 1U : 4U);
+        if (!row.strWinner.empty()) {
+            EXPECT_EQ(out["protocol"].asString() + ' ' + out["port"].asString(), row.strWinner);
+            EXPECT_EQ(out["host"], "localhost");
+        }
+    }
+    Json::Value out;
+    Json::Value object;
+    object["a"] = 1;
+    for (const Json::Value &list : {Json::Value(), Json::Value(Json::arrayValue), object}) {
+        const seam::Outcome outcome =
+            seam::Observe([&] { EXPECT_FALSE(ZELOQRMClientTestConnect(list, kApi, out)); });
+        EXPECT_TRUE(outcome.calls.empty());
+    }
+    Json::Value list(Json::arrayValue);
+    list.append(Candidate(http, https));
+    EXPECT_FALSE(ZELOQRMClientTestConnect(list, "", out));
+    EXPECT_FALSE(ZELOQRMClientTestConnect(list, "ZELO.Unknown", out));
+    EXPECT_TRUE(out.isNull());
+    // Any result of a setter but 0 ends the attempt; two of them end both.
+    seam::Observe({"ZELOCredItemSetHost", 1, true, 1}, [&] {
+        EXPECT_TRUE(ZELOQRMClientTestConnect(list, kApi, out));
+    });
+    EXPECT_EQ(out["protocol"], "http");
+}
+
+TEST_F(Join, ConnectionTestSurvivesEveryFailingCall) {
+    const std::string strHttps = std::to_string(s_pServer->HttpsPort());
+    const torture::Expected fallback{"http", "", ""};
+    const torture::Expected none{"false", "", ""};
+    torture::Run({"test connection", kFile, stored::Clear,
+                  [&] {
+                      Json::Value list(Json::arrayValue);
+                      list.append(Candidate(s_pServer->HttpPort(), s_pServer->HttpsPort()));
+                      Json::Value out;
+                      return ZELOQRMClientTestConnect(list, kApi, out) ? out["protocol"].asString()
+                                                                      : "false";
+                  },
+                  [] { return stored::Describe(); },
+                  "ZELOCredAlloc IsPort IsPort ZELOCredItemSetProtocol ZELOCredItemSetHost "
+                  "ZELOCredItemSetPort GetWebAPIPath",
+                  {"https", "", ""},
+                  {{"ZELOCredAlloc", none},
+                   {"IsPort", none},
+                   {"ZELOCredItemSetProtocol", fallback},
+                   {"ZELOCredItemSetHost", fallback},
+                   {"ZELOCredItemSetPort", fallback},
+                   {"GetWebAPIPath", fallback}}});
+}
+
+TEST_F(Join, SurvivesEveryFailingCall) {
+    std::string strList;
+    Json::Value list(Json::arrayValue);
+    list.append(Candidate(0, s_pServer->HttpsPort()));
+    json_text::ToString(list, strList);
+    const torture::Expected noConnection{
+        "-1", "Cannot find available Connection[" + strList + ']', ""};
+    const torture::Expected notSaved{"-1", "Cannot save server credential", ""};
+    const torture::Expected silent{"-1", "", Stored()};
+    const torture::Expected joined{"0", "", Stored()};
+    torture::Run(
+        {"join", kFile, stored::Clear,
+         [] {
+             Json::Value info = JoinInfo();
+             info["server_http_port"] = 0;
+             return std::to_string(ZELOQRMClientSendCreateClient(info));
+         },
+         [] { return stored::Describe(); },
+         "ZELOCredAlloc CredRequestNew ZELOCredAlloc IsPort IsPort ZELOCredItemSetProtocol "
+         "ZELOCredItemSetHost ZELOCredItemSetPort GetWebAPIPath ZELOCredItemSetProtocol "
+         "ZELOCredItemSetHost ZELOCredItemSetPort SetWebAPIURL ZELOCredItemSetApplication "
+         "ZELOCredItemSetOwner ZELOCredSave gethostname YLIBCFileGetKeyValue "
+         "YLIBCFileGetKeyValue YLIBCFileGetKeyValue YLIBCFileGetKeyValue YLIBCFileGetKeyValue "
+         "YLIBCFileGetKeyValue YLIBCFileCheckKeyValue YLIBCFileGetKeyValue AddPostParam "
+         "SetEncryptMode Process GetResponse",
+         joined,
+         {{"ZELOCredAlloc#1", {"-1", "", ""}},
+          {"CredRequestNew", {"-1", "create cred request fail", ""}},
+          {"ZELOCredAlloc#2", noConnection},
+          {"IsPort", noConnection},
+          {"ZELOCredItemSetProtocol", noConnection},
+          {"ZELOCredItemSetHost", noConnection},
+          {"ZELOCredItemSetPort", noConnection},
+          {"GetWebAPIPath", noConnection},
+          {"SetWebAPIURL", noConnection},
+          {"ZELOCredItemSetApplication", notSaved},
+          {"ZELOCredItemSetOwner", notSaved},
+          {"ZELOCredSave", notSaved},
+          {"gethostname", {"-1", "get hostname fail", Stored()}},
+          {"YLIBCFileGetKeyValue", silent},
+          {"YLIBCFileGetKeyValue#4", joined},  // the small fix number
+          {"YLIBCFileCheckKeyValue", joined},
+          {"AddPostParam", {"-1", "send create client fail: {\"error\":{\"code\":101},"
+                                  "\"success\":false}", Stored()}},
+          {"SetEncryptMode", joined},
+          {"Process", silent},
+          {"GetResponse", {"-1", "send create client fail: {\"data\":{\"id\":1},"
+                                 "\"success\":true}", Stored()}}}});
+}
+
+TEST_F(Join, DescribesTheApplianceOverOneConnection) {
+    EXPECT_EQ(ZELOQRMClientSendCreateClient(JoinInfo()), 0);
+    EXPECT_EQ(stored::Describe(), Stored());
+
+    const Json::Value requests = s_pServer->Requests();
+    ASSERT_EQ(requests.size(), 2U);
+    EXPECT_EQ(requests[0]["connection"], requests[1]["connection"]);
+    EXPECT_EQ(requests[1]["scheme"], "https");
+    Json::Value call;
+    ASSERT_TRUE(json_text::FromString(requests[1]["body"].asString(), call));
+    Json::Value expected;
+    expected["sn"] = "SN1";
+    expected["name"] = HostName();
+    expected["host"] = HostName();
+    expected["model"] = "NVO-918";
+    expected["build_number"] = 123;
+    expected["nvo_version"] = "NVO 6.2-123 Update 4";
+    expected["http_port"] = 5000;
+    expected["https_port"] = 5001;
+    expected["access_token"] = kToken;
+    EXPECT_EQ(call["params"], expected);
+    EXPECT_EQ(call["api"].asString() + call["method"].asString(), "ZELO.QRM.RPCjoin");
+    EXPECT_EQ(call["version"], 1);
+}
+
+TEST_F(Join, FactsFollowTheirRules) {
+    const struct {
+        const char *szFact;
+        const char *szVersion;   // "" keeps the usual one
+        const char *szConfig;
+        const char *szJoinInfo;  // members added to the caller's
+        const char *szExpected;  // members of the description; "" when join fails
+    } rows[] = {
+        {"no small fix", "majorversion=7\nminorversion=0\nbuildnumber=9x", "", "{}",
+         R"({"nvo_version":"NVO 7.0-9x","build_number":9})"},
+        {"small fix 0", "majorversion=7\nminorversion=0\nbuildnumber=9\nsmallfixnumber=0", "", "{}",
+         R"({"nvo_version":"NVO 7.0-9"})"},
+        {"small fix 00", "majorversion=7\nminorversion=0\nbuildnumber=9\nsmallfixnumber=00", "",
+         "{}", R"({"nvo_version":"NVO 7.0-9 Update 00"})"},
+        {"no build", "majorversion=7\nminorversion=0", "", "{}", ""},
+        {"https not served", "", "admin_port=80\nrunHTTPS=no", "{}",
+         R"({"http_port":80,"https_port":0})"},
+        {"https served without a port", "", "admin_port=80\nrunHTTPS=yes", "{}", ""},
+        {"the caller's values go as they are", "", "#",
+         R"({"http_port":"1","https_port":[2],"host":null,"id":"I","sn":"S2"})",
+         R"({"http_port":"1","https_port":[2],"host":null,"id":"I","sn":"S2"})"},
+    };
+    for (const auto &row : rows) {
+        SCOPED_TRACE(row.szFact);
+        SetUp();
+        if (row.szVersion[0] != '\0') {
+            Write(kVersion, row.szVersion);
+        }
+        if (row.szConfig[0] != '\0') {
+            Write(kConfig, row.szConfig);
+        }
+        Json::Value info = JoinInfo();
+        Json::Value added;
+        ASSERT_TRUE(json_text::FromString(row.szJoinInfo, added));
+        for (const std::string &strName : added.getMemberNames()) {
+            info[strName] = added[strName];
+        }
+        Json::Value expected;
+        const bool blJoins = json_text::FromString(row.szExpected, expected);
+        EXPECT_EQ(ZELOQRMClientSendCreateClient(info), blJoins ? 0 : -1);
+        EXPECT_EQ(stored::Describe(), Stored());
+        const Json::Value requests = s_pServer->Requests();
+        ASSERT_EQ(requests.size(), blJoins ? 2U : 1U);
+        Json::Value call;
+        json_text::FromString(requests[requests.size() - 1U]["body"].asString(), call);
+        for (const std::string &strName : expected.getMemberNames()) {
+            EXPECT_EQ(call["params"][strName], expected[strName]) << strName;
+        }
+    }
+}
+
+TEST_F(Join, RefusedRepliesAreLoggedWithoutTheToken) {
+    std::string strDeep(2000, '[');
+    const struct {
+        std::string strBody;
+        const char *szLogged;  // nullptr: accepted
+    } rows[] = {
+        {R"({"success":true})", nullptr},
+        {R"({"success":1})", nullptr},
+        {R"({"success":false,"error":{"code":105}})", R"({"success":false,"error":{"code":105}})"},
+        {R"({"success":"true"})", R"({"success":"true"})"},
+        {R"({"success":[true]})", R"({"success":[true]})"},
+        {"<html>\r\n\x01</html>", "<html>\\r\\n\\x01</html>"},
+        {"", ""},
+        {R"({"success":tr)", R"({"success":tr)"},
+        {"[true]", "[true]"},
+        {"1", "1"},
+        {strDeep, strDeep.c_str()},
+        {std::string("token ") + kToken + " se\\/cr\\\"et-0123456789", "token *** ***"},
+    };
+    for (const auto &row : rows) {
+        stored::Clear();
+        devserver::NextAnswer answer;
+        answer.method = "join";
+        answer.status = 200;
+        answer.body = row.strBody;
+        s_pServer->AnswerNext(kApi, answer);
+        int result = 1;
+        const seam::Outcome outcome =
+            seam::Observe([&] { result = ZELOQRMClientSendCreateClient(JoinInfo()); });
+        EXPECT_EQ(result, row.szLogged == nullptr ? 0 : -1) << row.strBody;
+        EXPECT_EQ(Messages(outcome), row.szLogged == nullptr
+                                         ? std::string()
+                                         : std::string("send create client fail: ") + row.szLogged);
+        EXPECT_EQ(stored::Describe(), Stored());
+        EXPECT_EQ(outcome.recordsLeft, 0);
+    }
+}
+
+TEST_F(Join, HugeRepliesAreCutInTheLog) {
+    devserver::NextAnswer answer;
+    answer.method = "join";
+    answer.body = std::string(100000, 'x');
+    s_pServer->AnswerNext(kApi, answer);
+    const seam::Outcome outcome =
+        seam::Observe([&] { EXPECT_EQ(ZELOQRMClientSendCreateClient(JoinInfo()), -1); });
+    ASSERT_EQ(outcome.logs.size(), 1U);
+    EXPECT_LT(outcome.logs[0].strMessage.size(), 8100U);
+    EXPECT_NE(outcome.logs[0].strMessage.find("100025 bytes in all"), std::string::npos);
+}
+
+TEST_F(Join, IncompleteInputTouchesNothing) {
+    for (const char *szMember :
+         {"sn", "access_token", "server_host", "server_http_port", "server_https_port"}) {
+        Json::Value info = JoinInfo();
+        info.removeMember(szMember);
+        const seam::Outcome outcome =
+            seam::Observe([&] { EXPECT_EQ(ZELOQRMClientSendCreateClient(info), -1); });
+        EXPECT_TRUE(outcome.calls.empty() && outcome.logs.empty()) << szMember;
+    }
+    EXPECT_EQ(ZELOQRMClientSendCreateClient(Json::Value("text")), -1);
+    EXPECT_EQ(s_pServer->Requests().size(), 0U);
+    EXPECT_EQ(stored::Describe(), "");
+}
+
+TEST_F(Join, OtherConnectionsComeFirstAndTheExplicitOneLast) {
+    Json::Value info = JoinInfo();
+    info["server_conn"].append(Candidate(s_pServer->HttpPort(), 0));
+    EXPECT_EQ(ZELOQRMClientSendCreateClient(info), 0);
+    EXPECT_EQ(stored::Describe(), Stored("http"));
+
+    stored::Clear();
+    info["server_conn"] = "no array";
+    EXPECT_EQ(ZELOQRMClientSendCreateClient(info), 0);
+    EXPECT_EQ(stored::Describe(), Stored());
+
+    // A second join adds a record; the first stays in force.
+    info["server_conn"] = Json::Value(Json::arrayValue);
+    info["server_conn"].append(Candidate(s_pServer->HttpPort(), 0));
+    EXPECT_EQ(ZELOQRMClientSendCreateClient(info), 0);
+    EXPECT_EQ(stored::Describe(), Stored());
+    ZELO_CRED *pList = nullptr;
+    EXPECT_EQ(ZELOCredListGet(&pList, ZELOCredKeepByApplication, "ZELO.QRM"), 2);
+    ZELOCredListFree(&pList);
+
+    info = JoinInfo();
+    info["server_http_port"] = "80";
+    info["server_https_port"] = "443";
+    const seam::Outcome outcome =
+        seam::Observe([&] { EXPECT_EQ(ZELOQRMClientSendCreateClient(info), -1); });
+    EXPECT_EQ(Messages(outcome),
+              R"(Cannot find available Connection[[{"host":"localhost","http_port":"80",)"
+              R"("https_port":"443"}]])");
+}
+
+}  // namespace
