@@ -1,1 +1,54 @@
-int main() { return 0; }
+// qrmctl: the library at a shell.
+
+#include <syslog.h>
+
+#include <CLI/CLI.hpp>
+#include <exception>
+#include <iostream>
+
+#include "commands.h"
+
+namespace {
+
+// Every command at every level takes the same two flags.
+void AddCommonFlags(CLI::App &app, bool &blJson, bool &blVerbose) {
+    for (CLI::App *pCommand : app.get_subcommands(nullptr)) {
+        if (pCommand->get_subcommands(nullptr).empty()) {
+            pCommand->add_flag("--json", blJson, "Print one JSON object");
+            pCommand->add_flag("-v", blVerbose, "Show the library's log lines on standard error");
+        }
+        AddCommonFlags(*pCommand, blJson, blVerbose);
+    }
+}
+
+int Run(int argc, char **argv) {
+    CLI::App app("Makes this appliance a client of a QRM server, and shows what it is.", "qrmctl");
+    app.require_subcommand(1);
+    qrmctl::Action action;
+    qrmctl::AddTestConnection(app, action);
+    qrmctl::AddJoin(app, action);
+    qrmctl::AddCredential(app, action);
+    bool blJson = false;
+    bool blVerbose = false;
+    AddCommonFlags(app, blJson, blVerbose);
+    try {
+        app.parse(argc, argv);
+    } catch (const CLI::ParseError &error) {
+        return app.exit(error) == 0 ? qrmctl::kDone : qrmctl::kUsage;
+    }
+
+    openlog("qrmctl", blVerbose ? LOG_PERROR : 0, LOG_USER);
+    qrmctl::Report report(blJson);
+    return action(report);
+}
+
+}  // namespace
+
+int main(int argc, char **argv) {
+    try {
+        return Run(argc, argv);
+    } catch (const std::exception &error) {
+        std::cerr << "qrmctl: " << error.what() << '\n';
+        return qrmctl::kFailed;
+    }
+}

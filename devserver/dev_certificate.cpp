@@ -100,8 +100,7 @@ bool CertificateAuthority::Create() {
     m_pCertificate = MakeCertificate(m_pKey.get(), "QRM development authority", {},
                                      {{NID_basic_constraints, "critical,CA:TRUE,pathlen:0"},
                                       {NID_key_usage, "critical,keyCertSign,cRLSign"},
-                                      {NID_subject_key_identifier, "hash"},
-                                      {NID_authority_key_identifier, "keyid"}},
+                                      {NID_subject_key_identifier, "hash"}},
                                      nullptr, m_pKey.get());
     m_strPem = m_pCertificate ? PemText(m_pCertificate.get()) : std::string();
     return !m_strPem.empty();

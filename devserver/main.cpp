@@ -5,9 +5,11 @@
 #include <unistd.h>
 
 #include <CLI/CLI.hpp>
+#include <cerrno>
 #include <csignal>
 #include <cstdio>
 #include <cstdlib>
+#include <cstring>
 #include <fstream>
 #include <iostream>
 
@@ -65,7 +67,8 @@ bool WriteFile(const std::string &strFile, const std::string &strText) {
     if (fd >= 0) {
         unlink(strTemporary.c_str());
     }
-    return Complain("cannot write '" + strFile + "': " + std::strerror(error));
+    return Complain("cannot write '" + strFile + "': " + std::strerror(error) +
+                    "; name a file in a directory that can be written");
 }
 
 bool Announce(const devserver::DevServer &server, const std::string &strHost, const Files &files) {

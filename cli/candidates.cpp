@@ -1,0 +1,78 @@
+#include "candidates.h"
+
+#include "input_file.h"
+#include "json_text.h"
+#include "web_api_request.h"
+
+namespace qrmctl {
+namespace {
+
+using json_text::Member;
+
+bool IsPort(const Json::Value &value) {
+    int port = 0;
+    return json_text::ReadInt(value, port) && ZELO::APIValidator::IsPort(port);
+}
+
+// What keeps an entry from being tried; null when nothing does.
+const char *Flaw(const Json::Value &candidate) {
+    if (!candidate.isObject()) {
+        return "it is no object";
+    }
+    const char *szHost = json_text::Text(Member(candidate, "host"));
+    if (szHost == nullptr || szHost[0] == '\0') {
+        return "\"host\" has to be a text that is not empty";
+    }
+    if (!IsPort(Member(candidate, "http_port"))) {
+        return "\"http_port\" has to be an integer from 0 to 65535";
+    }
+    if (!IsPort(Member(candidate, "https_port"))) {
+        return "\"https_port\" has to be an integer from 0 to 65535";
+    }
+    return nullptr;
+}
+
+}  // namespace
+
+bool ReadCandidates(const std::string &strFile, Report &report, Json::Value &candidates,
+                    std::string &strError) {
+    if (!ReadJsonFile("candidate list", strFile, candidates, strError)) {
+        return false;
+    }
+    if (!candidates.isArray() || candidates.empty()) {
+        strError = "cannot use candidate list '" + strFile +
+                   "': it has to be an array of objects with \"host\", \"http_port\" and "
+                   "\"https_port\"";
+        return false;
+    }
+    for (Json::ArrayIndex i = 0; i < candidates.size(); ++i) {
+        const char *szFlaw = Flaw(candidates[i]);
+        if (szFlaw != nullptr) {
+            report.Warn("candidate " + std::to_string(i + 1) + " of '" + strFile +
+                        "' is passed over: " + szFlaw);
+        }
+    }
+    return true;
+}
+
+void ForbidHttp(Json::Value &candidates) {
+    for (Json::Value &candidate : candidates) {
+        // A port of another type keeps the candidate out altogether.
+        if (IsPort(Member(candidate, "http_port"))) {
+            candidate["http_port"] = 0;
+        }
+    }
+}
+
+bool HasSecurePort(const Json::Value &candidates) {
+    for (const Json::Value &candidate : candidates) {
+        int port = 0;
+        if (Flaw(candidate) == nullptr &&
+            json_text::ReadInt(Member(candidate, "https_port"), port) && port > 0) {
+            return true;
+        }
+    }
+    return false;
+}
+
+}  // namespace qrmctl

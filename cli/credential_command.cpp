@@ -1,0 +1,115 @@
+// qrmctl credential: show, create, update and delete the stored server credential.
+
+#include <memory>
+
+#include "commands.h"
+#include "input_file.h"
+#include "json_text.h"
+#include "zeloqrmclient.h"
+
+namespace qrmctl {
+namespace {
+
+using json_text::HasMember;
+using json_text::Member;
+
+ExitCode Show(bool blWithToken, Report &report) {
+    Json::Value cred(Json::objectValue);
+    const bool blFound = blWithToken ? ZELOQRMClientGetServerCredentialWithToken(cred)
+                                     : ZELOQRMClientGetServerCredential(cred);
+    if (!blFound && HasMember(cred, "host")) {
+        return report.Fail("the server credential has no session: join again");
+    }
+    if (!blFound) {
+        return report.Fail(
+            "no server credential is stored (or the store cannot be read, see -v): join first");
+    }
+    for (const char *szName :
+         {"protocol", "host", "port", "application", "sn", "access_token", "csrf_token"}) {
+        if (HasMember(cred, szName)) {
+            report.Fact(szName, cred[szName]);
+        }
+    }
+    return report.Done();
+}
+
+// What the library would refuse, as a sentence; empty when there is nothing.
+std::string Flaw(const Json::Value &cred, bool blComplete) {
+    if (!cred.isObject()) {
+        return "it has to be an object";
+    }
+    for (const char *szName : {"protocol", "host", "application", "access_token"}) {
+        const bool blNeeded = blComplete || std::string(szName) == "application";
+        if (!HasMember(cred, szName) ? blNeeded
+                                     : json_text::Text(Member(cred, szName)) == nullptr) {
+            return std::string("\"") + szName + "\" has to be a text";
+        }
+    }
+    int port = 0;
+    if (!HasMember(cred, "port") ? blComplete : !json_text::ReadInt(Member(cred, "port"), port)) {
+        return "\"port\" has to be an integer";
+    }
+    return {};
+}
+
+ExitCode Change(const std::string &strFile, bool blCreate, Report &report) {
+    Json::Value cred;
+    std::string strError;
+    if (!ReadJsonFile("credential", strFile, cred, strError)) {
+        return report.Fail(strError);
+    }
+    const std::string strFlaw = Flaw(cred, blCreate);
+    if (!strFlaw.empty()) {
+        return report.Fail("cannot use credential '" + strFile + "': " + strFlaw);
+    }
+    if (blCreate && !ZELOQRMClientCreateServerCredential(cred)) {
+        return report.Fail("the credential could not be stored; -v shows the reason");
+    }
+    if (!blCreate && !ZELOQRMClientUpdateServerCredential(cred)) {
+        return report.Fail("the credential could not be changed: is one stored for the application '" +
+                           cred["application"].asString() + "', with a session? -v shows more");
+    }
+    report.Say(blCreate ? "The credential is stored." : "The credential is changed.");
+    return report.Done();
+}
+
+ExitCode Delete(Report &report) {
+    if (!ZELOQRMClientDeleteServerCredential()) {
+        return report.Fail("the credential could not be removed whole; -v shows the reason");
+    }
+    report.Say("No server credential is stored any more.");
+    return report.Done();
+}
+
+void AddChange(CLI::App &parent, Action &action, const char *szName, const char *szDescription,
+               bool blCreate) {
+    auto *const pCommand = parent.add_subcommand(szName, szDescription);
+    const auto pFile = std::make_shared<std::string>();
+    pCommand->add_option("FILE", *pFile, "JSON file with the credential, - for standard input")
+        ->required();
+    pCommand->callback([pFile, blCreate, &action] {
+        action = [pFile, blCreate](Report &report) { return Change(*pFile, blCreate, report); };
+    });
+}
+
+}  // namespace
+
+void AddCredential(CLI::App &app, Action &action) {
+    auto *const pCredential =
+        app.add_subcommand("credential", "Show or change the stored server credential");
+    pCredential->require_subcommand(1);
+
+    auto *const pShow = pCredential->add_subcommand("show", "Show the server credential");
+    const auto pWithToken = std::make_shared<bool>(false);
+    pShow->add_flag("--with-token", *pWithToken, "Show the tokens too");
+    pShow->callback([pWithToken, &action] {
+        action = [pWithToken](Report &report) { return Show(*pWithToken, report); };
+    });
+    AddChange(*pCredential, action, "create", "Store a server credential and its session", true);
+    AddChange(*pCredential, action, "update", "Change the stored server credential", false);
+    pCredential->add_subcommand("delete", "Remove the server credential")->callback([&action] {
+        action = Delete;
+    });
+}
+
+}  // namespace qrmctl

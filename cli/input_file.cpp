@@ -1,0 +1,84 @@
+#include "input_file.h"
+
+#include <cerrno>
+#include <cstring>
+#include <fstream>
+#include <iostream>
+#include <sstream>
+
+#include "json_text.h"
+
+namespace qrmctl {
+namespace {
+
+// The credential store gives a token back through a buffer of this size; a longer one would come
+// back cut.
+constexpr std::size_t kMaxToken = 1023;
+
+bool ReadAll(const char *szWhat, const std::string &strFile, std::string &strText,
+             std::string &strError) {
+    std::ostringstream text;
+    if (strFile == "-") {
+        text << std::cin.rdbuf();
+    } else {
+        errno = 0;
+        std::ifstream file(strFile, std::ios::binary);
+        if (file && file.peek() != std::ifstream::traits_type::eof()) {
+            text << file.rdbuf();
+        }
+        if (!file.is_open() || file.bad() || errno == EISDIR) {
+            strError = std::string("cannot read ") + szWhat + " '" + strFile +
+                       "': " + std::strerror(errno == 0 ? EIO : errno);
+            return false;
+        }
+    }
+    strText = text.str();
+    return true;
+}
+
+}  // namespace
+
+bool ReadJsonFile(const char *szWhat, const std::string &strFile, Json::Value &value,
+                  std::string &strError) {
+    std::string strText;
+    if (!ReadAll(szWhat, strFile, strText, strError)) {
+        return false;
+    }
+    std::string strReason;
+    if (!json_text::FromString(strText, value, &strReason)) {
+        strError = std::string("cannot read ") + szWhat + " '" + strFile + "': " + strReason;
+        return false;
+    }
+    return true;
+}
+
+bool ReadTokenFile(const std::string &strFile, std::string &strToken, std::string &strError) {
+    std::string strText;
+    if (!ReadAll("token file", strFile, strText, strError)) {
+        return false;
+    }
+    for (char c : {'\n', '\r'}) {
+        if (!strText.empty() && strText.back() == c) {
+            strText.pop_back();
+        }
+    }
+    const char *szReason = nullptr;
+    if (strText.empty()) {
+        szReason = "it is empty; write the access token into it";
+    } else if (strText.size() > kMaxToken) {
+        szReason = "a token has at most 1023 bytes";
+    }
+    for (char c : strText) {
+        if (static_cast<unsigned char>(c) <= 0x20 || c == 0x7F) {
+            szReason = "it has to hold the token alone, on one line and without blanks";
+        }
+    }
+    if (szReason != nullptr) {
+        strError = "cannot use token file '" + strFile + "': " + szReason;
+        return false;
+    }
+    strToken = strText;
+    return true;
+}
+
+}  // namespace qrmctl

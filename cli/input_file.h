@@ -1,0 +1,22 @@
+// Input files of the commands: checked before anything is done with them.
+
+#ifndef QRMCTL_INPUT_FILE_H
+#define QRMCTL_INPUT_FILE_H
+
+#include <json/value.h>
+
+#include <string>
+
+namespace qrmctl {
+
+// Each returns whether the input can be used; if not, strError says in one line what is wrong with
+// which file. "-" is standard input. szWhat names the input in messages, such as "candidate list".
+bool ReadJsonFile(const char *szWhat, const std::string &strFile, Json::Value &value,
+                  std::string &strError);
+
+// The access token: the one line of a file.
+bool ReadTokenFile(const std::string &strFile, std::string &strToken, std::string &strError);
+
+}  // namespace qrmctl
+
+#endif

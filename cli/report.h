@@ -1,0 +1,43 @@
+// What a command tells its user: text for people, or one JSON object for programs, never mixed.
+
+#ifndef QRMCTL_REPORT_H
+#define QRMCTL_REPORT_H
+
+#include <json/value.h>
+
+#include <string>
+
+namespace qrmctl {
+
+enum ExitCode { kDone = 0, kFailed = 1, kUsage = 2 };
+
+class Report {
+  public:
+    explicit Report(bool blJson) : m_blJson(blJson) {}
+
+    // A fact of the result: a line "name: value" for people, a member for programs.
+    void Fact(const std::string &strName, const Json::Value &value);
+
+    // A sentence for people; programs do not see it.
+    void Say(const std::string &strSentence) const;
+
+    // Something odd that does not end the command.
+    void Warn(const std::string &strSentence);
+
+    // Ends the command: prints the JSON object, when one is asked for, and gives the exit code.
+    ExitCode Done();
+    ExitCode Fail(const std::string &strError);
+
+  private:
+    void PrintJson();
+
+    bool m_blJson;
+    Json::Value m_result{Json::objectValue};
+};
+
+// Text from a file or a server for a terminal: control characters are shown as \xNN.
+std::string Printable(const std::string &strText);
+
+}  // namespace qrmctl
+
+#endif

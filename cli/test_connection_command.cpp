@@ -1,0 +1,52 @@
+// qrmctl test-connection: which of several connections reaches a server?
+
+#include <memory>
+
+#include "candidates.h"
+#include "commands.h"
+#include "zeloqrmclient.h"
+
+namespace qrmctl {
+namespace {
+
+struct Options {
+    std::string strApi;
+    std::string strCandidates;
+};
+
+ExitCode TestConnection(const Options &options, Report &report) {
+    Json::Value candidates;
+    std::string strError;
+    if (!ReadCandidates(options.strCandidates, report, candidates, strError)) {
+        return report.Fail(strError);
+    }
+    Json::Value connection;
+    if (!ZELOQRMClientTestConnect(candidates, options.strApi, connection)) {
+        return report.Fail("no candidate of '" + options.strCandidates + "' answered for the API '" +
+                           options.strApi + "': check addresses, ports and certificates; -v shows "
+                           "the reason of each attempt");
+    }
+    report.Fact("protocol", connection["protocol"]);
+    report.Fact("host", connection["host"]);
+    report.Fact("port", connection["port"]);
+    return report.Done();
+}
+
+}  // namespace
+
+void AddTestConnection(CLI::App &app, Action &action) {
+    auto *const pCommand =
+        app.add_subcommand("test-connection", "Find the first connection at which a server answers");
+    const auto pOptions = std::make_shared<Options>();
+    pCommand->add_option("--api", pOptions->strApi, "Web API that the server has to serve")
+        ->required();
+    pCommand
+        ->add_option("CANDIDATES", pOptions->strCandidates,
+                     "JSON file with the candidate connections, - for standard input")
+        ->required();
+    pCommand->callback([pOptions, &action] {
+        action = [pOptions](Report &report) { return TestConnection(*pOptions, report); };
+    });
+}
+
+}  // namespace qrmctl
