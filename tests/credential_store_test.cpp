@@ -1,0 +1,222 @@
+// What any credential store has to promise, and what the host's adds: one file, safe for processes.
+
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <filesystem>
+#include <fstream>
+#include <functional>
+#include <set>
+#include <sstream>
+
+#include "last_error.h"
+#include "stored.h"
+
+namespace {
+
+namespace fs = std::filesystem;
+
+void RemoveStore() { fs::remove_all(stored::kFolder); }
+
+// Runs the body in a child process; true when it returned true.
+bool InChild(const std::function<bool()> &body) {
+    const pid_t pid = fork();
+    if (pid == 0) {
+        _exit(body() ? 0 : 1);
+    }
+    int status = -1;
+    waitpid(pid, &status, 0);
+    return WIFEXITED(status) && WEXITSTATUS(status) == 0;
+}
+
+std::string Content(const char *szPath) {
+    std::ostringstream text;
+    text << std::ifstream(szPath, std::ios::binary).rdbuf();
+    return text.str();
+}
+
+int Mode(const char *szPath) {
+    struct stat status = {};
+    return stat(szPath, &status) == 0 ? static_cast<int>(status.st_mode & 07777U) : -1;
+}
+
+TEST(CredentialStore, LooksAreNotWrites) {
+    RemoveStore();
+    EXPECT_EQ(stored::Describe(), "");
+    EXPECT_EQ(ZELOCredRemoveByID(5), 0);
+    EXPECT_EQ(ZELOCredSessRemoveByID(5), 0);
+    ZELO_CRED *pList = nullptr;
+    EXPECT_EQ(ZELOCredListGet(&pList, ZELOCredKeepByApplication, "ZELO.QRM"), 0);
+    EXPECT_FALSE(fs::exists(stored::kFolder));
+
+    stored::AddCredential("ZELO.QRM", "a");
+    EXPECT_EQ(Mode(stored::kFolder), 0700);
+    EXPECT_EQ(Mode(stored::kDatabase), 0600);
+}
+
+TEST(CredentialStore, IdsAreNeverUsedAgain) {
+    RemoveStore();
+    std::set<long> ids;
+    for (int i = 0; i < 5; ++i) {
+        const long id = stored::AddCredential("ZELO.QRM", "a");
+        EXPECT_GE(id, 0);
+        EXPECT_TRUE(ids.insert(id).second);
+        EXPECT_EQ(ZELOCredRemoveByID(id), 0);
+    }
+}
+
+TEST(CredentialStore, LookUpAndListAgreeOnTheLowestId) {
+    RemoveStore();
+    stored::AddCredential("Other", "x");
+    const long first = stored::AddCredential("ZELO.QRM", "first");
+    stored::AddCredential("ZELO.QRM", "second");
+    EXPECT_EQ(ZELOCredIDGetByApplication("ZELO.QRM"), first);
+    // A filter of the caller's own sees every record.
+    const ZELO_CRED_KEEP keepSecondAndOther = [](const ZELO_CRED *pCred, const char *) {
+        char sz[16] = {};
+        ZELOCredItemGetHost(sz, sizeof(sz), pCred);
+        return static_cast<int>(std::string(sz) != "first");
+    };
+    const struct {
+        ZELO_CRED_KEEP pfnKeep;
+        const char *szFirst;
+    } rows[] = {{ZELOCredKeepByApplication, "first"}, {keepSecondAndOther, "x"}};
+    for (const auto &row : rows) {
+        ZELO_CRED *pList = nullptr;
+        EXPECT_EQ(ZELOCredListGet(&pList, row.pfnKeep, "ZELO.QRM"), 2);
+        char szHost[64];
+        EXPECT_EQ(ZELOCredItemGetHost(szHost, sizeof(szHost), pList), 0);
+        EXPECT_STREQ(szHost, row.szFirst);
+        ZELOCredListFree(&pList);
+        EXPECT_EQ(pList, nullptr);
+    }
+}
+
+TEST(CredentialStore, LoadsWhatIsThereAndNothingElse) {
+    RemoveStore();
+    const long id = stored::AddCredential("ZELO.QRM", "host");
+    ZELO_CRED *pCred = ZELOCredAlloc();
+    char sz[8];
+    EXPECT_EQ(ZELOCredLoad(id, pCred), 0);
+    EXPECT_LT(ZELOCredLoad(id + 1, pCred), 0);
+    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_NOT_FOUND));
+    EXPECT_EQ(ZELOCredItemGetHost(sz, sizeof(sz), pCred), 0);
+    EXPECT_EQ(ZELOCredItemGetHost(sz, 3, pCred), 0);
+    EXPECT_STREQ(sz, "ho");
+    EXPECT_EQ(ZELOCredLoad(-1, pCred), 0);
+    EXPECT_NE(ZELOCredItemGetHost(sz, sizeof(sz), pCred), 0);
+    long none = 7;
+    EXPECT_LT(ZELOCredItemGetID(&none, pCred), 0);
+    EXPECT_EQ(none, 7);
+    // A record that was removed meanwhile does not come back.
+    EXPECT_EQ(ZELOCredLoad(id, pCred), 0);
+    EXPECT_EQ(ZELOCredRemoveByID(id), 0);
+    EXPECT_LT(ZELOCredSave(pCred), 0);
+    ZELOCredFree(pCred);
+
+    ZELO_CRED_SESS *pSess = ZELOCredSessAlloc();
+    EXPECT_LT(ZELOCredSessSave(pSess), 0);
+    EXPECT_LT(ZELOCredSessLoad(id, pSess), 0);
+    EXPECT_EQ(ZELOCredSessLoad(-1, pSess), 0);
+    ZELOCredSessFree(pSess);
+}
+
+TEST(CredentialStore, NullIsRefused) {
+    char sz[4];
+    long n = 0;
+    for (int result :
+         {ZELOCredSave(nullptr), ZELOCredLoad(1, nullptr), ZELOCredItemSetPort(nullptr, 1),
+          ZELOCredItemSetHost(nullptr, "x"), ZELOCredItemGetHost(sz, sizeof(sz), nullptr),
+          ZELOCredItemGetPort(&n, nullptr), ZELOCredItemGetID(&n, nullptr),
+          ZELOCredListGet(nullptr, ZELOCredKeepByApplication, "x"), ZELOCredSessSave(nullptr),
+          ZELOCredSessLoad(1, nullptr), static_cast<int>(ZELOCredIDGetByApplication(nullptr))}) {
+        EXPECT_LT(result, 0);
+        EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_INVALID_ARGUMENT));
+    }
+    ZELOCredFree(nullptr);
+    ZELOCredSessFree(nullptr);
+    ZELOCredListFree(nullptr);
+}
+
+TEST(CredentialStore, ProcessesWriteAtOnceAndLoseNothing) {
+    RemoveStore();
+    stored::AddCredential("Parent", "open before the fork");
+    constexpr int kProcesses = 6;
+    constexpr int kRecords = 15;
+    std::vector<pid_t> children;
+    for (int i = 0; i < kProcesses; ++i) {
+        children.push_back(fork());
+        if (children.back() == 0) {
+            bool blAll = true;
+            for (int n = 0; n < kRecords; ++n) {
+                const long id = stored::AddCredential("ZELO.QRM", "child");
+                stored::AddSession(id, "t");
+                blAll = blAll && id >= 0;
+            }
+            _exit(blAll ? 0 : 1);
+        }
+    }
+    for (pid_t pid : children) {
+        int status = -1;
+        waitpid(pid, &status, 0);
+        EXPECT_EQ(status, 0);
+    }
+    ZELO_CRED *pList = nullptr;
+    EXPECT_EQ(ZELOCredListGet(&pList, ZELOCredKeepByApplication, "ZELO.QRM"),
+              kProcesses * kRecords);
+    ZELOCredListFree(&pList);
+    EXPECT_GE(stored::AddCredential("Parent", "still works"), 0);
+}
+
+TEST(CredentialStore, FollowsTheFileThatStandsAtItsPlace) {
+    RemoveStore();
+    stored::AddCredential("ZELO.QRM", "old");
+    fs::copy_file(stored::kDatabase, "/usr/zelo/etc/backup.db", fs::copy_options::overwrite_existing);
+    stored::Clear();
+    EXPECT_EQ(stored::Describe(), "");
+    fs::rename("/usr/zelo/etc/backup.db", stored::kDatabase);
+    EXPECT_EQ(stored::Describe(), "https://old:443 ?");
+    EXPECT_TRUE(InChild([] { return stored::Describe() == "https://old:443 ?"; }));
+}
+
+TEST(CredentialStore, DamagedOrForeignFilesAreLeftAsTheyAre) {
+    RemoveStore();
+    stored::AddCredential("ZELO.QRM", "a");
+    const std::string strGood = Content(stored::kDatabase);
+    std::string strBroken = strGood;
+    strBroken.replace(0, 100, 100, 'x');
+    std::string strForeign = strGood;
+    strForeign.replace(68, 4, "none");  // the place of the application id in the file's header
+    std::string strNewer = strGood;
+    strNewer[63] = 9;  // the format
+    for (const std::string &strContent :
+         {std::string("not a database at all, but text"), strBroken, strForeign, strNewer}) {
+        RemoveStore();
+        fs::create_directory(stored::kFolder);
+        std::ofstream(stored::kDatabase, std::ios::binary) << strContent;
+        EXPECT_EQ(stored::AddCredential("ZELO.QRM", "b"), -1);
+        EXPECT_EQ(YLIBCErrorGetFile(), std::string("credential_store"));
+        ZELO_CRED *pList = nullptr;
+        EXPECT_LT(ZELOCredListGet(&pList, ZELOCredKeepByApplication, "ZELO.QRM"), 0);
+        EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_STORE_DAMAGED));
+        EXPECT_LT(ZELOCredRemoveByID(1), 0);
+        EXPECT_EQ(Content(stored::kDatabase), strContent);
+    }
+    // A process that dies while it creates the file leaves an empty one: that is no damage.
+    std::ofstream(stored::kDatabase, std::ios::binary | std::ios::trunc).flush();
+    EXPECT_EQ(stored::Describe(), "");
+    EXPECT_GE(stored::AddCredential("ZELO.QRM", "a"), 0);
+}
+
+TEST(CredentialStore, RemovedTokensAreGoneFromTheFile) {
+    RemoveStore();
+    const long id = stored::AddCredential("ZELO.QRM", "a");
+    stored::AddSession(id, "top-secret-token");
+    EXPECT_NE(Content(stored::kDatabase).find("top-secret-token"), std::string::npos);
+    EXPECT_EQ(ZELOCredSessRemoveByID(id), 0);
+    EXPECT_EQ(Content(stored::kDatabase).find("top-secret-token"), std::string::npos);
+}
+
+}  // namespace

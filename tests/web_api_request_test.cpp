@@ -1,0 +1,220 @@
+// What a Web API request promises about the wire: whom it trusts, where it goes, when it gives up.
+
+#include <gtest/gtest.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <memory>
+#include <set>
+
+#include "dev_server.h"
+#include "last_error.h"
+#include "web_api_request.h"
+
+namespace {
+
+constexpr const char *kApi = "ZELO.QRM.RPC";
+constexpr const char *kCaFile = "/usr/zelo/etc/ssl/ca.d/server.pem";
+constexpr const char *kConfig = "/etc/zeloinfo.conf";
+
+using Cred = std::unique_ptr<ZELO_CRED, void (*)(ZELO_CRED *)>;
+
+void Write(const char *szPath, const std::string &strText) {
+    // A new file each time, as an operator's tool writes it: the folder changes too.
+    std::filesystem::remove(szPath);
+    std::ofstream(szPath) << strText;
+}
+
+std::string PathOf(const char *szProtocol, int port, const char *szHost = "localhost") {
+    const Cred pCred(ZELOCredAlloc(), ZELOCredFree);
+    ZELOCredItemSetProtocol(pCred.get(), szProtocol);
+    ZELOCredItemSetHost(pCred.get(), szHost);
+    ZELOCredItemSetPort(pCred.get(), port);
+    return ZELO::CredRequestUtil::GetWebAPIPath(pCred.get(), kApi);
+}
+
+class Request : public testing::Test {
+  protected:
+    void SetUp() override {
+        Start(devserver::Options());
+        Write(kCaFile, m_pServer->CaPem());
+        Write(kConfig, "");
+    }
+    void Start(const devserver::Options &options) {
+        m_pServer = std::make_unique<devserver::DevServer>(options);
+        std::string strReason;
+        ASSERT_TRUE(m_pServer->Start(strReason)) << strReason;
+    }
+    // The connections that the server saw, without repeating.
+    std::set<std::string> Connections() const {
+        std::set<std::string> connections;
+        for (const Json::Value &request : m_pServer->Requests()) {
+            connections.insert(request["connection"].asString());
+        }
+        return connections;
+    }
+    std::string Https() const { return PathOf("https", m_pServer->HttpsPort()); }
+    std::string Http() const { return PathOf("http", m_pServer->HttpPort()); }
+    void AnswerDiscovery(devserver::NextAnswer answer) {
+        answer.method = "discover";
+        m_pServer->AnswerNext(kApi, answer);
+    }
+
+    std::unique_ptr<devserver::DevServer> m_pServer;
+};
+
+TEST_F(Request, OnlyAVerifiedServerIsSpokenTo) {
+    EXPECT_EQ(Https(), "/qrm/rpc");
+    EXPECT_EQ(PathOf("https", m_pServer->HttpsPort(), "127.0.0.1"), "/qrm/rpc");
+
+    std::filesystem::remove(kCaFile);
+    EXPECT_EQ(Https(), "") << "an authority that is gone is not trusted any more";
+    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_NETWORK));
+    Write(kCaFile, "no certificate");
+    EXPECT_EQ(Https(), "");
+    Write(kCaFile, m_pServer->CaPem());
+    EXPECT_EQ(Https(), "/qrm/rpc");
+
+    devserver::Options options;
+    options.certificate.names = {"other.example"};
+    Start(options);
+    Write(kCaFile, m_pServer->CaPem());
+    EXPECT_EQ(Https(), "");
+    options = devserver::Options();
+    options.certificate.not_after = std::time(nullptr) - 60;
+    Start(options);
+    Write(kCaFile, m_pServer->CaPem());
+    EXPECT_EQ(Https(), "");
+    EXPECT_EQ(m_pServer->Requests().size(), 0U);
+}
+
+TEST_F(Request, OnlyKnownProtocolsAndPlainHostsAreUsed) {
+    const struct {
+        const char *szProtocol;
+        const char *szHost;
+        bool blAnswers;
+    } rows[] = {
+        {"http", "localhost", true},        {"ftp", "localhost", false},
+        {"file", "localhost", false},       {"HTTP", "localhost", false},
+        {"", "localhost", false},           {"http", "", false},
+        {"http", "user@localhost", false},  {"http", "localhost/qrm", false},
+        {"http", "localhost?x", false},     {"http", "localhost\r\nX: y", false},
+        {"http", "localhost:80", false},    {"fld", "localhost", false},
+    };
+    for (const auto &row : rows) {
+        EXPECT_EQ(!PathOf(row.szProtocol, m_pServer->HttpPort(), row.szHost).empty(), row.blAnswers)
+            << row.szProtocol << ' ' << row.szHost;
+    }
+    EXPECT_EQ(PathOf("http", 0), "");
+    EXPECT_EQ(PathOf("http", 65536), "");
+    for (int port : {-1, 65536}) {
+        EXPECT_FALSE(ZELO::APIValidator::IsPort(port));
+    }
+    for (int port : {0, 65535}) {
+        EXPECT_TRUE(ZELO::APIValidator::IsPort(port));
+    }
+}
+
+TEST_F(Request, ProxyVariablesCountOnlyWhereTheConfigurationSaysSo) {
+    for (const char *szName : {"http_proxy", "https_proxy", "ALL_PROXY"}) {
+        setenv(szName, "http://127.0.0.1:1", 1);
+    }
+    EXPECT_EQ(Http(), "/qrm/rpc");
+    EXPECT_EQ(Https(), "/qrm/rpc");
+    Write(kConfig, "use_proxy_environment=yes\n");
+    EXPECT_EQ(Http(), "");
+    Write(kConfig, "use_proxy_environment=no\nfarlink_relay=\"127.0.0.1:1\"\n");
+    EXPECT_EQ(PathOf("fld", m_pServer->HttpsPort()), "");
+    for (const char *szName : {"http_proxy", "https_proxy", "ALL_PROXY"}) {
+        unsetenv(szName);
+    }
+}
+
+TEST_F(Request, UnusableAnswersCountAsNone) {
+    const auto body = [](const std::string &strBody, int status = 200) {
+        devserver::NextAnswer answer;
+        answer.status = status;
+        answer.body = strBody;
+        return answer;
+    };
+    const auto path = [&](const std::string &strPath) {
+        return body(R"({"success":true,"data":{"path":")" + strPath + "\"}}");
+    };
+    devserver::NextAnswer redirect = body("", 302);
+    redirect.headers["Location"] = "/qrm/discover?api=ZELO.QRM.RPC";
+    devserver::NextAnswer cut;
+    cut.cut_after = 5;
+    for (const devserver::NextAnswer &answer :
+         {body("<html>"), body(""), body("[]"), body("7"), body(R"({"success":"yes"})"),
+          body(R"({"success":true,"data":[]})"), body(R"({"success":true,"data":{"path":1}})"),
+          path("relative"), path(""), path("/a b"), path("/a?b"), path("/a\\r\\nX: y"),
+          path("/" + std::string(2000, 'a')), body(std::string(17 << 20, ' ')),
+          body(std::string(2000, '[')), body(R"({"success":true,"data":{"path":"/x"}})", 500),
+          redirect, cut}) {
+        AnswerDiscovery(answer);
+        EXPECT_EQ(Http(), "") << answer.body.value_or("").substr(0, 60);
+    }
+    EXPECT_EQ(Http(), "/qrm/rpc");
+}
+
+TEST_F(Request, ConnectionsAreUsedAgainButNotByAChild) {
+    for (int i = 0; i < 3; ++i) {
+        EXPECT_EQ(Https(), "/qrm/rpc");
+    }
+    EXPECT_EQ(Connections().size(), 1U);
+    const pid_t pid = fork();
+    if (pid == 0) {
+        _exit(Https() == "/qrm/rpc" ? 0 : 1);
+    }
+    int status = -1;
+    waitpid(pid, &status, 0);
+    EXPECT_EQ(status, 0);
+    EXPECT_EQ(Connections().size(), 2U);
+    EXPECT_EQ(Https(), "/qrm/rpc");
+    EXPECT_EQ(Connections().size(), 2U) << "the parent goes on with its own connection";
+}
+
+TEST_F(Request, PathsAreLearntOnceAndForgottenWhenTheyAreGone) {
+    const Cred pCred(ZELOCredAlloc(), ZELOCredFree);
+    ZELOCredItemSetProtocol(pCred.get(), "http");
+    ZELOCredItemSetHost(pCred.get(), "localhost");
+    ZELOCredItemSetPort(pCred.get(), m_pServer->HttpPort());
+    const auto call = [&](int status) {
+        ZELO::CredRequest request;
+        EXPECT_TRUE(ZELO::CredRequestUtil::SetWebAPIURL(pCred.get(), kApi, 1, "join", &request));
+        devserver::NextAnswer answer;
+        answer.method = "join";
+        answer.status = status;
+        m_pServer->AnswerNext(kApi, answer);
+        EXPECT_TRUE(request.Process(true, 0));
+    };
+    call(200);
+    call(404);
+    EXPECT_EQ(m_pServer->Requests().size(), 3U) << "one discovery, two calls";
+    call(200);
+    EXPECT_EQ(m_pServer->Requests().size(), 5U) << "asked again after the 404";
+
+    ZELO::CredRequest empty;
+    EXPECT_FALSE(empty.Process(true, 0));
+    EXPECT_FALSE(empty.AddPostParam(Json::Value("text")));
+    EXPECT_EQ(empty.GetResponse(), "");
+}
+
+TEST_F(Request, TheCallersTimeLimitEndsAnExchange) {
+    const Cred pCred(ZELOCredAlloc(), ZELOCredFree);
+    ZELOCredItemSetProtocol(pCred.get(), "http");
+    ZELOCredItemSetHost(pCred.get(), "localhost");
+    ZELOCredItemSetPort(pCred.get(), m_pServer->HttpPort());
+    ZELO::CredRequest request;
+    ASSERT_TRUE(ZELO::CredRequestUtil::SetWebAPIURL(pCred.get(), kApi, 1, "join", &request));
+    devserver::NextAnswer answer;
+    answer.delay_ms = 30000;
+    m_pServer->AnswerNext(kApi, answer);
+    EXPECT_FALSE(request.Process(true, 1));
+    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_NETWORK));
+}
+
+}  // namespace
