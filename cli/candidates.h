@@ -11,8 +11,8 @@
 
 namespace qrmctl {
 
-// Reads a candidate list, a JSON array that is not empty; strError says what is wrong. Warns of each
-// entry that the connection test will pass over, with the reason.
+// Reads a candidate list, a JSON array that is not empty; strError says what is wrong. Warns of
+// each entry that the connection test will pass over, with the reason.
 bool ReadCandidates(const std::string &strFile, Report &report, Json::Value &candidates,
                     std::string &strError);
 

@@ -1,5 +1,5 @@
-// The commands of qrmctl. Each registers itself with its options, and sets the action that runs when
-// it is chosen.
+// The commands of qrmctl. Each registers itself with its options, and sets the action that runs
+// when it is chosen.
 
 #ifndef QRMCTL_COMMANDS_H
 #define QRMCTL_COMMANDS_H

@@ -66,8 +66,9 @@ ExitCode Change(const std::string &strFile, bool blCreate, Report &report) {
         return report.Fail("the credential could not be stored; -v shows the reason");
     }
     if (!blCreate && !ZELOQRMClientUpdateServerCredential(cred)) {
-        return report.Fail("the credential could not be changed: is one stored for the application '" +
-                           cred["application"].asString() + "', with a session? -v shows more");
+        return report.Fail(
+            "the credential could not be changed: is one stored for the application '" +
+            cred["application"].asString() + "', with a session? -v shows more");
     }
     report.Say(blCreate ? "The credential is stored." : "The credential is changed.");
     return report.Done();

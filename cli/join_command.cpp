@@ -80,8 +80,7 @@ bool BuildJoinInfo(const Options &options, Report &report, Json::Value &joinInfo
     if (!ReadTokenFile(options.strTokenFile, strToken, strError)) {
         return false;
     }
-    const std::string strSerial =
-        options.strSerial.empty() ? SerialNumber() : options.strSerial;
+    const std::string strSerial = options.strSerial.empty() ? SerialNumber() : options.strSerial;
     if (strSerial.empty()) {
         strError = "this appliance has no serial number: give one with --sn";
         return false;
@@ -109,8 +108,8 @@ bool BuildJoinInfo(const Options &options, Report &report, Json::Value &joinInfo
 
 // The list that join tries: the candidates, then the address given explicitly.
 Json::Value AllCandidates(const Json::Value &joinInfo) {
-    Json::Value all = joinInfo.isMember("server_conn") ? joinInfo["server_conn"]
-                                                       : Json::Value(Json::arrayValue);
+    Json::Value all =
+        joinInfo.isMember("server_conn") ? joinInfo["server_conn"] : Json::Value(Json::arrayValue);
     Json::Value last;
     last["host"] = joinInfo["server_host"];
     last["http_port"] = joinInfo["server_http_port"];
@@ -122,8 +121,9 @@ Json::Value AllCandidates(const Json::Value &joinInfo) {
 // Takes back what a failed join added, and puts the credential back that stood before.
 ExitCode FailAndRestore(const std::string &strError, const Json::Value &before, Report &report) {
     if (!RemoveServerCredentials()) {
-        return report.Fail(strError + "; what it stored could not be removed: run "
-                                      "'qrmctl credential delete'");
+        return report.Fail(strError +
+                           "; what it stored could not be removed: run "
+                           "'qrmctl credential delete'");
     }
     if (before.isMember("access_token")) {
         return ZELOQRMClientCreateServerCredential(before)
@@ -165,7 +165,8 @@ ExitCode Join(const Options &options, Report &report) {
     }
     if (ZELOQRMClientSendCreateClient(joinInfo) != 0) {
         return FailAndRestore(
-            "the server did not accept the join: check token and serial number; -v shows its answer",
+            "the server did not accept the join: check token and serial number; -v shows its "
+            "answer",
             before, report);
     }
     if (!StoreSession(joinInfo["access_token"].asString())) {

@@ -22,8 +22,9 @@ ExitCode TestConnection(const Options &options, Report &report) {
     }
     Json::Value connection;
     if (!ZELOQRMClientTestConnect(candidates, options.strApi, connection)) {
-        return report.Fail("no candidate of '" + options.strCandidates + "' answered for the API '" +
-                           options.strApi + "': check addresses, ports and certificates; -v shows "
+        return report.Fail("no candidate of '" + options.strCandidates +
+                           "' answered for the API '" + options.strApi +
+                           "': check addresses, ports and certificates; -v shows "
                            "the reason of each attempt");
     }
     report.Fact("protocol", connection["protocol"]);
@@ -35,8 +36,8 @@ ExitCode TestConnection(const Options &options, Report &report) {
 }  // namespace
 
 void AddTestConnection(CLI::App &app, Action &action) {
-    auto *const pCommand =
-        app.add_subcommand("test-connection", "Find the first connection at which a server answers");
+    auto *const pCommand = app.add_subcommand(
+        "test-connection", "Find the first connection at which a server answers");
     const auto pOptions = std::make_shared<Options>();
     pCommand->add_option("--api", pOptions->strApi, "Web API that the server has to serve")
         ->required();

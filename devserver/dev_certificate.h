@@ -26,7 +26,7 @@ struct OpensslRelease {
 using KeyOwner = std::unique_ptr<EVP_PKEY, OpensslRelease<EVP_PKEY_free>>;
 using X509Owner = std::unique_ptr<X509, OpensslRelease<X509_free>>;
 
-constexpr std::time_t kHour = 60 * 60;
+constexpr std::time_t kHour = 3600;
 constexpr std::time_t kDay = 24 * kHour;
 
 // What a server certificate says. As it stands it is valid for a server on this machine's loopback;

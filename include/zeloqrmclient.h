@@ -46,8 +46,8 @@
 
 // Stores a new credential and its session.
 //
-// cred: an object with "protocol", "host", "port", "application" and "access_token"; "extra_info" is
-// optional and stored as JSON text ("null" when it is absent). Owner becomes the user id 1024,
+// cred: an object with "protocol", "host", "port", "application" and "access_token"; "extra_info"
+// is optional and stored as JSON text ("null" when it is absent). Owner becomes the user id 1024,
 // create and modify time become now.
 //
 // Returns true when both records are stored. Returns false when a member is missing or of another
@@ -58,15 +58,15 @@
 ZELOQRM_API bool ZELOQRMClientCreateServerCredential(const Json::Value &cred);
 
 // Removes the server's credential and the notification center's (the application
-// "ZELO.NotificationCenter"), each with its session; of several records of one application the one in
-// force.
+// "ZELO.NotificationCenter"), each with its session; of several records of one application the one
+// in force.
 //
 // Returns true when both are gone, also when neither was there. Returns false, without a log line,
 // at the first removal that fails; what is removed by then stays removed.
 ZELOQRM_API bool ZELOQRMClientDeleteServerCredential(void);
 
-// Reads the credential: sets "host", "port", "protocol" and "sn" in out, each as far as it is stored.
-// Other members of out stay as they are.
+// Reads the credential: sets "host", "port", "protocol" and "sn" in out, each as far as it is
+// stored. Other members of out stay as they are.
 //
 // out: null or an object; anything else fails.
 //
@@ -82,14 +82,15 @@ ZELOQRM_API bool ZELOQRMClientGetServerCredentialWithToken(Json::Value &out);
 
 // Changes the credential of the application that cred names, and its session, member by member.
 //
-// cred: an object with "application". Optional: "protocol", "host", "port", "access_token" and "sn",
-// each of which replaces the stored value; "sn" becomes a member of the extra information, whose
-// other members stay. Times, owner and csrf token stay as they are. cred is not changed.
+// cred: an object with "application". Optional: "protocol", "host", "port", "access_token" and
+// "sn", each of which replaces the stored value; "sn" becomes a member of the extra information,
+// whose other members stay. Times, owner and csrf token stay as they are. cred is not changed.
 //
-// Returns true when both records are saved. Returns false when there is no such credential or it has
-// no session, when a member is of another type, or when a save fails. Everything is checked and read
-// before the first save, so a failure leaves the store as it was, except that a failing save of the
-// session leaves the credential changed. A missing session and a failing setter or save log nothing.
+// Returns true when both records are saved. Returns false when there is no such credential or it
+// has no session, when a member is of another type, or when a save fails. Everything is checked and
+// read before the first save, so a failure leaves the store as it was, except that a failing save
+// of the session leaves the credential changed. A missing session and a failing setter or save log
+// nothing.
 ZELOQRM_API bool ZELOQRMClientUpdateServerCredential(Json::Value &cred);
 
 // ------------------------------------------------------------------------------------------------
@@ -109,16 +110,16 @@ ZELOQRM_API bool ZELOQRMClientUpdateServerCredential(Json::Value &cred);
 // first; the first success ends the test.
 //
 // api: the Web API that the server has to serve, such as "ZELO.QRM.RPC"; not empty.
-// out: null or an object; on success "protocol" ("https", "fld" or "http"), "port" and "host" are set
-// in it. On failure it is not touched.
+// out: null or an object; on success "protocol" ("https", "fld" or "http"), "port" and "host" are
+// set in it. On failure it is not touched.
 //
 // Returns true when a server answered. Returns false otherwise, without a log line. Nothing is
 // stored. An unanswered attempt takes up to the platform's connect limit.
 ZELOQRM_API bool ZELOQRMClientTestConnect(const Json::Value &serverConn, const std::string &api,
                                           Json::Value &out);
 
-// Joins a server: finds a connection (as ZELOQRMClientTestConnect does for "ZELO.QRM.RPC"), stores it
-// as the server credential, and sends "join" with the appliance's description.
+// Joins a server: finds a connection (as ZELOQRMClientTestConnect does for "ZELO.QRM.RPC"), stores
+// it as the server credential, and sends "join" with the appliance's description.
 //
 // joinInfo: an object with
 //
@@ -135,12 +136,12 @@ ZELOQRM_API bool ZELOQRMClientTestConnect(const Json::Value &serverConn, const s
 //                                    "runHTTPS" is "yes", else 0
 //
 // Returns 0 when the server accepted the appliance, else -1. A join that failed after a connection
-// was found leaves the credential stored; each further join adds one more. The caller removes it with
-// ZELOQRMClientDeleteServerCredential. A missing member, a fact that cannot be read (other than the
-// host name) and a request that gets no reply log nothing.
+// was found leaves the credential stored; each further join adds one more. The caller removes it
+// with ZELOQRMClientDeleteServerCredential. A missing member, a fact that cannot be read (other
+// than the host name) and a request that gets no reply log nothing.
 //
-// Join stores no session and sets no flag: the caller stores the access token in a session under the
-// credential's id.
+// Join stores no session and sets no flag: the caller stores the access token in a session under
+// the credential's id.
 //
 // Files read: "/etc/zeloinfo.conf" (admin_port, secure_admin_port, runHTTPS),
 // "/etc.defaults/zeloinfo.conf" (upnpmodelname), "/etc.defaults/VERSION". Files written: the

@@ -104,7 +104,7 @@ ZELO_PLATFORM_API long ZELOCredIDGetByApplication(const char *szApplication);
 // Removes the record with this id, durably. One that is not there counts as removed.
 ZELO_PLATFORM_API int ZELOCredRemoveByID(long id);
 
-// --- Sessions -------------------------------------------------------------------------------------
+// --- Sessions -----------------------------------------------------------------------------------
 
 // A new session with no field set and no id. Null when memory is short. The caller owns it and
 // releases it with ZELOCredSessFree.

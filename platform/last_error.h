@@ -14,14 +14,14 @@
 enum YLIBC_ERROR {
     YLIBC_ERR_NONE = 0x0000,
     YLIBC_ERR_OUT_OF_MEMORY = 0x0200,
-    YLIBC_ERR_NOT_FOUND = 0x0300,       // the record, key or file asked for is not there
-    YLIBC_ERR_FILE = 0x0400,            // a file or directory could not be opened, read or written
-    YLIBC_ERR_STORE = 0x0500,           // a database refused an operation
-    YLIBC_ERR_STORE_BUSY = 0x0501,      // another process kept the database locked for too long
-    YLIBC_ERR_STORE_DAMAGED = 0x0502,   // the database file is damaged or of another format
-    YLIBC_ERR_NETWORK = 0x0600,         // no exchange with the server was possible
-    YLIBC_ERR_REPLY = 0x0601,           // the server answered, but not what was asked for
-    YLIBC_ERR_INVALID_ARGUMENT = 0x0D00 // a null or unusable argument
+    YLIBC_ERR_NOT_FOUND = 0x0300,        // the record, key or file asked for is not there
+    YLIBC_ERR_FILE = 0x0400,             // a file or directory could not be opened, read or written
+    YLIBC_ERR_STORE = 0x0500,            // a database refused an operation
+    YLIBC_ERR_STORE_BUSY = 0x0501,       // another process kept the database locked for too long
+    YLIBC_ERR_STORE_DAMAGED = 0x0502,    // the database file is damaged or of another format
+    YLIBC_ERR_NETWORK = 0x0600,          // no exchange with the server was possible
+    YLIBC_ERR_REPLY = 0x0601,            // the server answered, but not what was asked for
+    YLIBC_ERR_INVALID_ARGUMENT = 0x0D00  // a null or unusable argument
 };
 
 extern "C" {

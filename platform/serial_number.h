@@ -23,8 +23,8 @@ ZELO_PLATFORM_API int YLIBGetCustomSerialNumber(char *szSerial, int cbSerial);
 // Reads the serial number in flash into szSerial, a buffer of cbSerial bytes, as zero-terminated
 // text cut to fit.
 //
-// Returns a negative value when it cannot be read (no flash, or nothing stored there); the buffer is
-// then left as it was. Returns 0 or more on success.
+// Returns a negative value when it cannot be read (no flash, or nothing stored there); the buffer
+// is then left as it was. Returns 0 or more on success.
 ZELO_PLATFORM_API int YLIBGetSerialNumber(char *szSerial, int cbSerial);
 }
 

@@ -10,12 +10,12 @@
 // What holds for every operation
 //   - Only http and https are ever spoken, a redirect is never followed, and a token goes only to
 //     the host and port of the record.
-//   - Every exchange ends by itself: connecting is limited, a stalled transfer is ended, and a reply
-//     body has a largest size.
+//   - Every exchange ends by itself: connecting is limited, a stalled transfer is ended, and the
+//     body of a reply has a largest size.
 //   - No operation throws, except that one which returns a std::string may throw std::bad_alloc.
 //   - Connections stay open between requests of one process and are used again. A child process
-//     after fork makes its own. Requests may be used in several threads at once, each request by one
-//     thread at a time.
+//     after fork makes its own. Requests may be used in several threads at once, each request by
+//     one thread at a time.
 //   - A failure sets the last error (last_error.h).
 
 #ifndef ZELO_PLATFORM_WEB_API_REQUEST_H
@@ -65,15 +65,16 @@ class ZELO_PLATFORM_API CredRequest {
     CredRequest(const CredRequest &) = delete;
     CredRequest &operator=(const CredRequest &) = delete;
 
-    // Adds the members of an object to the parameters of the call; a member given again replaces the
-    // earlier one. Returns false when params is no object.
+    // Adds the members of an object to the parameters of the call; a member given again replaces
+    // the earlier one. Returns false when params is no object.
     bool AddPostParam(const Json::Value &params);
 
     // Chooses how the parameters are protected. Returns true when the mode is accepted.
     bool SetEncryptMode(_tag_CRED_REQ_CRYPTO mode);
 
-    // Sends the request and takes the whole reply. blKeepConnection: the connection may stay open for
-    // later requests. timeout_s: a limit for the whole exchange in seconds, 0 for the platform's own.
+    // Sends the request and takes the whole reply. blKeepConnection: the connection may stay open
+    // for later requests. timeout_s: a limit for the whole exchange in seconds, 0 for the
+    // platform's own.
     //
     // Returns true when a reply arrived, whatever its HTTP status and body; false when the request
     // has no URL or no whole reply arrived.

@@ -12,8 +12,8 @@ namespace guard {
 // Logs the exception that is being handled.
 void LogCurrentException(const char *szStem, int line) noexcept;
 
-// Runs the body and returns its result; whatever it throws becomes the failure value and a log line.
-// The unwinding of a cancelled thread passes through, as it has to.
+// Runs the body and returns its result; whatever it throws becomes the failure value and a log
+// line. The unwinding of a cancelled thread passes through, as it has to.
 template <typename Result, typename Body>
 Result Run(const char *szStem, int line, Result failure, Body &&body) {
     try {
@@ -29,7 +29,6 @@ Result Run(const char *szStem, int line, Result failure, Body &&body) {
 }  // namespace guard
 
 // ZELO_GUARD(failure value, [&] { … }): the failure value's type is the result's.
-#define ZELO_GUARD(failure, ...) \
-    ::guard::Run(ZELO_SOURCE_STEM, __LINE__, failure, __VA_ARGS__)
+#define ZELO_GUARD(failure, ...) ::guard::Run(ZELO_SOURCE_STEM, __LINE__, failure, __VA_ARGS__)
 
 #endif

@@ -21,8 +21,8 @@ bool IsTooDeep(const Json::Value &value, int depthLeft) {
     });
 }
 
-// JsonCpp reports "* Line 3, Column 5\n  Missing ':' after object member name\nSee …": one line of it
-// is enough for a person.
+// JsonCpp reports "* Line 3, Column 5\n  Missing ':' after object member name\nSee …": one line of
+// it is enough for a person.
 std::string OneLine(const std::string &strReport) {
     std::string strLine;
     for (char c : strReport) {

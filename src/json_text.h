@@ -1,8 +1,8 @@
 // JSON values as text and back, and reading members of values that nobody has checked yet.
 //
-// JsonCpp throws on a value of the wrong type, on an integer out of range and on deep nesting. These
-// helpers are where that ends: none of them throws but std::bad_alloc, and all of them look at values
-// through const access only, so that reading never inserts a member.
+// JsonCpp throws on a value of the wrong type, on an integer out of range and on deep nesting.
+// These helpers are where that ends: none of them throws but std::bad_alloc, and all of them look
+// at values through const access only, so that reading never inserts a member.
 
 #ifndef ZELO_JSON_TEXT_H
 #define ZELO_JSON_TEXT_H

@@ -1,7 +1,7 @@
 // The system log: one line per failure, written where the failure is noticed.
 //
-// A line is "<source file>:<line> <message>" at level LOG_ERR; file and line come from the place that
-// logs. A line too long for a log daemon goes out cut, with its whole length named.
+// A line is "<source file>:<line> <message>" at level LOG_ERR; file and line come from the place
+// that logs. A line too long for a log daemon goes out cut, with its whole length named.
 
 #ifndef ZELO_LOG_H
 #define ZELO_LOG_H
@@ -38,16 +38,16 @@ struct SourceStem {
 void Write(const char *szStem, int line, const char *szFormat, ...)
     __attribute__((format(printf, 3, 4)));
 
-// Text from outside for a log line: each of the secrets blanked out, also where it stands in JSON
+// Text from outside for a log line: the secret blanked out, also where it stands in JSON
 // notation, and control characters escaped.
 std::string SafeText(const std::string &strText, const std::string &strSecret);
 
 }  // namespace qrm_log
 
-#define ZELO_SOURCE_STEM                                            \
-    ([]() -> const char * {                                         \
-        static constexpr ::qrm_log::SourceStem stem(__FILE__);      \
-        return stem.sz;                                             \
+#define ZELO_SOURCE_STEM                                       \
+    ([]() -> const char * {                                    \
+        static constexpr ::qrm_log::SourceStem stem(__FILE__); \
+        return stem.sz;                                        \
     }())
 
 #define ZELO_LOG(...) ::qrm_log::Write(ZELO_SOURCE_STEM, __LINE__, __VA_ARGS__)

@@ -84,11 +84,17 @@ bool ReadVersion(Json::Value &description) {
     return true;
 }
 
-bool ReadAdminPort(long &port) { return ReadPort("admin_port", port); }
+bool ReadAdminPort(long &port) {
+    return ReadPort("admin_port", port);
+}
 
-bool ReadSecureAdminPort(long &port) { return ReadPort("secure_admin_port", port); }
+bool ReadSecureAdminPort(long &port) {
+    return ReadPort("secure_admin_port", port);
+}
 
-bool IsHttpsServed() { return YLIBCFileCheckKeyValue(kConfig, "runHTTPS", "yes", 0) == 1; }
+bool IsHttpsServed() {
+    return YLIBCFileCheckKeyValue(kConfig, "runHTTPS", "yes", 0) == 1;
+}
 
 bool ReadSerialNumber(std::string &strSerial) {
     FixedText<36> serial;

@@ -1,7 +1,7 @@
 // Client description: the facts about this appliance that it tells its server.
 //
-// Each function reads one fact afresh from the platform and stays silent on failure; the builder that
-// knows what the failure means logs it.
+// Each function reads one fact afresh from the platform and stays silent on failure; the builder
+// that knows what the failure means logs it.
 
 #ifndef ZELO_QRM_CLIENT_DESCRIPTION_H
 #define ZELO_QRM_CLIENT_DESCRIPTION_H

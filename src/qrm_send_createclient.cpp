@@ -56,8 +56,8 @@ bool Answers(ZELO_CRED *pCred, const char *szProtocol, const char *szHost, int p
     if (port <= 0) {
         return false;
     }
-    if (ZELOCredItemSetProtocol(pCred, szProtocol) != 0 || ZELOCredItemSetHost(pCred, szHost) != 0 ||
-        ZELOCredItemSetPort(pCred, port) != 0) {
+    if (ZELOCredItemSetProtocol(pCred, szProtocol) != 0 ||
+        ZELOCredItemSetHost(pCred, szHost) != 0 || ZELOCredItemSetPort(pCred, port) != 0) {
         return false;
     }
     if (ZELO::CredRequestUtil::GetWebAPIPath(pCred, api).empty()) {
@@ -202,8 +202,8 @@ int SendJoin(const Json::Value &joinInfo, ZELO::CredRequest *pRequest) {
         return -1;
     }
     if (!IsAccepted(pRequest->GetResponse())) {
-        const std::string strReply = qrm_log::SafeText(
-            pRequest->GetResponse(), TokenText(Member(joinInfo, "access_token")));
+        const std::string strReply =
+            qrm_log::SafeText(pRequest->GetResponse(), TokenText(Member(joinInfo, "access_token")));
         ZELO_LOG("send create client fail: %s", strReply.c_str());
         return -1;
     }

@@ -154,7 +154,9 @@ void ReadTokens(const ZELO_CRED_SESS *pSess, Json::Value &out) {
     }
 }
 
-bool CanHoldMembers(const Json::Value &out) { return out.isNull() || out.isObject(); }
+bool CanHoldMembers(const Json::Value &out) {
+    return out.isNull() || out.isObject();
+}
 
 bool Get(Json::Value &out) {
     if (!CanHoldMembers(out)) {

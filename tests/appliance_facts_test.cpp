@@ -13,7 +13,9 @@ namespace {
 
 constexpr const char *kFile = "/tmp/settings.conf";
 
-void Write(const char *szPath, const std::string &strText) { std::ofstream(szPath) << strText; }
+void Write(const char *szPath, const std::string &strText) {
+    std::ofstream(szPath) << strText;
+}
 
 TEST(KeyValueFile, ReadsEveryFormOfALine) {
     Write(kFile,
@@ -35,10 +37,18 @@ TEST(KeyValueFile, ReadsEveryFormOfALine) {
         int result;
         const char *szValue;
     } rows[] = {
-        {"plain", 9, "value one"}, {"quoted", 9, "value two"}, {"spaced", 5, "three"},
-        {"escaped", 9, "a \"b\" \\ c"}, {"empty", 0, ""},       {"emptyquoted", 0, ""},
-        {"open", 12, "never closed"},   {"equals", 3, "a=b"},   {"last", 12, "no line feed"},
-        {"absent", 0, ""},              {"blank", 0, ""},       {"#blank", 0, ""},
+        {"plain", 9, "value one"},
+        {"quoted", 9, "value two"},
+        {"spaced", 5, "three"},
+        {"escaped", 9, "a \"b\" \\ c"},
+        {"empty", 0, ""},
+        {"emptyquoted", 0, ""},
+        {"open", 12, "never closed"},
+        {"equals", 3, "a=b"},
+        {"last", 12, "no line feed"},
+        {"absent", 0, ""},
+        {"blank", 0, ""},
+        {"#blank", 0, ""},
         {"plai", 0, ""},
     };
     for (const auto &row : rows) {
@@ -46,8 +56,8 @@ TEST(KeyValueFile, ReadsEveryFormOfALine) {
         EXPECT_EQ(YLIBCFileGetKeyValue(kFile, row.szKey, sz, sizeof(sz), 0), row.result)
             << row.szKey;
         EXPECT_STREQ(sz, row.szValue);
-        EXPECT_EQ(YLIBCFileCheckKeyValue(kFile, row.szKey, row.szValue, 0), row.result > 0 ||
-                  std::string(row.szKey).find("empty") == 0);
+        EXPECT_EQ(YLIBCFileCheckKeyValue(kFile, row.szKey, row.szValue, 0),
+                  row.result > 0 || std::string(row.szKey).find("empty") == 0);
     }
 }
 

@@ -18,7 +18,9 @@ namespace {
 
 namespace fs = std::filesystem;
 
-void RemoveStore() { fs::remove_all(stored::kFolder); }
+void RemoveStore() {
+    fs::remove_all(stored::kFolder);
+}
 
 // Runs the body in a child process; true when it returned true.
 bool InChild(const std::function<bool()> &body) {
@@ -173,7 +175,8 @@ TEST(CredentialStore, ProcessesWriteAtOnceAndLoseNothing) {
 TEST(CredentialStore, FollowsTheFileThatStandsAtItsPlace) {
     RemoveStore();
     stored::AddCredential("ZELO.QRM", "old");
-    fs::copy_file(stored::kDatabase, "/usr/zelo/etc/backup.db", fs::copy_options::overwrite_existing);
+    fs::copy_file(stored::kDatabase, "/usr/zelo/etc/backup.db",
+                  fs::copy_options::overwrite_existing);
     stored::Clear();
     EXPECT_EQ(stored::Describe(), "");
     fs::rename("/usr/zelo/etc/backup.db", stored::kDatabase);

@@ -21,7 +21,9 @@ constexpr const char *kDefaults = "/etc.defaults/zeloinfo.conf";
 constexpr const char *kVersion = "/etc.defaults/VERSION";
 constexpr const char *kToken = "se/cr\"et-0123456789";
 
-void Write(const char *szPath, const std::string &strText) { std::ofstream(szPath) << strText; }
+void Write(const char *szPath, const std::string &strText) {
+    std::ofstream(szPath) << strText;
+}
 
 void WriteFacts() {
     Write(kConfig, "admin_port=\"5000\"\nsecure_admin_port=\"5001\"\nrunHTTPS=\"yes\"\n");
@@ -76,8 +78,7 @@ class Join : public testing::Test {
         return info;
     }
     static std::string Stored(const char *szProtocol = "https") {
-        const int port =
-            szProtocol[4] == 's' ? s_pServer->HttpsPort() : s_pServer->HttpPort();
+        const int port = szProtocol[4] == 's' ? s_pServer->HttpsPort() : s_pServer->HttpPort();
         return std::string(szProtocol) + "://localhost:" + std::to_string(port) + " ?";
     }
     static std::string Messages(const seam::Outcome &outcome) {
@@ -137,9 +138,8 @@ TEST_F(Join, TheFirstAnsweringConnectionWins) {
         }
         Json::Value out;
         out["own"] = 1;
-        const seam::Outcome outcome = seam::Observe([&] {
-            EXPECT_EQ(ZELOQRMClientTestConnect(list, kApi, out), !row.strWinner.empty());
-        });
+        const seam::Outcome outcome = seam::Observe(
+            [&] { EXPECT_EQ(ZELOQRMClientTestConnect(list, kApi, out), !row.strWinner.empty()); });
         EXPECT_TRUE(outcome.logs.empty());
         EXPECT_EQ(outcome.recordsLeft, 0);
         EXPECT_EQ(out.size(), row.strWinner.empty() ? 1U : 4U);
@@ -162,9 +162,8 @@ TEST_F(Join, TheFirstAnsweringConnectionWins) {
     EXPECT_FALSE(ZELOQRMClientTestConnect(list, "ZELO.Unknown", out));
     EXPECT_TRUE(out.isNull());
     // Any result of a setter but 0 ends the attempt; two of them end both.
-    seam::Observe({"ZELOCredItemSetHost", 1, true, 1}, [&] {
-        EXPECT_TRUE(ZELOQRMClientTestConnect(list, kApi, out));
-    });
+    seam::Observe({"ZELOCredItemSetHost", 1, true, 1},
+                  [&] { EXPECT_TRUE(ZELOQRMClientTestConnect(list, kApi, out)); });
     EXPECT_EQ(out["protocol"], "http");
 }
 
@@ -172,13 +171,15 @@ TEST_F(Join, ConnectionTestSurvivesEveryFailingCall) {
     const std::string strHttps = std::to_string(s_pServer->HttpsPort());
     const torture::Expected fallback{"http", "", ""};
     const torture::Expected none{"false", "", ""};
-    torture::Run({"test connection", kFile, stored::Clear,
+    torture::Run({"test connection",
+                  kFile,
+                  stored::Clear,
                   [&] {
                       Json::Value list(Json::arrayValue);
                       list.append(Candidate(s_pServer->HttpPort(), s_pServer->HttpsPort()));
                       Json::Value out;
                       return ZELOQRMClientTestConnect(list, kApi, out) ? out["protocol"].asString()
-                                                                      : "false";
+                                                                       : "false";
                   },
                   [] { return stored::Describe(); },
                   "ZELOCredAlloc IsPort IsPort ZELOCredItemSetProtocol ZELOCredItemSetHost "
@@ -197,13 +198,15 @@ TEST_F(Join, SurvivesEveryFailingCall) {
     Json::Value list(Json::arrayValue);
     list.append(Candidate(0, s_pServer->HttpsPort()));
     json_text::ToString(list, strList);
-    const torture::Expected noConnection{
-        "-1", "Cannot find available Connection[" + strList + ']', ""};
+    const torture::Expected noConnection{"-1", "Cannot find available Connection[" + strList + ']',
+                                         ""};
     const torture::Expected notSaved{"-1", "Cannot save server credential", ""};
     const torture::Expected silent{"-1", "", Stored()};
     const torture::Expected joined{"0", "", Stored()};
     torture::Run(
-        {"join", kFile, stored::Clear,
+        {"join",
+         kFile,
+         stored::Clear,
          [] {
              Json::Value info = JoinInfo();
              info["server_http_port"] = 0;
@@ -234,12 +237,18 @@ TEST_F(Join, SurvivesEveryFailingCall) {
           {"YLIBCFileGetKeyValue", silent},
           {"YLIBCFileGetKeyValue#4", joined},  // the small fix number
           {"YLIBCFileCheckKeyValue", joined},
-          {"AddPostParam", {"-1", "send create client fail: {\"error\":{\"code\":101},"
-                                  "\"success\":false}", Stored()}},
+          {"AddPostParam",
+           {"-1",
+            "send create client fail: {\"error\":{\"code\":101},"
+            "\"success\":false}",
+            Stored()}},
           {"SetEncryptMode", joined},
           {"Process", silent},
-          {"GetResponse", {"-1", "send create client fail: {\"data\":{\"id\":1},"
-                                 "\"success\":true}", Stored()}}}});
+          {"GetResponse",
+           {"-1",
+            "send create client fail: {\"data\":{\"id\":1},"
+            "\"success\":true}",
+            Stored()}}}});
 }
 
 TEST_F(Join, DescribesTheApplianceOverOneConnection) {
@@ -270,7 +279,7 @@ TEST_F(Join, DescribesTheApplianceOverOneConnection) {
 TEST_F(Join, FactsFollowTheirRules) {
     const struct {
         const char *szFact;
-        const char *szVersion;   // "" keeps the usual one
+        const char *szVersion;  // "" keeps the usual one
         const char *szConfig;
         const char *szJoinInfo;  // members added to the caller's
         const char *szExpected;  // members of the description; "" when join fails

@@ -36,7 +36,9 @@ bool Enter(const char *szName) {
     return t_pObservation->fault.strOperation == szName && t_pObservation->fault.nth == nth;
 }
 
-bool IsForced() { return t_pObservation->fault.blForceResult; }
+bool IsForced() {
+    return t_pObservation->fault.blForceResult;
+}
 
 template <typename Result>
 Result Force(Result result) {
@@ -70,7 +72,9 @@ void WriteLog(int level, const char *szFormat, va_list args) {
 
 }  // namespace
 
-Outcome Observe(const std::function<void()> &body) { return Observe(Fault(), body); }
+Outcome Observe(const std::function<void()> &body) {
+    return Observe(Fault(), body);
+}
 
 Outcome Observe(const Fault &fault, const std::function<void()> &body) {
     Observation observation;
@@ -83,17 +87,17 @@ Outcome Observe(const Fault &fault, const std::function<void()> &body) {
 
 }  // namespace seam
 
-#define SEAM(symbol, name, Result, parameters, arguments, failure, gained)     \
-    Result Real_##name parameters asm("__real_" symbol);                       \
-    Result Wrap_##name parameters asm("__wrap_" symbol);                       \
-    Result Wrap_##name parameters {                                            \
-        const bool blHit = seam::Enter(#name);                                 \
-        if (blHit && !seam::IsForced()) {                                      \
-            return failure;                                                    \
-        }                                                                      \
-        Result result = Real_##name arguments;                                 \
-        seam::AddRecords(gained);                                              \
-        return blHit ? seam::Force<Result>(result) : result;                   \
+#define SEAM(symbol, name, Result, parameters, arguments, failure, gained) \
+    Result Real_##name parameters asm("__real_" symbol);                   \
+    Result Wrap_##name parameters asm("__wrap_" symbol);                   \
+    Result Wrap_##name parameters {                                        \
+        const bool blHit = seam::Enter(#name);                             \
+        if (blHit && !seam::IsForced()) {                                  \
+            return failure;                                                \
+        }                                                                  \
+        Result result = Real_##name arguments;                             \
+        seam::AddRecords(gained);                                          \
+        return blHit ? seam::Force<Result>(result) : result;               \
     }
 
 #define SEAM_RELEASE(symbol, name, parameters, arguments, lost) \

@@ -20,14 +20,14 @@ struct LogLine {
 struct Outcome {
     std::vector<std::string> calls;  // names of all calls but releases and log lines
     std::vector<LogLine> logs;
-    int recordsLeft = 0;             // records allocated and not released
+    int recordsLeft = 0;  // records allocated and not released
 };
 
 struct Fault {
     std::string strOperation;
-    int nth = 1;                // which call of the operation, counted from 1
-    bool blForceResult = false; // false: the call is not made and gives its failure value
-    long result = 0;            // true: the call is made, and this takes the place of its result
+    int nth = 1;                 // which call of the operation, counted from 1
+    bool blForceResult = false;  // false: the call is not made and gives its failure value
+    long result = 0;             // true: the call is made, and this takes the place of its result
 };
 
 // Runs the body on this thread and reports what the library did.

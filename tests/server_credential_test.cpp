@@ -19,11 +19,17 @@ Json::Value Parse(const std::string &strText) {
     return value;
 }
 
-std::string Text(const Json::Value &value) { return json_text::ToLogText(value); }
+std::string Text(const Json::Value &value) {
+    return json_text::ToLogText(value);
+}
 
-std::string Bool(bool bl) { return bl ? "true" : "false"; }
+std::string Bool(bool bl) {
+    return bl ? "true" : "false";
+}
 
-std::string State() { return stored::Describe(); }
+std::string State() {
+    return stored::Describe();
+}
 
 void AddServer(const char *szExtraInfo) {
     stored::Clear();
@@ -31,37 +37,41 @@ void AddServer(const char *szExtraInfo) {
 }
 
 // A fault that the function does not treat as one.
-torture::Expected Like(const torture::Expected &expected) { return expected; }
+torture::Expected Like(const torture::Expected &expected) {
+    return expected;
+}
 
 TEST(ServerCredential, CreateSurvivesEveryFailingCall) {
     const torture::Expected done{"true", "", "https://qrm:443 null token=t csrf=?"};
     const torture::Expected nothing{"false", "Save Cred Item fail", ""};
     const torture::Expected half{"false", "Save CredSess Item fail", "https://qrm:443 null"};
-    torture::Run(
-        {"create", kFile, stored::Clear,
-         [] { return Bool(ZELOQRMClientCreateServerCredential(Parse(kCred))); }, State,
-         "ZELOCredAlloc time ZELOCredItemSetCreateTime ZELOCredItemSetModifyTime "
-               "ZELOCredItemSetOwner ZELOCredItemSetPort ZELOCredItemSetHost "
-               "ZELOCredItemSetProtocol ZELOCredItemSetApplication ZELOCredItemSetExtraInfo "
-               "ZELOCredSave ZELOCredItemGetID ZELOCredSessAlloc ZELOCredSessItemSetID "
-               "ZELOCredSessItemSetAccessToken ZELOCredSessSave",
-         done,
-         {{"time", Like(done)},
-          {"ZELOCredAlloc", nothing},
-          {"ZELOCredItemSetCreateTime", nothing},
-          {"ZELOCredItemSetModifyTime", nothing},
-          {"ZELOCredItemSetOwner", nothing},
-          {"ZELOCredItemSetPort", nothing},
-          {"ZELOCredItemSetHost", nothing},
-          {"ZELOCredItemSetProtocol", nothing},
-          {"ZELOCredItemSetApplication", nothing},
-          {"ZELOCredItemSetExtraInfo", nothing},
-          {"ZELOCredSave", nothing},
-          {"ZELOCredItemGetID", {"false", "Get CredId fail", "https://qrm:443 null"}},
-          {"ZELOCredSessAlloc", half},
-          {"ZELOCredSessItemSetID", half},
-          {"ZELOCredSessItemSetAccessToken", half},
-          {"ZELOCredSessSave", half}}});
+    torture::Run({"create",
+                  kFile,
+                  stored::Clear,
+                  [] { return Bool(ZELOQRMClientCreateServerCredential(Parse(kCred))); },
+                  State,
+                  "ZELOCredAlloc time ZELOCredItemSetCreateTime ZELOCredItemSetModifyTime "
+                  "ZELOCredItemSetOwner ZELOCredItemSetPort ZELOCredItemSetHost "
+                  "ZELOCredItemSetProtocol ZELOCredItemSetApplication ZELOCredItemSetExtraInfo "
+                  "ZELOCredSave ZELOCredItemGetID ZELOCredSessAlloc ZELOCredSessItemSetID "
+                  "ZELOCredSessItemSetAccessToken ZELOCredSessSave",
+                  done,
+                  {{"time", Like(done)},
+                   {"ZELOCredAlloc", nothing},
+                   {"ZELOCredItemSetCreateTime", nothing},
+                   {"ZELOCredItemSetModifyTime", nothing},
+                   {"ZELOCredItemSetOwner", nothing},
+                   {"ZELOCredItemSetPort", nothing},
+                   {"ZELOCredItemSetHost", nothing},
+                   {"ZELOCredItemSetProtocol", nothing},
+                   {"ZELOCredItemSetApplication", nothing},
+                   {"ZELOCredItemSetExtraInfo", nothing},
+                   {"ZELOCredSave", nothing},
+                   {"ZELOCredItemGetID", {"false", "Get CredId fail", "https://qrm:443 null"}},
+                   {"ZELOCredSessAlloc", half},
+                   {"ZELOCredSessItemSetID", half},
+                   {"ZELOCredSessItemSetAccessToken", half},
+                   {"ZELOCredSessSave", half}}});
 }
 
 TEST(ServerCredential, DeleteSurvivesEveryFailingCall) {
@@ -72,13 +82,15 @@ TEST(ServerCredential, DeleteSurvivesEveryFailingCall) {
     const std::string strCenter = "https://center:443 ?";
     const std::string strTokens = " token=t csrf=c";
     const torture::Expected gone{"true", "", " | "};
-    torture::Run({"delete", kFile,
+    torture::Run({"delete",
+                  kFile,
                   [] {
                       AddServer(nullptr);
                       stored::AddSession(stored::AddCredential("ZELO.NotificationCenter", "center"),
                                          "t", "c");
                   },
-                  [] { return Bool(ZELOQRMClientDeleteServerCredential()); }, bothStates,
+                  [] { return Bool(ZELOQRMClientDeleteServerCredential()); },
+                  bothStates,
                   "ZELOCredIDGetByApplication ZELOCredSessRemoveByID ZELOCredRemoveByID "
                   "ZELOCredIDGetByApplication ZELOCredSessRemoveByID ZELOCredRemoveByID",
                   gone,
@@ -100,7 +112,9 @@ TEST(ServerCredential, GetSurvivesEveryFailingCall) {
         return torture::Expected{"true " + strOut, "", strKept};
     };
     torture::Run(
-        {"get", kFile, [] { AddServer(R"({"sn":[7]})"); },
+        {"get",
+         kFile,
+         [] { AddServer(R"({"sn":[7]})"); },
          [] {
              Json::Value out = Parse(R"({"own":1})");
              const bool bl = ZELOQRMClientGetServerCredential(out);
@@ -112,8 +126,7 @@ TEST(ServerCredential, GetSurvivesEveryFailingCall) {
          expect(R"({"host":"qrm","own":1,"port":443,"protocol":"https","sn":[7]})"),
          {{"ZELOCredListGet", {"false {\"own\":1}", "cannot find qrm server info", strKept}},
           {"ZELOCredItemGetHost", expect(R"({"own":1,"port":443,"protocol":"https","sn":[7]})")},
-          {"ZELOCredItemGetPort",
-           expect(R"({"host":"qrm","own":1,"protocol":"https","sn":[7]})")},
+          {"ZELOCredItemGetPort", expect(R"({"host":"qrm","own":1,"protocol":"https","sn":[7]})")},
           {"ZELOCredItemGetProtocol", expect(R"({"host":"qrm","own":1,"port":443,"sn":[7]})")},
           {"ZELOCredItemGetExtraInfo",
            expect(R"({"host":"qrm","own":1,"port":443,"protocol":"https"})")}}});
@@ -127,12 +140,14 @@ TEST(ServerCredential, GetWithTokenSurvivesEveryFailingCall) {
     const auto expect = [&](const std::string &strOut) {
         return torture::Expected{"true {" + strOut, "", strKept};
     };
-    const std::string strTokens = R"("access_token":"t","application":"ZELO.QRM","csrf_token":"c",)";
+    const std::string strTokens =
+        R"("access_token":"t","application":"ZELO.QRM","csrf_token":"c",)";
     const std::string strNoSession =
         "cannot find qrm server session[" +
         std::to_string((AddServer(nullptr), ZELOCredIDGetByApplication("ZELO.QRM"))) + ']';
     torture::Run(
-        {"get with token", kFile,
+        {"get with token",
+         kFile,
          [] {
              // The session and the extra information change, the id stays for the message.
              ZELO_CRED *pList = nullptr;
@@ -153,8 +168,7 @@ TEST(ServerCredential, GetWithTokenSurvivesEveryFailingCall) {
          expect(strTokens + strServer),
          {{"ZELOCredListGet", {"false null", "cannot find qrm server info", strKept}},
           {"ZELOCredItemGetHost", expect(strTokens + R"("port":443,"protocol":"https","sn":7})")},
-          {"ZELOCredItemGetPort",
-           expect(strTokens + R"("host":"qrm","protocol":"https","sn":7})")},
+          {"ZELOCredItemGetPort", expect(strTokens + R"("host":"qrm","protocol":"https","sn":7})")},
           {"ZELOCredItemGetProtocol", expect(strTokens + R"("host":"qrm","port":443,"sn":7})")},
           {"ZELOCredItemGetExtraInfo",
            expect(strTokens + R"("host":"qrm","port":443,"protocol":"https"})")},
@@ -172,7 +186,9 @@ TEST(ServerCredential, UpdateSurvivesEveryFailingCall) {
     const std::string strOld = R"(https://qrm:443 {"a":1} token=t csrf=c)";
     const torture::Expected silent{"false", "", strOld};
     torture::Run(
-        {"update", kFile, [] { AddServer(R"({"a":1})"); },
+        {"update",
+         kFile,
+         [] { AddServer(R"({"a":1})"); },
          [] {
              Json::Value cred = Parse(
                  R"({"application":"ZELO.QRM","protocol":"http","host":"new","port":80,)"

@@ -43,7 +43,7 @@ inline long AddCredential(const char *szApplication, const char *szHost,
 
 inline void AddSession(long id, const char *szToken, const char *szCsrf = nullptr) {
     const std::unique_ptr<ZELO_CRED_SESS, void (*)(ZELO_CRED_SESS *)> pSess(ZELOCredSessAlloc(),
-                                                                          ZELOCredSessFree);
+                                                                            ZELOCredSessFree);
     ZELOCredSessItemSetID(pSess.get(), id);
     ZELOCredSessItemSetAccessToken(pSess.get(), szToken);
     if (szCsrf != nullptr) {
@@ -52,8 +52,8 @@ inline void AddSession(long id, const char *szToken, const char *szCsrf = nullpt
     ZELOCredSessSave(pSess.get());
 }
 
-// "" without a credential, else such as "https://host:443 {} token=t csrf=c"; "?" stands for a field
-// that is not set.
+// "" without a credential, else such as "https://host:443 {} token=t csrf=c"; "?" stands for a
+// field that is not set.
 inline std::string Describe(const char *szApplication = "ZELO.QRM") {
     const std::unique_ptr<ZELO_CRED, void (*)(ZELO_CRED *)> pCred(ZELOCredAlloc(), ZELOCredFree);
     const long id = ZELOCredIDGetByApplication(szApplication);
@@ -68,7 +68,7 @@ inline std::string Describe(const char *szApplication = "ZELO.QRM") {
     strAll += text(ZELOCredItemGetHost(sz, sizeof(sz), pCred.get())) + ':' + std::to_string(port);
     strAll += ' ' + text(ZELOCredItemGetExtraInfo(sz, sizeof(sz), pCred.get()));
     const std::unique_ptr<ZELO_CRED_SESS, void (*)(ZELO_CRED_SESS *)> pSess(ZELOCredSessAlloc(),
-                                                                          ZELOCredSessFree);
+                                                                            ZELOCredSessFree);
     if (ZELOCredSessLoad(id, pSess.get()) < 0) {
         return strAll;
     }

@@ -23,11 +23,11 @@ struct Expected {
 
 struct Case {
     std::string strName;
-    std::string strFile;                     // the source file that logs
+    std::string strFile;  // the source file that logs
     std::function<void()> setUp;
-    std::function<std::string()> run;        // calls the function, returns its result as text
+    std::function<std::string()> run;  // calls the function, returns its result as text
     std::function<std::string()> state;
-    std::string strCalls;                    // all calls in order, separated by blanks
+    std::string strCalls;  // all calls in order, separated by blanks
     Expected unfaulted;
     // By "Operation" (any call of it) or "Operation#2" (the second call).
     std::map<std::string, Expected> faults;

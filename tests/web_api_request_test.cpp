@@ -97,12 +97,12 @@ TEST_F(Request, OnlyKnownProtocolsAndPlainHostsAreUsed) {
         const char *szHost;
         bool blAnswers;
     } rows[] = {
-        {"http", "localhost", true},        {"ftp", "localhost", false},
-        {"file", "localhost", false},       {"HTTP", "localhost", false},
-        {"", "localhost", false},           {"http", "", false},
-        {"http", "user@localhost", false},  {"http", "localhost/qrm", false},
-        {"http", "localhost?x", false},     {"http", "localhost\r\nX: y", false},
-        {"http", "localhost:80", false},    {"fld", "localhost", false},
+        {"http", "localhost", true},       {"ftp", "localhost", false},
+        {"file", "localhost", false},      {"HTTP", "localhost", false},
+        {"", "localhost", false},          {"http", "", false},
+        {"http", "user@localhost", false}, {"http", "localhost/qrm", false},
+        {"http", "localhost?x", false},    {"http", "localhost\r\nX: y", false},
+        {"http", "localhost:80", false},   {"fld", "localhost", false},
     };
     for (const auto &row : rows) {
         EXPECT_EQ(!PathOf(row.szProtocol, m_pServer->HttpPort(), row.szHost).empty(), row.blAnswers)

@@ -10,9 +10,9 @@
 
 namespace host {
 
-// Adds the folder's certificates to the store. A folder that is not there holds none. Returns false,
-// with a log line that names the file, when a file cannot be read as certificates: trusting less than
-// the operator meant is an error too.
+// Adds the folder's certificates to the store. A folder that is not there holds none. Returns
+// false, with a log line that names the file, when a file cannot be read as certificates: trusting
+// less than the operator meant is an error too.
 bool AddApplianceCa(X509_STORE *pStore);
 
 // Tells one state of the folder from another; it changes when a file comes, goes or is replaced.

@@ -102,9 +102,9 @@ struct Connection {
     std::array<StatementHandle, kStatementCount> statements;
 };
 
-// One connection per process, kept until another file takes its place or the process forks: SQLite's
-// connections do not survive a fork. Never destroyed, so that it serves until the very end of a
-// process.
+// One connection per process, kept until another file takes its place or the process forks:
+// SQLite's connections do not survive a fork. Never destroyed, so that it serves until the very end
+// of a process.
 struct Shared {
     std::mutex mutex;
     std::unique_ptr<Connection> pConnection;
@@ -120,7 +120,9 @@ void CloseBeforeFork() {
     TheShared().pConnection.reset();
 }
 
-void UnlockAfterFork() { TheShared().mutex.unlock(); }
+void UnlockAfterFork() {
+    TheShared().mutex.unlock();
+}
 
 const int g_forkHandlers = pthread_atfork(CloseBeforeFork, UnlockAfterFork, UnlockAfterFork);
 
@@ -148,7 +150,9 @@ Result Fail(int sqliteError, const char *szWhat, int line) {
     return Result::kFailed;
 }
 
-Result FailErrno(int line) { return Fail(SQLITE_CANTOPEN, std::strerror(errno), line); }
+Result FailErrno(int line) {
+    return Fail(SQLITE_CANTOPEN, std::strerror(errno), line);
+}
 
 Result Absent(int line) {
     YLIBCErrSetEx(YLIBC_ERR_NOT_FOUND, kFile, line);
@@ -225,8 +229,8 @@ Result Open(const struct stat &status, std::unique_ptr<Connection> &pResult) {
     return result;
 }
 
-// Makes shared.pConnection a connection to the file that stands at the path now. The caller holds the
-// mutex.
+// Makes shared.pConnection a connection to the file that stands at the path now. The caller holds
+// the mutex.
 Result Connect(Shared &shared, bool blWrite) {
     struct stat status = {};
     if (stat(kPath, &status) != 0) {
@@ -467,7 +471,9 @@ Result WriteCredential(ZELO_CRED &cred) {
     return Result::kDone;
 }
 
-Result RemoveCredential(long id) { return RemoveById(kRemoveCredential, id); }
+Result RemoveCredential(long id) {
+    return RemoveById(kRemoveCredential, id);
+}
 
 Result ReadSession(long id, ZELO_CRED_SESS &sess) {
     Run run(kReadSession, false);
@@ -489,6 +495,8 @@ Result WriteSession(const ZELO_CRED_SESS &sess) {
     return run.Execute();
 }
 
-Result RemoveSession(long id) { return RemoveById(kRemoveSession, id); }
+Result RemoveSession(long id) {
+    return RemoveById(kRemoveSession, id);
+}
 
 }  // namespace host::credential_database

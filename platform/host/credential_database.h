@@ -1,9 +1,9 @@
 // The credential store's database: one SQLite file, "/usr/zelo/etc/credentials/credentials.db".
 //
-// Every operation is one statement and thereby one transaction, durable when it returns. The process
-// keeps one connection, which its threads take in turn. Reading never creates or changes the file: a
-// store that does not exist yet has no records. A file that is damaged or of another format is left
-// as it is; each operation on it fails with a log line.
+// Every operation is one statement and thereby one transaction, durable when it returns. The
+// process keeps one connection, which its threads take in turn. Reading never creates or changes
+// the file: a store that does not exist yet has no records. A file that is damaged or of another
+// format is left as it is; each operation on it fails with a log line.
 
 #ifndef ZELO_HOST_CREDENTIAL_DATABASE_H
 #define ZELO_HOST_CREDENTIAL_DATABASE_H

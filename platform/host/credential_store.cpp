@@ -29,7 +29,9 @@ int NoThrow(Body &&body) {
     }
 }
 
-int ToInt(Result result) { return result == Result::kDone ? 0 : -1; }
+int ToInt(Result result) {
+    return result == Result::kDone ? 0 : -1;
+}
 
 template <typename Record>
 int SetText(Record *pRecord, std::optional<std::string> Record::*pField, const char *szText) {
@@ -89,7 +91,9 @@ ZELO_CRED *ZELOCredAlloc() {
     return pCred;
 }
 
-void ZELOCredFree(ZELO_CRED *pCred) { delete pCred; }
+void ZELOCredFree(ZELO_CRED *pCred) {
+    delete pCred;
+}
 
 int ZELOCredItemSetCreateTime(ZELO_CRED *pCred, long time_s) {
     return SetNumber(pCred, &ZELO_CRED::createTime_s, time_s);
@@ -216,7 +220,9 @@ long ZELOCredIDGetByApplication(const char *szApplication) {
     return id;
 }
 
-int ZELOCredRemoveByID(long id) { return ToInt(database::RemoveCredential(id)); }
+int ZELOCredRemoveByID(long id) {
+    return ToInt(database::RemoveCredential(id));
+}
 
 ZELO_CRED_SESS *ZELOCredSessAlloc() {
     auto *const pSess = new (std::nothrow) ZELO_CRED_SESS;
@@ -226,7 +232,9 @@ ZELO_CRED_SESS *ZELOCredSessAlloc() {
     return pSess;
 }
 
-void ZELOCredSessFree(ZELO_CRED_SESS *pSess) { delete pSess; }
+void ZELOCredSessFree(ZELO_CRED_SESS *pSess) {
+    delete pSess;
+}
 
 int ZELOCredSessItemSetID(ZELO_CRED_SESS *pSess, long id) {
     if (pSess == nullptr || id < 0) {
@@ -270,4 +278,6 @@ int ZELOCredSessLoad(long id, ZELO_CRED_SESS *pSess) {
     return NoThrow([&] { return ToInt(database::ReadSession(id, *pSess)); });
 }
 
-int ZELOCredSessRemoveByID(long id) { return ToInt(database::RemoveSession(id)); }
+int ZELOCredSessRemoveByID(long id) {
+    return ToInt(database::RemoveSession(id));
+}

@@ -69,9 +69,13 @@ Pool &ThePool() {
     return *pPool;
 }
 
-void LockBeforeFork() { ThePool().mutex.lock(); }
+void LockBeforeFork() {
+    ThePool().mutex.lock();
+}
 
-void UnlockInParent() { ThePool().mutex.unlock(); }
+void UnlockInParent() {
+    ThePool().mutex.unlock();
+}
 
 // The child closes its copies of the sockets and forgets the handles without cleaning them up: an
 // orderly end of a TLS connection would end the parent's.
@@ -94,11 +98,10 @@ void AbandonInChild() {
 
 const int g_forkHandlers = pthread_atfork(LockBeforeFork, UnlockInParent, AbandonInChild);
 
-// --- Callbacks: they run inside libcurl, so nothing may be thrown out of them ----------------------
+// --- Callbacks: they run inside libcurl, so nothing may be thrown out of them -------------------
 
 curl_socket_t OpenSocket(void *pContext, curlsocktype /*purpose*/, curl_sockaddr *pAddress) {
-    const int fd =
-        socket(pAddress->family, pAddress->socktype | SOCK_CLOEXEC, pAddress->protocol);
+    const int fd = socket(pAddress->family, pAddress->socktype | SOCK_CLOEXEC, pAddress->protocol);
     if (fd < 0) {
         return CURL_SOCKET_BAD;
     }
@@ -277,9 +280,9 @@ bool BuildHeaders(const HttpRequest &request, std::unique_ptr<curl_slist, FreeLi
 void SetRequest(CURL *pEasy, const HttpRequest &request, const curl_slist *pHeaders) {
     curl_easy_setopt(pEasy, CURLOPT_URL, request.strUrl.c_str());
     curl_easy_setopt(pEasy, CURLOPT_HTTPHEADER, pHeaders);
-    curl_easy_setopt(pEasy, CURLOPT_TIMEOUT,
-                     request.timeout_s > 0 ? static_cast<long>(request.timeout_s)
-                                           : kWholeTimeout_s);
+    curl_easy_setopt(
+        pEasy, CURLOPT_TIMEOUT,
+        request.timeout_s > 0 ? static_cast<long>(request.timeout_s) : kWholeTimeout_s);
     curl_easy_setopt(pEasy, CURLOPT_FORBID_REUSE, request.blKeepConnection ? 0L : 1L);
     if (request.blPost) {
         curl_easy_setopt(pEasy, CURLOPT_POSTFIELDS, request.strBody.c_str());

@@ -1,8 +1,9 @@
 // One HTTP exchange over the connections that this process keeps open.
 //
 // What the transport promises: certificate and host name are verified against the system's and the
-// appliance's own authorities; only http and https; no redirect; connecting, stalling and the body's
-// size are bounded; connections and TLS sessions are used again, but never by a child process.
+// appliance's own authorities; only http and https; no redirect; connecting, stalling and the
+// body's size are bounded; connections and TLS sessions are used again, but never by a child
+// process.
 
 #ifndef ZELO_HOST_HTTP_EXCHANGE_H
 #define ZELO_HOST_HTTP_EXCHANGE_H
@@ -14,10 +15,10 @@ namespace host {
 
 struct HttpRequest {
     std::string strUrl;
-    bool blRelay = false;              // through the relay of the platform's configuration
-    bool blPost = false;               // POST strBody as JSON; otherwise GET
-    bool blKeepConnection = true;      // false: close the connection afterwards
-    int timeout_s = 0;                 // for the whole exchange; 0: the transport's own
+    bool blRelay = false;          // through the relay of the platform's configuration
+    bool blPost = false;           // POST strBody as JSON; otherwise GET
+    bool blKeepConnection = true;  // false: close the connection afterwards
+    int timeout_s = 0;             // for the whole exchange; 0: the transport's own
     std::string strBody;
     std::vector<std::string> headers;  // "Name: value"
 };
@@ -27,13 +28,13 @@ struct HttpReply {
     std::string strBody;
 };
 
-// Performs the exchange. Returns true when a whole reply arrived, whatever its status. Otherwise sets
-// the last error, writes one log line with the URL and the reason, and leaves reply as it was.
+// Performs the exchange. Returns true when a whole reply arrived, whatever its status. Otherwise
+// sets the last error, writes one log line with the URL and the reason, and leaves reply as it was.
 bool Perform(const HttpRequest &request, HttpReply &reply);
 
-// Builds an URL; the host may be a name, an IPv4 or an IPv6 address, the query empty or "name=value"
-// with a value that is encoded here. Empty when a part does not fit
-// into an URL: a host that holds more than a host, a port out of range.
+// Builds an URL; the host may be a name, an IPv4 or an IPv6 address, the query empty or
+// "name=value" with a value that is encoded here. Empty when a part does not fit into an URL: a
+// host that holds more than a host, a port out of range.
 std::string BuildUrl(const std::string &strScheme, const std::string &strHost, long port,
                      const std::string &strPath, const std::string &strQuery);
 

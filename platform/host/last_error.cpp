@@ -12,11 +12,17 @@ thread_local LastError t_lastError;
 
 }  // namespace
 
-unsigned int YLIBCErrGet() { return t_lastError.code; }
+unsigned int YLIBCErrGet() {
+    return t_lastError.code;
+}
 
-const char *YLIBCErrorGetFile() { return t_lastError.szFile; }
+const char *YLIBCErrorGetFile() {
+    return t_lastError.szFile;
+}
 
-int YLIBCErrorGetLine() { return t_lastError.line; }
+int YLIBCErrorGetLine() {
+    return t_lastError.line;
+}
 
 void YLIBCErrSetEx(unsigned int code, const char *szFile, int line) {
     t_lastError = {code, szFile == nullptr ? "" : szFile, line};

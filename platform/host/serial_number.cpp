@@ -1,5 +1,5 @@
-// Serial numbers: on Linux two files of one line each stand for flash memory and for the number that
-// a service technician may set.
+// Serial numbers: on Linux two files of one line each stand for flash memory and for the number
+// that a service technician may set.
 
 #include "../serial_number.h"
 

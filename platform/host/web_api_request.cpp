@@ -244,6 +244,8 @@ std::string CredRequest::GetURL() const {
     return m_pImpl == nullptr ? std::string() : m_pImpl->strUrl;
 }
 
-bool APIValidator::IsPort(const int &port) { return port >= 0 && port <= 65535; }
+bool APIValidator::IsPort(const int &port) {
+    return port >= 0 && port <= 65535;
+}
 
 }  // namespace ZELO
