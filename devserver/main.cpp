@@ -114,9 +114,7 @@ int Serve(const devserver::Options &options, const Files &files) {
     return EXIT_SUCCESS;
 }
 
-}  // namespace
-
-int main(int argc, char **argv) {
+int Run(int argc, char **argv) {
     devserver::Options options;
     Files files;
     CLI::App app("A QRM server for development, on loopback");
@@ -139,4 +137,15 @@ int main(int argc, char **argv) {
         return app.exit(error) == EXIT_SUCCESS ? EXIT_SUCCESS : kExitUsage;
     }
     return ReadToken(files.token, options.token) ? Serve(options, files) : kExitFailed;
+}
+
+}  // namespace
+
+int main(int argc, char **argv) {
+    try {
+        return Run(argc, argv);
+    } catch (const std::exception &error) {
+        std::fprintf(stderr, "qrm-devserver: cannot go on: %s\n", error.what());
+        return kExitFailed;
+    }
 }
