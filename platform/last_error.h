@@ -14,13 +14,18 @@
 enum YLIBC_ERROR {
     YLIBC_ERR_NONE = 0x0000,
     YLIBC_ERR_OUT_OF_MEMORY = 0x0200,
-    YLIBC_ERR_NOT_FOUND = 0x0300,        // the record, key or file asked for is not there
-    YLIBC_ERR_FILE = 0x0400,             // a file or directory could not be opened, read or written
-    YLIBC_ERR_STORE = 0x0500,            // a database refused an operation
-    YLIBC_ERR_STORE_BUSY = 0x0501,       // another process kept the database locked for too long
-    YLIBC_ERR_STORE_DAMAGED = 0x0502,    // the database file is damaged or of another format
-    YLIBC_ERR_NETWORK = 0x0600,          // no exchange with the server was possible
-    YLIBC_ERR_REPLY = 0x0601,            // the server answered, but not what was asked for
+    YLIBC_ERR_NOT_FOUND = 0x0300,      // the record, key or file asked for is not there
+    YLIBC_ERR_FILE = 0x0400,           // a file or directory could not be opened, read or written
+    YLIBC_ERR_BUSY = 0x0401,           // a lock was held elsewhere for too long
+    YLIBC_ERR_UNSAFE_FILE = 0x0402,    // a link, or somebody else's file, stands in a shared folder
+    YLIBC_ERR_STORE = 0x0500,          // a database refused an operation
+    YLIBC_ERR_STORE_BUSY = 0x0501,     // another process kept the database locked for too long
+    YLIBC_ERR_STORE_DAMAGED = 0x0502,  // the database file is damaged or of another format
+    YLIBC_ERR_NETWORK = 0x0600,        // no exchange with the server was possible
+    YLIBC_ERR_REPLY = 0x0601,          // the server answered, but not what was asked for
+    YLIBC_ERR_UNCHANGED = 0x0602,      // the server has nothing newer than the caller's copy
+    YLIBC_ERR_EXEC = 0x0700,           // a program could not be run
+    YLIBC_ERR_EXEC_TIME = 0x0701,      // a program ran for too long and was ended
     YLIBC_ERR_INVALID_ARGUMENT = 0x0D00  // a null or unusable argument
 };
 

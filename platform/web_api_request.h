@@ -23,6 +23,8 @@
 
 #include <json/value.h>
 
+#include <cstddef>
+#include <cstdio>
 #include <memory>
 #include <string>
 
@@ -36,6 +38,21 @@ enum _tag_CRED_REQ_CRYPTO {
     CRED_REQ_CRYPTO_NONE = 0,
     CRED_REQ_CRYPTO_TRANSPORT = 1,  // the transport's own protection is enough
     CRED_REQ_CRYPTO_PARAMS = 2      // the parameters are to be protected themselves
+};
+
+// Why a Process failed.
+enum CRED_REQ_ERROR {
+    CRED_REQ_ERR_NONE = 0,
+    CRED_REQ_ERR_ARGUMENT = 1,  // the request has no URL, or its parameters cannot be written
+    CRED_REQ_ERR_NETWORK = 2,   // no whole reply arrived
+    CRED_REQ_ERR_REPLY = 3,     // the reply is too large
+    CRED_REQ_ERR_STATUS = 4,    // a response stream was set, and the reply's HTTP status is not 2xx
+    CRED_REQ_ERR_STREAM = 5,    // the response stream could not be written
+    CRED_REQ_ERR_STOPPED = 6,   // the progress observer ended the transfer
+    CRED_REQ_ERR_MEMORY = 7,
+    // A response stream was set, and the server answers that the copy whose digest the request
+    // carries is current (HTTP status 304): nothing was written, and nothing is wrong.
+    CRED_REQ_ERR_UNCHANGED = 21
 };
 
 class CredRequest;
@@ -53,6 +70,14 @@ ZELO_PLATFORM_API std::string GetWebAPIPath(const ZELO_CRED *pCred, const std::s
 ZELO_PLATFORM_API bool SetWebAPIURL(const ZELO_CRED *pCred, const std::string &api, int ver,
                                     const std::string &method, CredRequest *pRequest);
 
+// Called now and then while a request of the same thread writes its reply to a response stream:
+// with the bytes written so far and, when the server has said so, the number of bytes to expect,
+// else -1. Returning false ends the transfer. It must not throw.
+typedef bool (*ProgressObserver)(void *pContext, long long cbWritten, long long cbExpected);
+
+// Sets the observer of the calling thread's requests; null for none, as at the start of a thread.
+ZELO_PLATFORM_API void SetProgressObserver(ProgressObserver pfnObserver, void *pContext);
+
 }  // namespace CredRequestUtil
 
 // One call of a Web API method.
@@ -64,6 +89,21 @@ class ZELO_PLATFORM_API CredRequest {
     ~CredRequest();
     CredRequest(const CredRequest &) = delete;
     CredRequest &operator=(const CredRequest &) = delete;
+
+    // A call of the method of version ver of the API, authenticated by the session's tokens, on the
+    // server that the credential describes; params is an object or null. The records are not needed
+    // any more afterwards. The path of the API is found as by SetWebAPIURL, so this may ask the
+    // server.
+    //
+    // Returns a new request, which the caller owns; null when the records are unusable, the server
+    // does not tell a path, or memory is short.
+    static CredRequest *CreateWebAPIRequest(const ZELO_CRED *pCred, const ZELO_CRED_SESS *pSess,
+                                            const std::string &api, int ver,
+                                            const std::string &method, const Json::Value &params);
+
+    // The same with the credential and the session that are stored under an id.
+    static CredRequest *CreateWebAPIRequest(long id, const std::string &api, int ver,
+                                            const std::string &method, const Json::Value &params);
 
     // Adds the members of an object to the parameters of the call; a member given again replaces
     // the earlier one. Returns false when params is no object.
@@ -77,10 +117,25 @@ class ZELO_PLATFORM_API CredRequest {
     // platform's own.
     //
     // Returns true when a reply arrived, whatever its HTTP status and body; false when the request
-    // has no URL or no whole reply arrived.
+    // has no URL or no whole reply arrived. With a response stream, a reply whose status is not 2xx
+    // fails too, and so does a body that could not be written whole; GetError says which.
     bool Process(bool blKeepConnection, int timeout_s);
 
-    // The body of the reply, empty before a successful Process.
+    // Takes the body of the next reply piece by piece. pStream is the one given to SetRespStream.
+    // Returns the number of bytes taken; any other than cb fails the transfer. It must not throw.
+    typedef std::size_t (*RespWriteCallback)(const char *pData, std::size_t cb, std::FILE *pStream);
+
+    // Lets the next Process write the body of the reply straight into an open file, through
+    // pfnWrite when it is not null; nothing is kept in memory and no size is too large. Only the
+    // body of a reply with status 2xx is written, and the stream is flushed before Process
+    // succeeds. The stream stays the caller's and must be open until then. Returns false for a null
+    // stream.
+    bool SetRespStream(std::FILE *pStream, RespWriteCallback pfnWrite);
+
+    // Why the latest Process failed, a value of CRED_REQ_ERROR; CRED_REQ_ERR_NONE when it did not.
+    int GetError() const;
+
+    // The body of the reply, empty before a successful Process and when it went to a stream.
     std::string GetResponse() const;
 
     // The request's URL, empty before it is set.

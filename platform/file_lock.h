@@ -1,0 +1,36 @@
+// Locks between processes, by lock file.
+//
+// A lock is exclusive. It is held from the operation that takes it until it is released or its
+// process ends, however that ends; a lock file is created as needed (mode 0600) and never removed.
+// Two threads of one process exclude each other like two processes. A child process after fork
+// shares its parent's locks: such a lock is free once both have let go. A program that is executed
+// inherits none.
+//
+// Result of taking a lock, the same for every caller: 1 when the lock is held, and *pHandle is then
+// 0 or more; negative when it is not, and *pHandle is then -1. It is never 0, so a caller may ask
+// for "not 0 and handle 0 or more", for "greater than 0" or for "not negative" with one answer.
+//
+// Lock files may stand in a folder that everybody can write to: a lock file that is a link, no
+// regular file, or belongs to somebody else (root excepted) is refused. A failure sets the last
+// error (last_error.h): YLIBC_ERR_BUSY when the time was up.
+
+#ifndef ZELO_PLATFORM_FILE_LOCK_H
+#define ZELO_PLATFORM_FILE_LOCK_H
+
+#include "api.h"
+
+extern "C" {
+
+// Takes the lock; a lock that is held elsewhere is waited for, 30 s at most. flags is reserved:
+// callers pass 0 or 1, a port ignores it.
+ZELO_PLATFORM_API int YLIBCFileLockByFile(const char *szLockFile, int flags, int *pHandle);
+
+// The same with a limit of the caller's own, in seconds; 0 tries once.
+ZELO_PLATFORM_API int YLIBCFileLockTimeByFile(const char *szLockFile, int flags, int timeout_s,
+                                              int *pHandle);
+
+// Releases the lock of a handle. Returns 0, or a negative value when the handle is no lock's.
+ZELO_PLATFORM_API int YLIBCFileUnlockByFile(int handle);
+}
+
+#endif
