@@ -9,12 +9,13 @@
 namespace json_text {
 namespace {
 
+// Counted as the reader counts: a plain value is a level too.
 bool IsTooDeep(const Json::Value &value, int depthLeft) {
-    if (!value.isArray() && !value.isObject()) {
-        return false;
-    }
     if (depthLeft == 0) {
         return true;
+    }
+    if (!value.isArray() && !value.isObject()) {
+        return false;
     }
     return std::any_of(value.begin(), value.end(), [depthLeft](const Json::Value &element) {
         return IsTooDeep(element, depthLeft - 1);
@@ -38,6 +39,30 @@ std::string OneLine(const std::string &strReport) {
         strLine.pop_back();
     }
     return strLine;
+}
+
+// An upper bound for the number of values in the text: every value but the first comes after one of
+// these characters.
+bool HasTooManyValues(const std::string &strText) {
+    std::size_t count = 0;
+    bool blInText = false;
+    for (std::size_t i = 0; i < strText.size(); ++i) {
+        const char c = strText[i];
+        if (c == '"') {
+            blInText = !blInText;
+        } else if (c == '\\' && blInText) {
+            ++i;
+        } else if (!blInText && (c == ',' || c == '[' || c == '{') && ++count > kMaxValues) {
+            return true;
+        }
+    }
+    return false;
+}
+
+void SetError(std::string *pstrError, const std::string &strError) {
+    if (pstrError != nullptr) {
+        *pstrError = strError;
+    }
 }
 
 }  // namespace
@@ -64,20 +89,21 @@ std::string ToLogText(const Json::Value &value) {
 }
 
 bool FromString(const std::string &strText, Json::Value &value, std::string *pstrError) {
+    if (HasTooManyValues(strText)) {
+        SetError(pstrError, "too many values");
+        return false;
+    }
     try {
         Json::Reader reader;
         Json::Value parsed;
-        if (reader.parse(strText, parsed, true)) {
+        // Comments are passed over: collecting them takes time that grows with their square.
+        if (reader.parse(strText, parsed, false)) {
             value.swap(parsed);
             return true;
         }
-        if (pstrError != nullptr) {
-            *pstrError = OneLine(reader.getFormattedErrorMessages());
-        }
+        SetError(pstrError, OneLine(reader.getFormattedErrorMessages()));
     } catch (const Json::Exception &) {
-        if (pstrError != nullptr) {
-            *pstrError = "nested too deeply";
-        }
+        SetError(pstrError, "nested too deeply");
     }
     return false;
 }
@@ -122,6 +148,12 @@ bool IsTrue(const Json::Value &value) {
         default:
             return false;
     }
+}
+
+int ErrorCode(const Json::Value &reply) {
+    int code = 0;
+    ReadInt(Member(Member(reply, "error"), "code"), code);
+    return code;
 }
 
 }  // namespace json_text

@@ -9,6 +9,7 @@
 
 #include <json/value.h>
 
+#include <cstddef>
 #include <string>
 
 namespace json_text {
@@ -16,6 +17,9 @@ namespace json_text {
 // The deepest nesting that is read or written; what is deeper fails. The same both ways, so that
 // everything written can be read back.
 constexpr int kMaxDepth = 1000;
+
+// The most values that are read: a value takes a hundred times the memory of the text "0,".
+constexpr std::size_t kMaxValues = 2'000'000;
 
 // Writes the value as compact JSON text, on one line and in ASCII, without a line feed at its end.
 // Returns false, and leaves strText as it was, when the value is nested too deeply.
@@ -45,6 +49,9 @@ bool ReadInt(const Json::Value &value, int &n);
 
 // Whether the value says yes: boolean true, or a number other than zero. Any other type says no.
 bool IsTrue(const Json::Value &value);
+
+// "error"."code" of a response envelope; 0 when it is not there, of another type, or beyond an int.
+int ErrorCode(const Json::Value &reply);
 
 }  // namespace json_text
 

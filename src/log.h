@@ -8,6 +8,9 @@
 
 #include <cstddef>
 #include <string>
+#include <vector>
+
+#include "last_error.h"
 
 namespace qrm_log {
 
@@ -38,9 +41,10 @@ struct SourceStem {
 void Write(const char *szStem, int line, const char *szFormat, ...)
     __attribute__((format(printf, 3, 4)));
 
-// Text from outside for a log line: the secret blanked out, also where it stands in JSON
-// notation, and control characters escaped.
-std::string SafeText(const std::string &strText, const std::string &strSecret);
+// Text from outside for a log line: each of the secrets blanked out, however its characters are
+// escaped (\", \/, \u002F, %2F), and control characters escaped. What would not fit into a line is
+// left out, and the whole length named.
+std::string SafeText(const std::string &strText, const std::vector<std::string> &secrets);
 
 }  // namespace qrm_log
 
@@ -49,6 +53,9 @@ std::string SafeText(const std::string &strText, const std::string &strSecret);
         static constexpr ::qrm_log::SourceStem stem(__FILE__); \
         return stem.sz;                                        \
     }())
+
+// The arguments for a message that ends in "[0x%04X %s:%d]": why a platform operation failed.
+#define ZELO_LAST_ERROR YLIBCErrGet(), YLIBCErrorGetFile(), YLIBCErrorGetLine()
 
 #define ZELO_LOG(...) ::qrm_log::Write(ZELO_SOURCE_STEM, __LINE__, __VA_ARGS__)
 

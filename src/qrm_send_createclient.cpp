@@ -3,6 +3,7 @@
 #include <memory>
 #include <new>
 #include <string>
+#include <vector>
 
 #include "credential_store.h"
 #include "guard.h"
@@ -186,9 +187,17 @@ bool IsAccepted(const std::string &strReply) {
     return json_text::FromString(strReply, reply) && json_text::IsTrue(Member(reply, "success"));
 }
 
-// The token as it may stand in a reply that echoes it.
-std::string TokenText(const Json::Value &accessToken) {
-    return accessToken.isString() ? accessToken.asString() : json_text::ToLogText(accessToken);
+// The texts that make up a token, which may be of any type.
+void CollectTexts(const Json::Value &value, std::vector<std::string> &texts) {
+    if (value.isString()) {
+        texts.push_back(value.asString());
+    } else if (value.isArray() || value.isObject()) {
+        for (const Json::Value &element : value) {
+            CollectTexts(element, texts);
+        }
+    } else if (!value.isNull()) {
+        texts.push_back(json_text::ToLogText(value));
+    }
 }
 
 int SendJoin(const Json::Value &joinInfo, ZELO::CredRequest *pRequest) {
@@ -202,8 +211,9 @@ int SendJoin(const Json::Value &joinInfo, ZELO::CredRequest *pRequest) {
         return -1;
     }
     if (!IsAccepted(pRequest->GetResponse())) {
-        const std::string strReply =
-            qrm_log::SafeText(pRequest->GetResponse(), TokenText(Member(joinInfo, "access_token")));
+        std::vector<std::string> secrets;
+        CollectTexts(Member(joinInfo, "access_token"), secrets);
+        const std::string strReply = qrm_log::SafeText(pRequest->GetResponse(), secrets);
         ZELO_LOG("send create client fail: %s", strReply.c_str());
         return -1;
     }

@@ -3,6 +3,7 @@
 #include <gtest/gtest.h>
 #include <unistd.h>
 
+#include <chrono>
 #include <filesystem>
 #include <fstream>
 
@@ -351,6 +352,12 @@ TEST_F(Join, RefusedRepliesAreLoggedWithoutTheToken) {
         {"1", "1"},
         {strDeep, strDeep.c_str()},
         {std::string("token ") + kToken + " se\\/cr\\\"et-0123456789", "token *** ***"},
+        {"se\\u002fcr\\u0022et-0123456789 se%2Fcr%22et-0123456789.", "*** ***."},
+        {"se/cr\"et-012345678", "se/cr\"et-012345678"},
+        {"\xC2\x9B"
+         "2J \x9B \xC3\x9B",
+         "\\xC2\\x9B"
+         "2J \\x9B \xC3\x9B"},
     };
     for (const auto &row : rows) {
         stored::Clear();
@@ -380,7 +387,29 @@ TEST_F(Join, HugeRepliesAreCutInTheLog) {
         seam::Observe([&] { EXPECT_EQ(ZELOQRMClientSendCreateClient(JoinInfo()), -1); });
     ASSERT_EQ(outcome.logs.size(), 1U);
     EXPECT_LT(outcome.logs[0].strMessage.size(), 8100U);
-    EXPECT_NE(outcome.logs[0].strMessage.find("100025 bytes in all"), std::string::npos);
+    EXPECT_NE(outcome.logs[0].strMessage.find("100000 bytes in all"), std::string::npos);
+}
+
+// Each of these would take minutes, or most of the memory, if it were taken as it comes.
+TEST_F(Join, RepliesMadeToBeExpensiveAreCheap) {
+    const auto repeat = [](const std::string &strPiece, std::size_t cb) {
+        std::string strText;
+        while (strText.size() < cb) {
+            strText += strPiece;
+        }
+        return strText;
+    };
+    for (const std::string &strBody :
+         {"{\"success\":0" + repeat("/**/", 4U << 20U) + "}", "[0" + repeat(",0", 15U << 20U) + "]",
+          repeat(kToken, 15U << 20U)}) {
+        devserver::NextAnswer answer;
+        answer.method = "join";
+        answer.body = strBody;
+        s_pServer->AnswerNext(kApi, answer);
+        const auto start = std::chrono::steady_clock::now();
+        EXPECT_EQ(ZELOQRMClientSendCreateClient(JoinInfo()), -1);
+        EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(20));
+    }
 }
 
 TEST_F(Join, IncompleteInputTouchesNothing) {

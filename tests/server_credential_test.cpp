@@ -328,6 +328,25 @@ TEST(ServerCredential, ExtraInfoKeepsWhatItCannotRead) {
     }
 }
 
+TEST(ServerCredential, WhatCanBeStoredCanBeReadBack) {
+    const auto nest = [](int depth) {
+        Json::Value value = 1;
+        for (int i = 0; i < depth; ++i) {
+            Json::Value outer(Json::arrayValue);
+            outer.append(std::move(value));
+            value = std::move(outer);
+        }
+        return value;
+    };
+    for (int depth = json_text::kMaxDepth - 2; depth <= json_text::kMaxDepth; ++depth) {
+        std::string strText;
+        Json::Value read;
+        const bool blWritten = json_text::ToString(nest(depth), strText);
+        EXPECT_EQ(blWritten, depth < json_text::kMaxDepth);
+        EXPECT_EQ(blWritten && json_text::FromString(strText, read), blWritten) << depth;
+    }
+}
+
 TEST(ServerCredential, TokensAreReadAsTheyAreStored) {
     stored::Clear();
     const long id = stored::AddCredential("ZELO.QRM", "qrm");
