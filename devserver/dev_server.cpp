@@ -4,6 +4,8 @@
 
 #include <algorithm>
 #include <chrono>
+#include <ctime>
+#include <memory>
 
 #include "json_text.h"
 
@@ -15,14 +17,19 @@ using json_text::Member;
 
 constexpr const char *kDiscoveryPath = "/qrm/discover";
 constexpr const char *kDiscoveryMethod = "discover";
-constexpr const char *kJson = "application/json";
+
+constexpr const char *kFileType = "application/octet-stream";
+constexpr std::int64_t kMaxFile = std::int64_t{1} << 40U;
+constexpr std::size_t kMd5Digits = 32;
+constexpr int kUnchanged = 304;
 
 enum ErrorCode {
     kBadParameter = 101,
     kUnknownApi = 102,
     kUnknownMethod = 103,
     kUnknownVersion = 104,
-    kNoPermission = 105
+    kNoPermission = 105,
+    kUnknownClient = 120
 };
 
 constexpr std::size_t kShownBody = 64UL << 10U;
@@ -47,36 +54,27 @@ Json::Value Failure(int code) {
     return envelope;
 }
 
-void Reply(int status, const Json::Value &value, httplib::Response &response) {
-    std::string strText;
-    json_text::ToString(value, strText);
-    response.status = status;
-    response.set_content(strText, kJson);
+Reply Ok(const Json::Value &data) {
+    return JsonReply(200, Success(data));
 }
 
-void ReplyAsTold(const NextAnswer &answer, httplib::Response &response) {
+Reply Refuse(int code, const char *szReason = nullptr) {
+    Json::Value envelope = Failure(code);
+    if (szReason != nullptr) {
+        envelope["error"]["message"] = szReason;
+    }
+    return JsonReply(200, envelope);
+}
+
+Reply AsTold(const NextAnswer &answer) {
     const int status = answer.status.value_or(200);
     if (answer.error_code && !answer.body) {
-        Reply(status, Failure(*answer.error_code), response);
-        return;
+        return JsonReply(status, Failure(*answer.error_code));
     }
-    response.status = status;
-    response.set_content(answer.body.value_or(""), kJson);
-}
-
-// Promises more than it sends; giving up half-way is what makes the HTTP library close.
-void CutReply(std::size_t cut_after, httplib::Response &response) {
-    const std::size_t promised = std::max(response.body.size(), cut_after + 1);
-    const std::string strSent = response.body.substr(0, cut_after);
-    const std::string strType = response.get_header_value("Content-Type");
-    response.body.clear();
-    response.headers.erase("Content-Type");
-    response.set_content_provider(
-        promised, strType,
-        [strSent](std::size_t /*offset*/, std::size_t /*length*/, httplib::DataSink &sink) {
-            sink.write(strSent.data(), strSent.size());
-            return false;
-        });
+    Reply reply;
+    reply.status = status;
+    reply.strBody = answer.body.value_or("");
+    return reply;
 }
 
 // The HTTP library adds the connection's addresses to the headers under these names.
@@ -97,8 +95,8 @@ Json::Value HeadersOf(const httplib::Request &request) {
     return headers;
 }
 
-// The optional parameters of "join": text, except for the numbers.
-bool HasJoinTypes(const Json::Value &params) {
+// The optional parameters of a description: text, except for the numbers.
+bool HasDescriptionTypes(const Json::Value &params) {
     const auto isText = [&params](const char *szKey) {
         return !HasMember(params, szKey) || params[szKey].isString();
     };
@@ -125,6 +123,7 @@ struct DevServer::Call {
             json_text::FromString(request.body, body);
             strApi = TextOrEmpty(Member(body, "api"));
             strMethod = TextOrEmpty(Member(body, "method"));
+            strAuthorization = request.get_header_value("Authorization");
         }
     }
 
@@ -133,91 +132,145 @@ struct DevServer::Call {
     bool blDiscovery;
     std::string strApi;
     std::string strMethod;
+    std::string strAuthorization;
     Json::Value body;
 };
 
 // A row for each method; an API stands under one path.
 const DevServer::Route DevServer::kRoutes[] = {
-    {"ZELO.QRM.RPC", 1, "/qrm/rpc", "join", &DevServer::Join},
+    {"ZELO.QRM.RPC", 1, "/qrm/rpc", "join", false, &DevServer::Join},
+    {"ZELO.QRM.RPC", 1, "/qrm/rpc", "info", true, &DevServer::Info},
+    {"ZELO.QRM.RPC.ClientInfo", 1, "/qrm/client-info", "update", true, &DevServer::Update},
+    {"ZELO.QRM.RPC.File", 1, "/qrm/file", "get", true, &DevServer::File},
 };
 
-Json::Value DevServer::Join(const Json::Value &params) {
+// The caller holds the mutex.
+Json::Value *DevServer::FindClient(const Json::Value &sn, int &id) {
+    const auto known =
+        std::find_if(m_descriptions.begin(), m_descriptions.end(),
+                     [&sn](const Json::Value &description) { return description["sn"] == sn; });
+    id = static_cast<int>(known - m_descriptions.begin()) + 1;
+    return known == m_descriptions.end() ? nullptr : &*known;
+}
+
+Reply DevServer::Join(const Json::Value &params) {
     const char *szSn = json_text::Text(Member(params, "sn"));
     const char *szToken = json_text::Text(Member(params, "access_token"));
-    if (szSn == nullptr || szToken == nullptr || !HasJoinTypes(params)) {
-        return Failure(kBadParameter);
+    if (szSn == nullptr || szToken == nullptr || !HasDescriptionTypes(params)) {
+        return Refuse(kBadParameter);
     }
     if (szToken != m_options.token) {
-        return Failure(kNoPermission);
+        return Refuse(kNoPermission);
     }
     Json::Value description = params;
     description.removeMember("access_token");
 
     const std::lock_guard<std::mutex> lock(m_mutex);
-    const auto known =
-        std::find_if(m_descriptions.begin(), m_descriptions.end(),
-                     [&](const Json::Value &other) { return other["sn"] == params["sn"]; });
-    Json::Value data;
-    data["id"] = static_cast<int>(known - m_descriptions.begin()) + 1;
-    if (known == m_descriptions.end()) {
-        m_descriptions.push_back(description);
+    int id = 0;
+    if (Json::Value *pKnown = FindClient(params["sn"], id)) {
+        *pKnown = description;
     } else {
-        *known = description;
+        m_descriptions.push_back(description);
     }
-    return Success(data);
+    Json::Value data;
+    data["id"] = id;
+    return Ok(data);
+}
+
+Reply DevServer::Info(const Json::Value & /*params*/) {
+    Json::Value data;
+    data["name"] = "qrm-devserver";
+    data["time"] = static_cast<Json::Int64>(std::time(nullptr));
+    const std::lock_guard<std::mutex> lock(m_mutex);
+    data["clients"] = static_cast<int>(m_descriptions.size());
+    return Ok(data);
+}
+
+Reply DevServer::Update(const Json::Value &params) {
+    if (json_text::Text(Member(params, "sn")) == nullptr || !HasDescriptionTypes(params)) {
+        return Refuse(kBadParameter);
+    }
+    const std::lock_guard<std::mutex> lock(m_mutex);
+    int id = 0;
+    Json::Value *pKnown = FindClient(params["sn"], id);
+    if (pKnown == nullptr) {
+        return Refuse(kUnknownClient, "no client with this serial number has joined");
+    }
+    for (const std::string &strName : params.getMemberNames()) {
+        (*pKnown)[strName] = params[strName];
+    }
+    Json::Value data;
+    data["id"] = id;
+    return Ok(data);
+}
+
+Reply DevServer::File(const Json::Value &params) {
+    const char *szName = json_text::Text(Member(params, "name"));
+    const Json::Value &size = Member(params, "size");
+    if (szName == nullptr || !size.isInt64() || size.asInt64() < 0 || size.asInt64() > kMaxFile) {
+        return Refuse(kBadParameter, "a file has a \"name\" and a \"size\"");
+    }
+    Reply reply;
+    reply.strType = kFileType;
+    reply.pFile =
+        std::make_shared<const GeneratedFile>(szName, static_cast<std::uint64_t>(size.asInt64()));
+    if (!HasMember(params, "md5")) {
+        return reply;
+    }
+    const std::string strMd5 = TextOrEmpty(Member(params, "md5"));
+    if (strMd5.size() != kMd5Digits) {
+        return Refuse(kBadParameter, "\"md5\" has to be a text of 32 digits");
+    }
+    if (strMd5 == reply.pFile->Md5()) {
+        reply.pFile = nullptr;
+        reply.status = kUnchanged;
+    }
+    return reply;
 }
 
 void DevServer::Handle(const char *szScheme, const httplib::Request &request,
                        httplib::Response &response) {
+    const auto pause = [this](int ms) { return Delay(ms); };
     if (request.path.rfind("/dev/", 0) == 0) {
-        HandleDevelopment(request, response);
+        Send(HandleDevelopment(request), {}, pause, response);
         return;
     }
     const Call call(request);
     Record(szScheme, request, call);
     const NextAnswer answer = TakeAnswer(call).value_or(NextAnswer{});
     Delay(answer.delay_ms);
-    if (answer.status || answer.body || answer.error_code) {
-        ReplyAsTold(answer, response);
-    } else {
-        HandleOrdinarily(call, response);
-    }
-    for (const auto &[strName, strValue] : answer.headers) {
-        response.headers.erase(strName);
-        response.set_header(strName, strValue);
-    }
-    if (answer.cut_after) {
-        CutReply(*answer.cut_after, response);
-    }
+    const bool blTold = answer.status || answer.body || answer.error_code;
+    Send(blTold ? AsTold(answer) : HandleOrdinarily(call), answer, pause, response);
 }
 
-void DevServer::HandleDevelopment(const httplib::Request &request, httplib::Response &response) {
+Reply DevServer::HandleDevelopment(const httplib::Request &request) {
     const std::string strWhat = request.method + " " + request.path;
     if (strWhat == "GET /dev/requests") {
-        Reply(200, Requests(), response);
-    } else if (strWhat == "DELETE /dev/requests") {
-        ForgetRequests();
-        Reply(200, Success(Json::objectValue), response);
-    } else if (strWhat == "GET /dev/clients") {
-        Reply(200, Clients(), response);
-    } else if (strWhat == "POST /dev/next") {
-        std::string strApi;
-        NextAnswer answer;
-        const std::string strError = ReadNextAnswer(request.body, strApi, answer);
-        if (strError.empty()) {
-            AnswerNext(strApi, answer);
-            Reply(200, Success(Json::objectValue), response);
-            return;
-        }
-        Json::Value error;
-        error["error"] = strError;
-        Reply(400, error, response);
-    } else {
-        response.status = 404;
+        return JsonReply(200, Requests());
     }
+    if (strWhat == "DELETE /dev/requests") {
+        ForgetRequests();
+        return Ok(Json::objectValue);
+    }
+    if (strWhat == "GET /dev/clients") {
+        return JsonReply(200, Clients());
+    }
+    if (strWhat != "POST /dev/next") {
+        return Reply{404, "text/plain", "", nullptr};
+    }
+    std::string strApi;
+    NextAnswer answer;
+    const std::string strError = ReadNextAnswer(request.body, strApi, answer);
+    if (strError.empty()) {
+        AnswerNext(strApi, answer);
+        return Ok(Json::objectValue);
+    }
+    Json::Value error;
+    error["error"] = strError;
+    return JsonReply(400, error);
 }
 
-void DevServer::HandleOrdinarily(const Call &call, httplib::Response &response) {
+Reply DevServer::HandleOrdinarily(const Call &call) {
     const auto route =
         std::find_if(std::begin(kRoutes), std::end(kRoutes), [&call](const Route &candidate) {
             return call.blDiscovery ? call.strApi == candidate.szApi
@@ -227,20 +280,17 @@ void DevServer::HandleOrdinarily(const Call &call, httplib::Response &response) 
     if (call.blDiscovery) {
         Json::Value data;
         data["path"] = blFound ? route->szPath : "";
-        Reply(200, blFound ? Success(data) : Failure(kUnknownApi), response);
-    } else if (blFound && call.blPost) {
-        Reply(200, CarryOut(call), response);
-    } else {
-        response.status = 404;
+        return blFound ? Ok(data) : Refuse(kUnknownApi);
     }
+    return blFound && call.blPost ? CarryOut(call) : Reply{404, "text/plain", "", nullptr};
 }
 
-Json::Value DevServer::CarryOut(const Call &call) {
+Reply DevServer::CarryOut(const Call &call) {
     int version = 0;
     const Json::Value &params = Member(call.body, "params");
     if (call.strApi.empty() || call.strMethod.empty() || !params.isObject() ||
         !json_text::ReadInt(Member(call.body, "version"), version)) {
-        return Failure(kBadParameter);
+        return Refuse(kBadParameter);
     }
     int code = kUnknownApi;
     for (const Route &route : kRoutes) {
@@ -248,13 +298,15 @@ Json::Value DevServer::CarryOut(const Call &call) {
             continue;
         }
         if (version == route.version && call.strMethod == route.szMethod) {
-            return (this->*route.Carry)(params);
+            return route.blNeedsToken && call.strAuthorization != "Bearer " + m_options.token
+                       ? Refuse(kNoPermission)
+                       : (this->*route.Carry)(params);
         }
         if (code != kUnknownMethod) {
             code = version == route.version ? kUnknownMethod : kUnknownVersion;
         }
     }
-    return Failure(code);
+    return Refuse(code);
 }
 
 void DevServer::Record(const char *szScheme, const httplib::Request &request, const Call &call) {
@@ -295,9 +347,11 @@ std::optional<NextAnswer> DevServer::TakeAnswer(const Call &call) {
     return answer;
 }
 
-void DevServer::Delay(int delay_ms) {
+// False when the server is ending.
+bool DevServer::Delay(int delay_ms) {
     std::unique_lock<std::mutex> lock(m_mutex);
-    m_ending.wait_for(lock, std::chrono::milliseconds(delay_ms), [this] { return m_blEnding; });
+    return !m_ending.wait_for(lock, std::chrono::milliseconds(delay_ms),
+                              [this] { return m_blEnding; });
 }
 
 void DevServer::AnswerNext(const std::string &strApi, const NextAnswer &answer) {

@@ -19,6 +19,7 @@
 #include "dev_certificate.h"
 #include "loopback_listener.h"
 #include "next_answer.h"
+#include "reply.h"
 
 namespace devserver {
 
@@ -71,19 +72,24 @@ class DevServer {
         int version;
         const char *szPath;
         const char *szMethod;
-        Json::Value (DevServer::*Carry)(const Json::Value &params);
+        bool blNeedsToken;
+        Reply (DevServer::*Carry)(const Json::Value &params);
     };
     static const Route kRoutes[];
 
-    Json::Value Join(const Json::Value &params);
+    Reply Join(const Json::Value &params);
+    Reply Info(const Json::Value &params);
+    Reply Update(const Json::Value &params);
+    Reply File(const Json::Value &params);
+    Json::Value *FindClient(const Json::Value &sn, int &id);
 
     void Handle(const char *szScheme, const httplib::Request &request, httplib::Response &response);
-    void HandleDevelopment(const httplib::Request &request, httplib::Response &response);
-    void HandleOrdinarily(const Call &call, httplib::Response &response);
-    Json::Value CarryOut(const Call &call);
+    Reply HandleDevelopment(const httplib::Request &request);
+    Reply HandleOrdinarily(const Call &call);
+    Reply CarryOut(const Call &call);
     void Record(const char *szScheme, const httplib::Request &request, const Call &call);
     std::optional<NextAnswer> TakeAnswer(const Call &call);
-    void Delay(int delay_ms);
+    bool Delay(int delay_ms);
 
     const Options m_options;
     CertificateAuthority m_authority;

@@ -57,6 +57,7 @@ std::unique_ptr<httplib::Server> MakeServer(const ServerCertificate *pCertificat
 
 void SetUp(httplib::Server &server, const LoopbackListener::Handler &handler) {
     server.Get(kAnyPath, handler).Post(kAnyPath, handler).Delete(kAnyPath, handler);
+    server.Put(kAnyPath, handler).Patch(kAnyPath, handler).Options(kAnyPath, handler);
     server.set_tcp_nodelay(true);
     server.set_keep_alive_max_count(std::numeric_limits<std::size_t>::max());
     server.set_keep_alive_timeout(kIdleConnection_s);

@@ -30,9 +30,9 @@ class LoopbackListener {
     LoopbackListener();
     ~LoopbackListener();  // stops
 
-    // Listens on the port, 0 for a free one, and gives each GET, POST and DELETE request to the
-    // handler, in threads of its own. Speaks TLS when there is a certificate. Returns false, and
-    // says why in one line, when it cannot.
+    // Listens on the port, 0 for a free one, and gives each request to the handler, in threads of
+    // its own. Speaks TLS when there is a certificate. Returns false, and says why in one line,
+    // when it cannot.
     bool Start(const std::string &strHost, int port, const ServerCertificate *pCertificate,
                const Handler &handler, std::string &strReason);
 

@@ -33,6 +33,11 @@ bool ReadNumber(const Json::Value &value, int least, int most, Number &number) {
     return true;
 }
 
+bool ReadFlag(const Json::Value &value, bool &bl) {
+    bl = value.isBool() && value.asBool();
+    return value.isBool();
+}
+
 bool ReadHeaders(const Json::Value &value, std::map<std::string, std::string> &headers) {
     if (!value.isObject()) {
         return false;
@@ -59,6 +64,8 @@ constexpr AnswerMember kMembers[] = {
     {"headers", [](V v, A a) { return ReadHeaders(v, a.headers); }},
     {"delay_ms", [](V v, A a) { return ReadNumber(v, 0, kMaxDelay_ms, a.delay_ms); }},
     {"cut_after", [](V v, A a) { return ReadNumber(v, 0, kMaxInt, a.cut_after); }},
+    {"bytes_per_s", [](V v, A a) { return ReadNumber(v, 0, kMaxInt, a.bytes_per_s); }},
+    {"endless", [](V v, A a) { return ReadFlag(v, a.endless); }},
     {"times", [](V v, A a) { return ReadNumber(v, 1, kMaxInt, a.times); }},
 };
 

@@ -1,0 +1,103 @@
+#include "reply.h"
+
+#include <httplib.h>
+
+#include <algorithm>
+
+#include "json_text.h"
+
+namespace devserver {
+namespace {
+
+constexpr std::size_t kPiece = 256UL * 1024;
+constexpr int kTick_ms = 50;
+constexpr int kSecond_ms = 1000;
+
+// The body piece by piece, at the rate that is asked for.
+class Pieces {
+  public:
+    Pieces(const Reply &reply, const NextAnswer &answer, Pause pause)
+        : m_reply(reply), m_answer(answer), m_pause(std::move(pause)) {}
+
+    std::uint64_t Size() const {
+        return m_reply.pFile != nullptr ? m_reply.pFile->Size() : m_reply.strBody.size();
+    }
+
+    // Writes the piece at the offset; false ends the connection.
+    bool Write(std::uint64_t offset, httplib::DataSink &sink) const {
+        const std::uint64_t end = m_answer.cut_after.value_or(m_answer.endless ? kNoEnd : Size());
+        if (offset >= end) {
+            return false;
+        }
+        std::uint64_t cb = std::min<std::uint64_t>(kPiece, end - offset);
+        if (m_answer.bytes_per_s > 0) {
+            const int bytes_per_s = m_answer.bytes_per_s;
+            const bool blSlow = bytes_per_s < kSecond_ms / kTick_ms;
+            if (!m_pause(blSlow ? kSecond_ms / bytes_per_s : kTick_ms)) {
+                return false;
+            }
+            cb = std::min<std::uint64_t>(cb, blSlow ? 1 : bytes_per_s * kTick_ms / kSecond_ms);
+        }
+        const std::string strPiece = PieceAt(offset, cb);
+        return sink.write(strPiece.data(), strPiece.size());
+    }
+
+  private:
+    static constexpr std::uint64_t kNoEnd = ~std::uint64_t{0};
+
+    // Past the end of an endless body come blanks.
+    std::string PieceAt(std::uint64_t offset, std::size_t cb) const {
+        std::string strPiece;
+        if (m_reply.pFile != nullptr) {
+            strPiece = m_reply.pFile->Read(offset, cb);
+        } else if (offset < m_reply.strBody.size()) {
+            strPiece = m_reply.strBody.substr(offset, cb);
+        }
+        return strPiece.empty() ? std::string(cb, ' ') : strPiece;
+    }
+
+    Reply m_reply;
+    NextAnswer m_answer;
+    Pause m_pause;
+};
+
+}  // namespace
+
+Reply JsonReply(int status, const Json::Value &value) {
+    Reply reply;
+    reply.status = status;
+    json_text::ToString(value, reply.strBody);
+    return reply;
+}
+
+void Send(const Reply &reply, const NextAnswer &answer, const Pause &pause,
+          httplib::Response &response) {
+    response.status = reply.status;
+    for (const auto &[strName, strValue] : answer.headers) {
+        response.set_header(strName, strValue);
+    }
+    const auto typeOf = answer.headers.find("Content-Type");
+    const std::string strType = typeOf == answer.headers.end() ? reply.strType : typeOf->second;
+    response.headers.erase("Content-Type");
+
+    const auto pPieces = std::make_shared<const Pieces>(reply, answer, pause);
+    if (answer.endless) {
+        response.set_chunked_content_provider(
+            strType, [pPieces](std::size_t offset, httplib::DataSink &sink) {
+                return pPieces->Write(offset, sink);
+            });
+    } else if (reply.pFile != nullptr || answer.cut_after || answer.bytes_per_s > 0) {
+        // A cut reply promises more than it sends; giving up half-way is what closes.
+        const std::uint64_t promised =
+            std::max<std::uint64_t>(pPieces->Size(), answer.cut_after ? *answer.cut_after + 1 : 0);
+        response.set_content_provider(
+            promised, strType,
+            [pPieces](std::size_t offset, std::size_t /*length*/, httplib::DataSink &sink) {
+                return pPieces->Write(offset, sink);
+            });
+    } else {
+        response.set_content(reply.strBody, strType);
+    }
+}
+
+}  // namespace devserver
