@@ -6,9 +6,11 @@
 #include <sys/stat.h>
 #include <syslog.h>
 
+#include <algorithm>
 #include <filesystem>
 #include <memory>
 #include <system_error>
+#include <vector>
 
 namespace host {
 namespace {
@@ -76,12 +78,24 @@ bool AddApplianceCa(X509_STORE *pStore) {
 }
 
 std::string ApplianceCaState() {
-    struct stat status = {};
-    if (stat(kFolder, &status) != 0) {
-        return "none";
+    std::vector<std::string> states;
+    std::error_code error;
+    fs::directory_iterator entries(kFolder, error);
+    for (; !error && entries != fs::directory_iterator(); entries.increment(error)) {
+        struct stat status = {};
+        if (IsPemName(entries->path()) && stat(entries->path().c_str(), &status) == 0) {
+            states.push_back(entries->path().filename().string() + ' ' +
+                             std::to_string(status.st_ino) + ' ' + std::to_string(status.st_size) +
+                             ' ' + std::to_string(status.st_ctim.tv_sec) + '.' +
+                             std::to_string(status.st_ctim.tv_nsec));
+        }
     }
-    return std::to_string(status.st_dev) + ':' + std::to_string(status.st_ino) + ':' +
-           std::to_string(status.st_mtim.tv_sec) + '.' + std::to_string(status.st_mtim.tv_nsec);
+    std::sort(states.begin(), states.end());
+    std::string strState = error ? "?" : "";
+    for (const std::string &strFile : states) {
+        strState += strFile + '\n';
+    }
+    return strState;
 }
 
 }  // namespace host

@@ -15,7 +15,8 @@ namespace host {
 // less than the operator meant is an error too.
 bool AddApplianceCa(X509_STORE *pStore);
 
-// Tells one state of the folder from another; it changes when a file comes, goes or is replaced.
+// Tells one state of the folder from another: it changes when a file comes, goes, is replaced or
+// written to.
 std::string ApplianceCaState();
 
 }  // namespace host

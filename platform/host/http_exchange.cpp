@@ -9,6 +9,7 @@
 #include <syslog.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <array>
 #include <memory>
 #include <mutex>
@@ -18,6 +19,7 @@
 #include "appliance_ca.h"
 #include "key_value_lookup.h"
 #include "last_error.h"
+#include "reply_sink.h"
 
 namespace host {
 namespace {
@@ -25,10 +27,12 @@ namespace {
 constexpr const char *kFile = "http_exchange";
 
 constexpr long kConnectTimeout_s = 10;
-constexpr long kStallBytesPerSecond = 1;
+// A server that sends a byte now and then stalls too.
+constexpr long kStallBytesPerSecond = 100;
 constexpr long kStallTime_s = 30;
+// For a body in memory; one that goes to a stream may take its time as long as it moves.
 constexpr long kWholeTimeout_s = 300;
-constexpr std::size_t kMaxBody = 16 * 1024 * 1024;
+constexpr long kStreamBuffer = 512 * 1024L;
 
 // More idle handles than this are not kept.
 constexpr std::size_t kMaxIdle = 8;
@@ -121,18 +125,28 @@ int CloseSocket(void *pContext, curl_socket_t fd) {
     return close(fd);
 }
 
+struct Transfer {
+    const HttpRequest &request;
+    CURL *pEasy;
+    ReplySink sink;
+    bool blStopped = false;
+};
+
 size_t TakeBody(char *pData, size_t size, size_t count, void *pContext) {
-    auto *const pstrBody = static_cast<std::string *>(pContext);
+    auto *const pTransfer = static_cast<Transfer *>(pContext);
+    long status = 0;
+    curl_easy_getinfo(pTransfer->pEasy, CURLINFO_RESPONSE_CODE, &status);
     const size_t cb = size * count;
-    if (cb > kMaxBody - pstrBody->size()) {
-        return 0;
-    }
-    try {
-        pstrBody->append(pData, cb);
-        return cb;
-    } catch (const std::bad_alloc &) {
-        return 0;
-    }
+    return pTransfer->sink.Take(pData, cb, status) ? cb : CURL_WRITEFUNC_ERROR;
+}
+
+int ShowProgress(void *pContext, curl_off_t cbExpected, curl_off_t /*cbReceived*/,
+                 curl_off_t /*cbToSend*/, curl_off_t /*cbSent*/) {
+    auto *const pTransfer = static_cast<Transfer *>(pContext);
+    pTransfer->blStopped = !pTransfer->request.pfnObserver(pTransfer->request.pObserverContext,
+                                                           pTransfer->sink.Written(),
+                                                           cbExpected > 0 ? cbExpected : -1);
+    return pTransfer->blStopped ? 1 : 0;
 }
 
 CURLcode AddAuthorities(CURL * /*pEasy*/, void *pSslContext, void * /*pContext*/) {
@@ -218,6 +232,8 @@ void SetTransport(CURL *pEasy, Connection *pConnection) {
     curl_easy_setopt(pEasy, CURLOPT_FOLLOWLOCATION, 0L);
     curl_easy_setopt(pEasy, CURLOPT_HTTP_VERSION, static_cast<long>(CURL_HTTP_VERSION_1_1));
     curl_easy_setopt(pEasy, CURLOPT_CONNECTTIMEOUT, kConnectTimeout_s);
+    // A name server that is silent is not waited for either.
+    curl_easy_setopt(pEasy, CURLOPT_QUICK_EXIT, 1L);
     curl_easy_setopt(pEasy, CURLOPT_LOW_SPEED_LIMIT, kStallBytesPerSecond);
     curl_easy_setopt(pEasy, CURLOPT_LOW_SPEED_TIME, kStallTime_s);
     curl_easy_setopt(pEasy, CURLOPT_OPENSOCKETFUNCTION, OpenSocket);
@@ -280,9 +296,9 @@ bool BuildHeaders(const HttpRequest &request, std::unique_ptr<curl_slist, FreeLi
 void SetRequest(CURL *pEasy, const HttpRequest &request, const curl_slist *pHeaders) {
     curl_easy_setopt(pEasy, CURLOPT_URL, request.strUrl.c_str());
     curl_easy_setopt(pEasy, CURLOPT_HTTPHEADER, pHeaders);
-    curl_easy_setopt(
-        pEasy, CURLOPT_TIMEOUT,
-        request.timeout_s > 0 ? static_cast<long>(request.timeout_s) : kWholeTimeout_s);
+    const long wholeTimeout_s = request.pStream == nullptr ? kWholeTimeout_s : 0;
+    curl_easy_setopt(pEasy, CURLOPT_TIMEOUT,
+                     request.timeout_s > 0 ? static_cast<long>(request.timeout_s) : wholeTimeout_s);
     curl_easy_setopt(pEasy, CURLOPT_FORBID_REUSE, request.blKeepConnection ? 0L : 1L);
     if (request.blPost) {
         curl_easy_setopt(pEasy, CURLOPT_POSTFIELDS, request.strBody.c_str());
@@ -291,52 +307,90 @@ void SetRequest(CURL *pEasy, const HttpRequest &request, const curl_slist *pHead
     }
 }
 
-bool Fail(unsigned int code, const HttpRequest &request, const char *szReason, int line) {
-    // The query names nothing that helps, and it came from a caller.
-    const std::string strUrl = request.strUrl.substr(0, request.strUrl.find('?'));
-    syslog(LOG_WARNING, "%s:%d %s%s: %s", kFile, line, strUrl.c_str(),
-           request.blRelay ? " through the relay" : "", szReason);
-    YLIBCErrSetEx(code, kFile, line);
-    return false;
+// The error of a request as the platform's last error.
+unsigned int LastErrorOf(int error) {
+    switch (error) {
+        case ZELO::CRED_REQ_ERR_MEMORY:
+            return YLIBC_ERR_OUT_OF_MEMORY;
+        case ZELO::CRED_REQ_ERR_STREAM:
+            return YLIBC_ERR_FILE;
+        case ZELO::CRED_REQ_ERR_REPLY:
+        case ZELO::CRED_REQ_ERR_STATUS:
+            return YLIBC_ERR_REPLY;
+        case ZELO::CRED_REQ_ERR_UNCHANGED:
+            return YLIBC_ERR_UNCHANGED;
+        default:
+            return YLIBC_ERR_NETWORK;
+    }
+}
+
+int Fail(int error, const HttpRequest &request, const char *szReason, int line) {
+    if (error != ZELO::CRED_REQ_ERR_UNCHANGED) {
+        // The query names nothing that helps, and it came from a caller.
+        const std::string strUrl = request.strUrl.substr(0, request.strUrl.find('?'));
+        syslog(LOG_WARNING, "%s:%d %s%s: %s", kFile, line, strUrl.c_str(),
+               request.blRelay ? " through the relay" : "", szReason);
+    }
+    YLIBCErrSetEx(LastErrorOf(error), kFile, line);
+    return error;
+}
+
+int Transact(const HttpRequest &request, CURL *pEasy, HttpReply &reply) {
+    Transfer transfer{request, pEasy, ReplySink(request.pStream, request.pfnWrite)};
+    std::array<char, CURL_ERROR_SIZE> reason = {};
+    curl_easy_setopt(pEasy, CURLOPT_WRITEFUNCTION, TakeBody);
+    curl_easy_setopt(pEasy, CURLOPT_WRITEDATA, &transfer);
+    curl_easy_setopt(pEasy, CURLOPT_ERRORBUFFER, reason.data());
+    if (request.pStream != nullptr) {
+        curl_easy_setopt(pEasy, CURLOPT_BUFFERSIZE, kStreamBuffer);
+        if (request.pfnObserver != nullptr) {
+            curl_easy_setopt(pEasy, CURLOPT_NOPROGRESS, 0L);
+            curl_easy_setopt(pEasy, CURLOPT_XFERINFOFUNCTION, ShowProgress);
+            curl_easy_setopt(pEasy, CURLOPT_XFERINFODATA, &transfer);
+        }
+    }
+    const CURLcode result = curl_easy_perform(pEasy);
+    curl_easy_getinfo(pEasy, CURLINFO_RESPONSE_CODE, &reply.status);
+    if (transfer.blStopped) {
+        return Fail(ZELO::CRED_REQ_ERR_STOPPED, request, "the program ended it", __LINE__);
+    }
+    ReplySink &sink = transfer.sink;
+    if (sink.Error() != ZELO::CRED_REQ_ERR_NONE ||
+        (result == CURLE_OK && !sink.Finish(reply.status))) {
+        return Fail(sink.Error(), request, sink.Reason().c_str(), __LINE__);
+    }
+    if (result != CURLE_OK) {
+        return Fail(ZELO::CRED_REQ_ERR_NETWORK, request,
+                    reason[0] != '\0' ? reason.data() : curl_easy_strerror(result), __LINE__);
+    }
+    reply.strBody.swap(sink.Body());
+    return ZELO::CRED_REQ_ERR_NONE;
 }
 
 }  // namespace
 
-bool Perform(const HttpRequest &request, HttpReply &reply) {
+int Perform(const HttpRequest &request, HttpReply &reply) {
     const Borrowed connection;
     CURL *const pEasy = connection.Easy();
     std::unique_ptr<curl_slist, FreeList> pHeaders;
     if (pEasy == nullptr || !BuildHeaders(request, pHeaders)) {
-        return Fail(YLIBC_ERR_OUT_OF_MEMORY, request, "out of memory", __LINE__);
+        return Fail(ZELO::CRED_REQ_ERR_MEMORY, request, "out of memory", __LINE__);
     }
     SetTransport(pEasy, connection.Get());
     if (!SetWay(pEasy, request.blRelay)) {
-        return Fail(YLIBC_ERR_NETWORK, request,
+        return Fail(ZELO::CRED_REQ_ERR_NETWORK, request,
                     "no relay: set farlink_relay=\"host:port\" in /etc/zeloinfo.conf", __LINE__);
     }
     SetRequest(pEasy, request, pHeaders.get());
-
-    std::string strBody;
-    std::array<char, CURL_ERROR_SIZE> reason = {};
-    curl_easy_setopt(pEasy, CURLOPT_WRITEFUNCTION, TakeBody);
-    curl_easy_setopt(pEasy, CURLOPT_WRITEDATA, &strBody);
-    curl_easy_setopt(pEasy, CURLOPT_ERRORBUFFER, reason.data());
-    const CURLcode result = curl_easy_perform(pEasy);
-    if (result == CURLE_WRITE_ERROR) {
-        return Fail(YLIBC_ERR_REPLY, request, "the reply is larger than 16 MiB", __LINE__);
-    }
-    if (result != CURLE_OK) {
-        return Fail(YLIBC_ERR_NETWORK, request,
-                    reason[0] != '\0' ? reason.data() : curl_easy_strerror(result), __LINE__);
-    }
-    curl_easy_getinfo(pEasy, CURLINFO_RESPONSE_CODE, &reply.status);
-    reply.strBody.swap(strBody);
-    return true;
+    return Transact(request, pEasy, reply);
 }
 
 std::string BuildUrl(const std::string &strScheme, const std::string &strHost, long port,
                      const std::string &strPath, const std::string &strQuery) {
-    if (port < 1 || port > 65535) {
+    // libcurl would take a host with control characters, and so would a log line.
+    const bool blPlain = std::none_of(strHost.begin(), strHost.end(),
+                                      [](unsigned char c) { return c <= ' ' || c == 0x7F; });
+    if (port < 1 || port > 65535 || !blPlain) {
         return {};
     }
     const bool blBareIPv6 = strHost.find(':') != std::string::npos && strHost.front() != '[';

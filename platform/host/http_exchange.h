@@ -1,15 +1,17 @@
 // One HTTP exchange over the connections that this process keeps open.
 //
 // What the transport promises: certificate and host name are verified against the system's and the
-// appliance's own authorities; only http and https; no redirect; connecting, stalling and the
-// body's size are bounded; connections and TLS sessions are used again, but never by a child
-// process.
+// appliance's own authorities; only http and https; no redirect; connecting, stalling and a body in
+// memory are bounded; connections and TLS sessions are used again, but never by a child process.
 
 #ifndef ZELO_HOST_HTTP_EXCHANGE_H
 #define ZELO_HOST_HTTP_EXCHANGE_H
 
+#include <cstdio>
 #include <string>
 #include <vector>
+
+#include "../web_api_request.h"
 
 namespace host {
 
@@ -21,6 +23,12 @@ struct HttpRequest {
     int timeout_s = 0;             // for the whole exchange; 0: the transport's own
     std::string strBody;
     std::vector<std::string> headers;  // "Name: value"
+
+    // Where the body goes instead of HttpReply, and who watches it going there.
+    std::FILE *pStream = nullptr;
+    ZELO::CredRequest::RespWriteCallback pfnWrite = nullptr;
+    ZELO::CredRequestUtil::ProgressObserver pfnObserver = nullptr;
+    void *pObserverContext = nullptr;
 };
 
 struct HttpReply {
@@ -28,9 +36,12 @@ struct HttpReply {
     std::string strBody;
 };
 
-// Performs the exchange. Returns true when a whole reply arrived, whatever its status. Otherwise
-// sets the last error, writes one log line with the URL and the reason, and leaves reply as it was.
-bool Perform(const HttpRequest &request, HttpReply &reply);
+// Performs the exchange. Returns CRED_REQ_ERR_NONE when a whole reply arrived, whatever its status
+// (with a stream: one of 2xx, and written whole). Otherwise returns another value of
+// CRED_REQ_ERROR, sets the last error and writes one log line with the URL and the reason; reply
+// then holds the status as far as there was one. That the caller's copy is current is worth no log
+// line.
+int Perform(const HttpRequest &request, HttpReply &reply);
 
 // Builds an URL; the host may be a name, an IPv4 or an IPv6 address, the query empty or
 // "name=value" with a value that is encoded here. Empty when a part does not fit into an URL: a

@@ -3,6 +3,7 @@
 
 #include "../serial_number.h"
 
+#include <cerrno>
 #include <fstream>
 #include <new>
 #include <string>
@@ -30,7 +31,11 @@ int YLIBGetCustomSerialNumber(char *szSerial, int cbSerial) {
         return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
     }
     try {
+        errno = 0;
         std::ifstream file(kCustomFile);
+        if (!file && errno != ENOENT) {
+            return HOST_FAIL(YLIBC_ERR_FILE);
+        }
         return host::CopyText(file ? FirstLine(file) : std::string(), szSerial, cbSerial);
     } catch (const std::bad_alloc &) {
         return HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);

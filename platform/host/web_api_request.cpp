@@ -2,9 +2,13 @@
 
 #include "../web_api_request.h"
 
+#include <pthread.h>
+
+#include <algorithm>
 #include <map>
 #include <mutex>
 #include <new>
+#include <utility>
 
 #include "credential_record.h"
 #include "http_exchange.h"
@@ -49,9 +53,21 @@ bool ReadServer(const ZELO_CRED *pCred, Server &server) {
     return !server.strHost.empty();
 }
 
-// The paths that this process has learnt, by server and API.
+// The paths that this process has learnt, by server and API. A fork waits for its mutex, so that
+// the child finds it free.
 class PathCache {
   public:
+    PathCache() {
+        pthread_atfork([] { Paths().m_mutex.lock(); }, [] { Paths().m_mutex.unlock(); },
+                       [] { Paths().m_mutex.unlock(); });
+    }
+
+    // Never destroyed, so that it serves until the very end of a process.
+    static PathCache &Paths() {
+        static auto *const pPaths = new PathCache;
+        return *pPaths;
+    }
+
     std::string Find(const std::string &strKey) {
         const std::lock_guard<std::mutex> lock(m_mutex);
         const auto at = m_paths.find(strKey);
@@ -75,8 +91,18 @@ class PathCache {
 };
 
 PathCache &Paths() {
-    static auto *const pPaths = new PathCache;
-    return *pPaths;
+    return PathCache::Paths();
+}
+
+// Runs the body; short memory becomes the failure value.
+template <typename Result, typename Body>
+Result NoThrow(Result failure, Body &&body) {
+    try {
+        return std::forward<Body>(body)();
+    } catch (const std::bad_alloc &) {
+        HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
+        return failure;
+    }
 }
 
 // The path comes from a server and becomes part of an URL.
@@ -92,6 +118,19 @@ bool IsPath(const std::string &strPath) {
     return true;
 }
 
+// A token becomes part of a header line: it must not end it, or begin another one.
+bool IsHeaderValue(const std::string &strToken) {
+    return std::all_of(strToken.begin(), strToken.end(),
+                       [](unsigned char c) { return c > ' ' && c != 0x7F; });
+}
+
+struct Observer {
+    CredRequestUtil::ProgressObserver pfn = nullptr;
+    void *pContext = nullptr;
+};
+
+thread_local Observer t_observer;
+
 std::string Discover(const Server &server, const std::string &api) {
     host::HttpRequest request;
     request.strUrl =
@@ -102,7 +141,7 @@ std::string Discover(const Server &server, const std::string &api) {
         HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
         return {};
     }
-    if (!host::Perform(request, reply)) {
+    if (host::Perform(request, reply) != CRED_REQ_ERR_NONE) {
         return {};
     }
     Json::Value envelope;
@@ -132,7 +171,50 @@ struct CredRequest::Impl {
     std::string strMethod;
     Json::Value params{Json::objectValue};
     _tag_CRED_REQ_CRYPTO encryptMode = CRED_REQ_CRYPTO_NONE;
+    std::string strAccessToken;
+    std::string strCsrfToken;
+    std::FILE *pStream = nullptr;
+    RespWriteCallback pfnWrite = nullptr;
+    int error = CRED_REQ_ERR_NONE;
     std::string strResponse;
+
+    bool SetTokens(const ZELO_CRED_SESS &sess) {
+        strAccessToken = sess.accessToken.value_or("");
+        strCsrfToken = sess.csrfToken.value_or("");
+        return IsHeaderValue(strAccessToken) && IsHeaderValue(strCsrfToken);
+    }
+
+    bool SetUrl(const ZELO_CRED *pCred, const std::string &api, int ver,
+                const std::string &method) {
+        Server server;
+        if (!ReadServer(pCred, server) || api.empty() || method.empty()) {
+            HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
+            return false;
+        }
+        strPathKey = server.Key(api);
+        std::string strPath = Paths().Find(strPathKey);
+        if (strPath.empty()) {
+            strPath = Discover(server, api);
+        }
+        if (strPath.empty()) {
+            return false;
+        }
+        strUrl = host::BuildUrl(server.strScheme, server.strHost, server.port, strPath, "");
+        blRelay = server.blRelay;
+        strApi = api;
+        version = ver;
+        strMethod = method;
+        return !strUrl.empty();
+    }
+
+    void AddHeaders(std::vector<std::string> &headers) const {
+        if (!strAccessToken.empty()) {
+            headers.push_back("Authorization: Bearer " + strAccessToken);
+        }
+        if (!strCsrfToken.empty()) {
+            headers.push_back("X-QRM-CSRF-Token: " + strCsrfToken);
+        }
+    }
 
     bool BuildBody(std::string &strBody) const {
         Json::Value call(Json::objectValue);
@@ -141,6 +223,33 @@ struct CredRequest::Impl {
         call["method"] = strMethod;
         call["params"] = params;
         return json_text::ToString(call, strBody);
+    }
+
+    // Returns a value of CRED_REQ_ERROR.
+    int Exchange(bool blKeepConnection, int timeout_s) {
+        strResponse.clear();
+        host::HttpRequest request;
+        request.strUrl = strUrl;
+        request.blRelay = blRelay;
+        request.blPost = true;
+        request.blKeepConnection = blKeepConnection;
+        request.timeout_s = timeout_s;
+        request.pStream = pStream;
+        request.pfnWrite = pfnWrite;
+        request.pfnObserver = t_observer.pfn;
+        request.pObserverContext = t_observer.pContext;
+        AddHeaders(request.headers);
+        if (strUrl.empty() || !BuildBody(request.strBody)) {
+            HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
+            return CRED_REQ_ERR_ARGUMENT;
+        }
+        host::HttpReply reply;
+        const int result = host::Perform(request, reply);
+        if (reply.status == kStatusNotFound) {
+            Paths().Forget(strPathKey);
+        }
+        strResponse.swap(reply.strBody);
+        return result;
     }
 };
 
@@ -155,27 +264,48 @@ std::string CredRequestUtil::GetWebAPIPath(const ZELO_CRED *pCred, const std::st
 
 bool CredRequestUtil::SetWebAPIURL(const ZELO_CRED *pCred, const std::string &api, int ver,
                                    const std::string &method, CredRequest *pRequest) {
-    Server server;
-    if (!ReadServer(pCred, server) || api.empty() || method.empty() || pRequest == nullptr ||
-        pRequest->m_pImpl == nullptr) {
+    if (pRequest == nullptr || pRequest->m_pImpl == nullptr) {
         HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
         return false;
     }
-    std::string strPath = Paths().Find(server.Key(api));
-    if (strPath.empty()) {
-        strPath = Discover(server, api);
+    return NoThrow(false, [&] { return pRequest->m_pImpl->SetUrl(pCred, api, ver, method); });
+}
+
+void CredRequestUtil::SetProgressObserver(ProgressObserver pfnObserver, void *pContext) {
+    t_observer = {pfnObserver, pContext};
+}
+
+CredRequest *CredRequest::CreateWebAPIRequest(const ZELO_CRED *pCred, const ZELO_CRED_SESS *pSess,
+                                              const std::string &api, int ver,
+                                              const std::string &method,
+                                              const Json::Value &params) {
+    if (pSess == nullptr || !(params.isObject() || params.isNull())) {
+        HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
+        return nullptr;
     }
-    if (strPath.empty()) {
-        return false;
+    return NoThrow<CredRequest *>(nullptr, [&]() -> CredRequest * {
+        auto pRequest = std::make_unique<CredRequest>();
+        if (pRequest->m_pImpl == nullptr || !pRequest->m_pImpl->SetTokens(*pSess)) {
+            HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
+            return nullptr;
+        }
+        if (!CredRequestUtil::SetWebAPIURL(pCred, api, ver, method, pRequest.get()) ||
+            !(params.isNull() || pRequest->AddPostParam(params))) {
+            return nullptr;
+        }
+        return pRequest.release();
+    });
+}
+
+CredRequest *CredRequest::CreateWebAPIRequest(long id, const std::string &api, int ver,
+                                              const std::string &method,
+                                              const Json::Value &params) {
+    ZELO_CRED cred;
+    ZELO_CRED_SESS sess;
+    if (id < 0 || ZELOCredLoad(id, &cred) < 0 || ZELOCredSessLoad(id, &sess) < 0) {
+        return nullptr;
     }
-    CredRequest::Impl &impl = *pRequest->m_pImpl;
-    impl.strUrl = host::BuildUrl(server.strScheme, server.strHost, server.port, strPath, "");
-    impl.strPathKey = server.Key(api);
-    impl.blRelay = server.blRelay;
-    impl.strApi = api;
-    impl.version = ver;
-    impl.strMethod = method;
-    return !impl.strUrl.empty();
+    return CreateWebAPIRequest(&cred, &sess, api, ver, method, params);
 }
 
 // A request whose memory is short from the start is one without an Impl: it refuses everything.
@@ -194,10 +324,12 @@ bool CredRequest::AddPostParam(const Json::Value &params) {
         HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
         return false;
     }
-    for (auto member = params.begin(); member != params.end(); ++member) {
-        m_pImpl->params[member.name()] = *member;
-    }
-    return true;
+    return NoThrow(false, [&] {
+        for (auto member = params.begin(); member != params.end(); ++member) {
+            m_pImpl->params[member.name()] = *member;
+        }
+        return true;
+    });
 }
 
 bool CredRequest::SetEncryptMode(_tag_CRED_REQ_CRYPTO mode) {
@@ -210,30 +342,28 @@ bool CredRequest::SetEncryptMode(_tag_CRED_REQ_CRYPTO mode) {
 }
 
 bool CredRequest::Process(bool blKeepConnection, int timeout_s) {
-    if (m_pImpl == nullptr || m_pImpl->strUrl.empty()) {
+    if (m_pImpl == nullptr) {
+        HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
+        return false;
+    }
+    m_pImpl->error = NoThrow<int>(CRED_REQ_ERR_MEMORY, [&]() -> int {
+        return m_pImpl->Exchange(blKeepConnection, timeout_s);
+    });
+    return m_pImpl->error == CRED_REQ_ERR_NONE;
+}
+
+bool CredRequest::SetRespStream(std::FILE *pStream, RespWriteCallback pfnWrite) {
+    if (m_pImpl == nullptr || pStream == nullptr) {
         HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
         return false;
     }
-    m_pImpl->strResponse.clear();
-    host::HttpRequest request;
-    request.strUrl = m_pImpl->strUrl;
-    request.blRelay = m_pImpl->blRelay;
-    request.blPost = true;
-    request.blKeepConnection = blKeepConnection;
-    request.timeout_s = timeout_s;
-    if (!m_pImpl->BuildBody(request.strBody)) {
-        HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-        return false;
-    }
-    host::HttpReply reply;
-    if (!host::Perform(request, reply)) {
-        return false;
-    }
-    if (reply.status == kStatusNotFound) {
-        Paths().Forget(m_pImpl->strPathKey);
-    }
-    m_pImpl->strResponse.swap(reply.strBody);
+    m_pImpl->pStream = pStream;
+    m_pImpl->pfnWrite = pfnWrite;
     return true;
+}
+
+int CredRequest::GetError() const {
+    return m_pImpl == nullptr ? CRED_REQ_ERR_MEMORY : m_pImpl->error;
 }
 
 std::string CredRequest::GetResponse() const {
