@@ -4,7 +4,10 @@
 // Both containers grow as needed and hold copies of what is put into them; what they hand out
 // belongs to them and lives until the next change or release. Putting something in may move the
 // record, so these operations take the address of the caller's own pointer and keep it up to date.
-// A container belongs to one thread at a time. A failure sets the last error (last_error.h).
+// A container belongs to one thread at a time.
+//
+// A failure sets the last error (last_error.h). A null text or container is a failure, and so is an
+// empty delimiter, unless a declaration says otherwise.
 
 #ifndef ZELO_PLATFORM_TEXT_CONTAINERS_H
 #define ZELO_PLATFORM_TEXT_CONTAINERS_H
@@ -31,13 +34,14 @@ extern "C" {
 // --- Lists --------------------------------------------------------------------------------------
 
 // A new empty list with room for about cbInitial bytes; it grows past them. Null when memory is
-// short. The caller owns it and releases it with YLIBCSzListFree.
+// short or cbInitial is negative. The caller owns it and releases it with YLIBCSzListFree.
 ZELO_PLATFORM_API YLIBSZLIST *YLIBCSzListAlloc(int cbInitial);
 
 // Releases a list; null is no error.
 ZELO_PLATFORM_API void YLIBCSzListFree(YLIBSZLIST *pslList);
 
-// Appends a copy of the text. Returns its index, or a negative value on failure.
+// Appends a copy of the text. Returns its index, or a negative value on failure, with the list as
+// it was.
 ZELO_PLATFORM_API int YLIBCSzListPush(YLIBSZLIST **ppslList, const char *szText);
 
 // The text at an index from 0 to nItem - 1; null for any other index or a null list.
@@ -46,7 +50,7 @@ ZELO_PLATFORM_API const char *YLIBCSzListGet(const YLIBSZLIST *pslList, int inde
 // --- Hashes -------------------------------------------------------------------------------------
 
 // A new empty hash with room for about cbInitial bytes; it grows past them. Null when memory is
-// short. The caller owns it and releases it with YLIBCSzHashFree.
+// short or cbInitial is negative. The caller owns it and releases it with YLIBCSzHashFree.
 ZELO_PLATFORM_API YLIBSZHASH *YLIBCSzHashAlloc(int cbInitial);
 
 // Releases a hash; null is no error.
@@ -76,11 +80,12 @@ ZELO_PLATFORM_API int YLIBCStrTok(const char *szText, const char *szDelimiter,
 
 // Takes the next piece from a text: returns *pszText, ended in place at the first szDelimiter, and
 // moves *pszText past that delimiter. Without a delimiter it returns the whole rest, and *pszText
-// becomes null. Returns null when *pszText is null.
+// becomes null. Returns null when *pszText is null, which is no failure.
 ZELO_PLATFORM_API char *YLIBCStrTokIndex(char **pszText, const char *szDelimiter);
 
 // Writes szText without the characters of szSet at both ends to szOut, which may be szText itself
-// and otherwise has room for all of it. Returns the length written, 0 when nothing is left.
+// and otherwise has room for all of it. Returns the length written, 0 when nothing is left, and a
+// negative value, with szOut as it was, on failure.
 ZELO_PLATFORM_API int YLIBCStrTrim(const char *szText, char *szOut, const char *szSet);
 
 // Replaces every occurrence of szOld in szText, a buffer of cbText bytes, by szNew: one pass from
@@ -88,8 +93,8 @@ ZELO_PLATFORM_API int YLIBCStrTrim(const char *szText, char *szOut, const char *
 // changes nothing; the text never goes past cbText - 1 bytes.
 //
 // Returns the number of occurrences replaced, 0 when there is none (an empty szOld has none), and a
-// negative value when the result does not fit or an argument is unusable. flags is reserved:
-// callers pass 0, a port ignores it.
+// negative value when the result does not fit or szText does not end within cbText bytes. flags is
+// reserved: callers pass 0, a port ignores it.
 ZELO_PLATFORM_API int YLIBCStrReplace(char *szText, const char *szOld, const char *szNew, int flags,
                                       int cbText);
 }

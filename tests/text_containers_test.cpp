@@ -1,0 +1,185 @@
+// String lists, string hashes and text helpers.
+
+#include <gtest/gtest.h>
+
+#include <cstring>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "last_error.h"
+#include "text_containers.h"
+
+namespace {
+
+using List = std::unique_ptr<YLIBSZLIST, decltype(&YLIBCSzListFree)>;
+using Hash = std::unique_ptr<YLIBSZHASH, decltype(&YLIBCSzHashFree)>;
+
+std::vector<std::string> Texts(const YLIBSZLIST *pslList) {
+    std::vector<std::string> texts;
+    texts.reserve(static_cast<std::size_t>(pslList->nItem));
+    for (int i = 0; i < pslList->nItem; ++i) {
+        texts.emplace_back(YLIBCSzListGet(pslList, i));
+    }
+    return texts;
+}
+
+TEST(SzList, GrowsPastItsInitialSize) {
+    YLIBSZLIST *pslList = YLIBCSzListAlloc(16);
+    for (int i = 0; i < 1000; ++i) {
+        ASSERT_EQ(YLIBCSzListPush(&pslList, std::to_string(i).c_str()), i);
+    }
+    const List owner(pslList, YLIBCSzListFree);
+    EXPECT_EQ(pslList->nItem, 1000);
+    EXPECT_STREQ(YLIBCSzListGet(pslList, 0), "0");
+    EXPECT_STREQ(YLIBCSzListGet(pslList, 999), "999");
+    EXPECT_EQ(YLIBCSzListGet(pslList, 1000), nullptr);
+    EXPECT_EQ(YLIBCSzListGet(pslList, -1), nullptr);
+}
+
+TEST(SzHash, KeepsTheOrderOfItsKeys) {
+    YLIBSZHASH *pHash = YLIBCSzHashAlloc(0);
+    for (int i = 999; i >= 0; --i) {
+        ASSERT_GE(YLIBCSzHashSetValue(&pHash, std::to_string(i).c_str(), ""), 0);
+    }
+    ASSERT_GE(YLIBCSzHashSetValue(&pHash, "998", "new"), 0);
+    const Hash owner(pHash, YLIBCSzHashFree);
+    EXPECT_EQ(pHash->nItem, 1000);
+    EXPECT_STREQ(YLIBCSzHashKeyAt(pHash, 1), "998");
+    EXPECT_STREQ(YLIBCSzHashValueAt(pHash, 1), "new");
+    EXPECT_STREQ(YLIBCSzHashKeyAt(pHash, 999), "0");
+    EXPECT_STREQ(YLIBCSzHashGetValue(pHash, "998"), "new");
+    EXPECT_STREQ(YLIBCSzHashGetValue(pHash, "0"), "");
+    EXPECT_EQ(YLIBCSzHashGetValue(pHash, "none"), nullptr);
+    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_NOT_FOUND));
+    EXPECT_EQ(YLIBCSzHashKeyAt(pHash, 1000), nullptr);
+    EXPECT_EQ(YLIBCSzHashValueAt(pHash, -1), nullptr);
+}
+
+TEST(Text, SplitsAtTheWholeDelimiter) {
+    const struct {
+        const char *szText;
+        const char *szDelimiter;
+        std::vector<std::string> pieces;
+    } rows[] = {
+        {"enu,ger", ",", {"enu", "ger"}}, {",a,,b,", ",", {"", "a", "", "b", ""}},
+        {"a::b:c", "::", {"a", "b:c"}},   {"no", ",", {"no"}},
+        {":::", "::", {"", ":"}},         {"", ",", {}},
+    };
+    for (const auto &row : rows) {
+        YLIBSZLIST *pslList = YLIBCSzListAlloc(512);
+        EXPECT_EQ(YLIBCStrTok(row.szText, row.szDelimiter, &pslList),
+                  static_cast<int>(row.pieces.size()));
+        EXPECT_EQ(Texts(pslList), row.pieces) << row.szText;
+        YLIBCSzListFree(pslList);
+
+        std::string strText = row.szText;
+        char *szRest = strText.data();
+        const std::vector<std::string> one = {""};
+        for (const std::string &strPiece : row.pieces.empty() ? one : row.pieces) {
+            EXPECT_EQ(YLIBCStrTokIndex(&szRest, row.szDelimiter), strPiece) << row.szText;
+        }
+        EXPECT_EQ(szRest, nullptr);
+        EXPECT_EQ(YLIBCStrTokIndex(&szRest, row.szDelimiter), nullptr);
+    }
+}
+
+TEST(Text, TrimsBothEnds) {
+    const struct {
+        const char *szText;
+        const char *szSet;
+        const char *szTrimmed;
+    } rows[] = {{" \ta b\n ", " \t\n", "a b"}, {"--", "-", ""}, {"", " ", ""}, {" a ", "", " a "}};
+    for (const auto &row : rows) {
+        char szOut[16] = "before";
+        char szSame[16] = "";
+        std::string(row.szText).copy(szSame, sizeof(szSame) - 1);
+        const int cb = static_cast<int>(std::string(row.szTrimmed).size());
+        EXPECT_EQ(YLIBCStrTrim(row.szText, szOut, row.szSet), cb);
+        EXPECT_STREQ(szOut, row.szTrimmed);
+        EXPECT_EQ(YLIBCStrTrim(szSame, szSame, row.szSet), cb);
+        EXPECT_STREQ(szSame, row.szTrimmed);
+    }
+}
+
+TEST(Text, ReplacesEveryOccurrenceOrNone) {
+    const std::string strMany(4094, 'a');
+    const struct {
+        std::string strText;
+        std::string strOld;
+        std::string strNew;
+        int cbText;
+        int result;
+        std::string strResult;
+    } rows[] = {
+        {"{0} and {0}", "{0}", "x", 12, 2, "x and x"},
+        {"aaa", "a", "aa", 7, 3, "aaaaaa"},
+        {"aaa", "a", "aa", 6, -1, "aaa"},
+        {"axa", "a", "bbb", 6, -1, "axa"},
+        {"aaa", "aa", "b", 4, 1, "ba"},
+        {"aaa", "a", "", 4, 3, ""},
+        {"abc", "", "x", 4, 0, "abc"},
+        {"abc", "abcd", "x", 4, 0, "abc"},
+        {"abc", "x", "y", 3, -1, "abc"},
+        {strMany, "a", "b", 4096, 4094, std::string(4094, 'b')},
+        {strMany + "c", "aa", "bb", 4096, 2047, std::string(4094, 'b') + "c"},
+        {strMany + "c", "c", "dd", 4096, -1, strMany + "c"},
+    };
+    for (const auto &row : rows) {
+        const auto cbText = static_cast<std::size_t>(row.cbText);
+        std::vector<char> buffer(cbText);  // of exactly this size: nothing past it is touched
+        row.strText.copy(buffer.data(), cbText);
+        EXPECT_EQ(
+            YLIBCStrReplace(buffer.data(), row.strOld.c_str(), row.strNew.c_str(), 0, row.cbText),
+            row.result);
+        EXPECT_EQ(std::string(buffer.data(), strnlen(buffer.data(), cbText)), row.strResult)
+            << row.strOld << ' ' << row.strNew;
+    }
+}
+
+TEST(TextContainers, NullAndOddArgumentsFail) {
+    List list(YLIBCSzListAlloc(0), YLIBCSzListFree);
+    Hash hash(YLIBCSzHashAlloc(0), YLIBCSzHashFree);
+    YLIBSZLIST *pslList = list.get();
+    YLIBSZLIST *pslNull = nullptr;
+    YLIBSZHASH *pHash = hash.get();
+    YLIBSZHASH *pNull = nullptr;
+    char sz[4] = "abc";
+    char *szRest = sz;
+    for (const bool blFailed : {YLIBCSzListAlloc(-1) == nullptr,
+                                YLIBCSzHashAlloc(-1) == nullptr,
+                                YLIBCSzListPush(nullptr, "a") < 0,
+                                YLIBCSzListPush(&pslNull, "a") < 0,
+                                YLIBCSzListPush(&pslList, nullptr) < 0,
+                                YLIBCSzListGet(nullptr, 0) == nullptr,
+                                YLIBCSzHashSetValue(nullptr, "a", "a") < 0,
+                                YLIBCSzHashSetValue(&pNull, "a", "a") < 0,
+                                YLIBCSzHashSetValue(&pHash, nullptr, "a") < 0,
+                                YLIBCSzHashSetValue(&pHash, "a", nullptr) < 0,
+                                YLIBCSzHashGetValue(nullptr, "a") == nullptr,
+                                YLIBCSzHashGetValue(pHash, nullptr) == nullptr,
+                                YLIBCSzHashKeyAt(nullptr, 0) == nullptr,
+                                YLIBCSzHashValueAt(pHash, 0) == nullptr,
+                                YLIBCStrTok(nullptr, ",", &pslList) == -1,
+                                YLIBCStrTok("a", "", &pslList) == -1,
+                                YLIBCStrTok("a", ",", &pslNull) == -1,
+                                YLIBCStrTokIndex(nullptr, ",") == nullptr,
+                                YLIBCStrTokIndex(&szRest, "") == nullptr,
+                                YLIBCStrTrim(nullptr, sz, " ") < 0,
+                                YLIBCStrTrim("a", nullptr, " ") < 0,
+                                YLIBCStrTrim("a", sz, nullptr) < 0,
+                                YLIBCStrReplace(nullptr, "a", "a", 0, 4) < 0,
+                                YLIBCStrReplace(sz, nullptr, "a", 0, 4) < 0,
+                                YLIBCStrReplace(sz, "a", nullptr, 0, 4) < 0,
+                                YLIBCStrReplace(sz, "a", "a", 0, 0) < 0}) {
+        EXPECT_TRUE(blFailed);
+    }
+    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_INVALID_ARGUMENT));
+    EXPECT_EQ(list->nItem + hash->nItem, 0);
+    EXPECT_EQ(szRest, sz);
+    EXPECT_STREQ(sz, "abc");
+    YLIBCSzListFree(nullptr);
+    YLIBCSzHashFree(nullptr);
+}
+
+}  // namespace
