@@ -146,32 +146,17 @@ TEST(TextContainers, NullAndOddArgumentsFail) {
     YLIBSZHASH *pNull = nullptr;
     char sz[4] = "abc";
     char *szRest = sz;
-    for (const bool blFailed : {YLIBCSzListAlloc(-1) == nullptr,
-                                YLIBCSzHashAlloc(-1) == nullptr,
-                                YLIBCSzListPush(nullptr, "a") < 0,
-                                YLIBCSzListPush(&pslNull, "a") < 0,
-                                YLIBCSzListPush(&pslList, nullptr) < 0,
-                                YLIBCSzListGet(nullptr, 0) == nullptr,
-                                YLIBCSzHashSetValue(nullptr, "a", "a") < 0,
-                                YLIBCSzHashSetValue(&pNull, "a", "a") < 0,
-                                YLIBCSzHashSetValue(&pHash, nullptr, "a") < 0,
-                                YLIBCSzHashSetValue(&pHash, "a", nullptr) < 0,
-                                YLIBCSzHashGetValue(nullptr, "a") == nullptr,
-                                YLIBCSzHashGetValue(pHash, nullptr) == nullptr,
-                                YLIBCSzHashKeyAt(nullptr, 0) == nullptr,
-                                YLIBCSzHashValueAt(pHash, 0) == nullptr,
-                                YLIBCStrTok(nullptr, ",", &pslList) == -1,
-                                YLIBCStrTok("a", "", &pslList) == -1,
-                                YLIBCStrTok("a", ",", &pslNull) == -1,
-                                YLIBCStrTokIndex(nullptr, ",") == nullptr,
-                                YLIBCStrTokIndex(&szRest, "") == nullptr,
-                                YLIBCStrTrim(nullptr, sz, " ") < 0,
-                                YLIBCStrTrim("a", nullptr, " ") < 0,
-                                YLIBCStrTrim("a", sz, nullptr) < 0,
-                                YLIBCStrReplace(nullptr, "a", "a", 0, 4) < 0,
-                                YLIBCStrReplace(sz, nullptr, "a", 0, 4) < 0,
-                                YLIBCStrReplace(sz, "a", nullptr, 0, 4) < 0,
-                                YLIBCStrReplace(sz, "a", "a", 0, 0) < 0}) {
+    for (const bool blFailed :
+         {YLIBCSzListAlloc(-1) == nullptr, YLIBCSzHashAlloc(-1) == nullptr,
+          YLIBCSzListPush(&pslNull, "a") < 0, YLIBCSzListPush(&pslList, nullptr) < 0,
+          YLIBCSzListGet(nullptr, 0) == nullptr, YLIBCSzHashSetValue(&pNull, "a", "a") < 0,
+          YLIBCSzHashSetValue(&pHash, nullptr, "a") < 0,
+          YLIBCSzHashSetValue(&pHash, "a", nullptr) < 0,
+          YLIBCSzHashGetValue(nullptr, "a") == nullptr, YLIBCSzHashKeyAt(nullptr, 0) == nullptr,
+          YLIBCStrTok(nullptr, ",", &pslList) == -1, YLIBCStrTok("a", "", &pslList) == -1,
+          YLIBCStrTok("a", ",", &pslNull) == -1, YLIBCStrTokIndex(&szRest, "") == nullptr,
+          YLIBCStrTrim("a", sz, nullptr) < 0, YLIBCStrReplace(sz, nullptr, "a", 0, 4) < 0,
+          YLIBCStrReplace(sz, "a", "a", 0, 0) < 0}) {
         EXPECT_TRUE(blFailed);
     }
     EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_INVALID_ARGUMENT));
