@@ -1,9 +1,14 @@
-// Key-value files, serial numbers, and the facts that the library makes of them.
+// Key-value files, serial numbers, the host name, and the facts that the library makes of them.
 
 #include <gtest/gtest.h>
+#include <sched.h>
+#include <sys/wait.h>
+#include <unistd.h>
 
+#include <cstring>
 #include <fstream>
 
+#include "host_name.h"
 #include "key_value_file.h"
 #include "last_error.h"
 #include "qrm_client_description.h"
@@ -99,6 +104,29 @@ TEST(SerialNumber, TheCustomOneComesFirst) {
         EXPECT_EQ(client_description::ReadSerialNumber(strSerial), row.blRead);
         EXPECT_EQ(strSerial, row.szSerial);
     }
+}
+
+TEST(HostName, IsCutToItsBuffer) {
+    const pid_t pid = fork();
+    if (pid == 0) {
+        // A machine of the child's own, whose name may be set.
+        const std::string strName(64, 'n');
+        if (unshare(CLONE_NEWUSER | CLONE_NEWUTS) != 0 ||
+            sethostname(strName.data(), strName.size()) != 0) {
+            _exit(2);
+        }
+        char sz[ZELO_LNX_HOSTNAME_SIZE + 1];
+        std::memset(sz, 'x', sizeof(sz));
+        const bool blRead = ZELOLnxGetHostname(sz) >= 0;
+        _exit(blRead && sz[64] == 'x' && sz == strName.substr(1) ? 0 : 1);
+    }
+    int status = -1;
+    waitpid(pid, &status, 0);
+    EXPECT_LT(ZELOLnxGetHostname(nullptr), 0);
+    if (WEXITSTATUS(status) == 2) {
+        GTEST_SKIP() << "no host name can be set here";
+    }
+    EXPECT_EQ(status, 0);
 }
 
 TEST(ClientDescription, AnUnreadableFactChangesNothing) {
