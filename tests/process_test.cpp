@@ -1,0 +1,235 @@
+// Running programs, whatever the caller does with signals, children and descriptors.
+
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <poll.h>
+#include <sys/syscall.h>
+#include <sys/time.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <atomic>
+#include <chrono>
+#include <csignal>
+#include <fstream>
+#include <sstream>
+#include <thread>
+
+#include "../platform/host/program.h"
+#include "last_error.h"
+#include "process.h"
+
+namespace {
+
+constexpr const char *kOut = "/tmp/out";
+
+void Write(const char *szPath, const std::string &strText, int mode = 0755) {
+    std::ofstream(szPath) << strText;
+    chmod(szPath, static_cast<mode_t>(mode));
+}
+
+std::string Output() {
+    std::ostringstream text;
+    text << std::ifstream(kOut).rdbuf();
+    return text.str();
+}
+
+int Shell(const char *szScript) {
+    return YLIBCExec("/bin/sh", "-c", szScript, nullptr, nullptr);
+}
+
+// Waits until a process has ended, for a bounded time.
+bool Ends(int pid) {
+    pollfd end = {static_cast<int>(syscall(SYS_pidfd_open, pid, 0)), POLLIN, 0};
+    const bool blEnds = end.fd < 0 ? errno == ESRCH : poll(&end, 1, 10000) == 1;
+    close(end.fd);
+    return blEnds;
+}
+
+void Handle(int signal, void (*pfnHandler)(int)) {
+    struct sigaction action = {};
+    action.sa_handler = pfnHandler;
+    sigaction(signal, &action, nullptr);
+}
+
+// Whether the calling thread holds a signal back.
+bool IsBlocked(int signal) {
+    sigset_t mask;
+    pthread_sigmask(SIG_SETMASK, nullptr, &mask);
+    return sigismember(&mask, signal) == 1;
+}
+
+// Runs programs in several threads at once; true when each gave its result, and the caller is as it
+// was: with its own signal mask and without a child, be it an ended one.
+bool EveryProgramGivesItsEnd() {
+    const struct {
+        const char *szScript;
+        int result;
+    } rows[] = {{"exit 0", 0},       {"exit 1", 1},       {"exit 3", 3},
+                {"exit 255", 255},   {"kill -9 $$", 137}, {"kill -TERM $$; exit 7", 143},
+                {"sleep 0.05; :", 0}};
+    const bool blBlocked = IsBlocked(SIGTERM);
+    std::atomic<bool> blAll = true;
+    const auto runAll = [&] {
+        for (const auto &row : rows) {
+            if (Shell(row.szScript) != row.result) {
+                blAll = false;
+            }
+        }
+    };
+    std::thread second(runAll);
+    std::thread third(runAll);
+    runAll();
+    second.join();
+    third.join();
+    return blAll && IsBlocked(SIGTERM) == blBlocked && waitpid(-1, nullptr, __WALL) == -1 &&
+           errno == ECHILD;
+}
+
+class Exec : public testing::Test {
+  protected:
+    void SetUp() override {
+        std::remove(kOut);
+        Write("/etc/zeloinfo.conf", "exec_timeout=\"10\"\n");
+    }
+};
+
+TEST_F(Exec, GivesTheProgramsEndWhateverTheCallerDoes) {
+    const struct {
+        const char *szName;
+        void (*pfnPrepare)();
+    } callers[] = {
+        {"plain", [] {}},
+        {"ignores SIGCHLD", [] { Handle(SIGCHLD, SIG_IGN); }},
+        {"reaps every child",
+         [] {
+             Handle(SIGCHLD, [](int) {
+                 while (waitpid(-1, nullptr, WNOHANG) > 0) {
+                 }
+             });
+         }},
+        {"blocks and ignores signals",
+         [] {
+             sigset_t all;
+             sigfillset(&all);
+             sigprocmask(SIG_SETMASK, &all, nullptr);
+             Handle(SIGTERM, SIG_IGN);
+         }},
+        {"has no standard streams",
+         [] {
+             for (const int fd : {0, 1, 2}) {
+                 close(fd);
+             }
+         }},
+        {"is interrupted often",
+         [] {
+             Handle(SIGALRM, [](int) {});
+             const itimerval often = {{0, 2000}, {0, 2000}};
+             setitimer(ITIMER_REAL, &often, nullptr);
+         }},
+    };
+    for (const auto &caller : callers) {
+        const pid_t pid = fork();
+        if (pid == 0) {
+            caller.pfnPrepare();
+            _exit(EveryProgramGivesItsEnd() ? 0 : 1);
+        }
+        int status = -1;
+        waitpid(pid, &status, 0);
+        EXPECT_EQ(status, 0) << caller.szName;
+    }
+}
+
+TEST_F(Exec, PassesArgumentsOnAsTheyAre) {
+    Write("/tmp/show", "#!/bin/sh\nfor a; do printf '<%s>' \"$a\"; done >/tmp/out\n");
+    EXPECT_EQ(YLIBCExec("/tmp/show", " a b", "it's \"c\"", "", "$(exit) `exit` *;&|\n"), 0);
+    EXPECT_EQ(Output(), "< a b><it's \"c\"><><$(exit) `exit` *;&|\n>");
+    EXPECT_EQ(YLIBCExec("/tmp/show", "a", nullptr, "b", nullptr), 0);
+    EXPECT_EQ(Output(), "<a>");
+}
+
+TEST_F(Exec, GivesTheProgramTheNullDeviceAndNoOtherFiles) {
+    const int leaked = open("/etc/zeloinfo.conf", O_RDONLY);
+    ASSERT_EQ(dup2(leaked, 400), 400);
+    EXPECT_EQ(Shell("(ls /proc/$$/fd; readlink /proc/$$/fd/[012]) >/tmp/out; :"), 0);
+    close(leaked);
+    close(400);
+    EXPECT_EQ(Output(), "0\n1\n2\n/dev/null\n/dev/null\n/dev/null\n");
+}
+
+TEST_F(Exec, SaysWhenAProgramCannotBeRun) {
+    Write("/tmp/plain", "#!/bin/sh\n", 0644);
+    Write("/tmp/interpreter", "#!/tmp/none\n");
+    Write("/tmp/text", "exit 0\n");
+    for (const char *szProgram : {"/tmp/none", "/tmp", "/tmp/plain", "/tmp/interpreter",
+                                  "/tmp/text", "/tmp/text/below", "sh", ""}) {
+        EXPECT_LT(YLIBCExec(szProgram, nullptr, nullptr, nullptr, nullptr), 0) << szProgram;
+        EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_EXEC));
+    }
+    EXPECT_LT(YLIBCExec(nullptr, nullptr, nullptr, nullptr, nullptr), 0);
+    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_INVALID_ARGUMENT));
+    EXPECT_EQ(Shell("exit 1"), 1);
+    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_INVALID_ARGUMENT));
+}
+
+TEST_F(Exec, EndsAHungProgramWithItsProcessGroup) {
+    Write("/etc/zeloinfo.conf", "exec_timeout=1\n");
+    const auto begin = std::chrono::steady_clock::now();
+    EXPECT_LT(Shell("trap '' TERM; sleep 300 & echo $$ $! >/tmp/out; sleep 300; :"), 0);
+    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_EXEC_TIME));
+    const auto duration = std::chrono::steady_clock::now() - begin;
+    EXPECT_GE(duration, std::chrono::seconds(1));
+    EXPECT_LT(duration, std::chrono::seconds(3));
+    int program = 0;
+    int child = 0;
+    std::istringstream(Output()) >> program >> child;
+    EXPECT_TRUE(program > 0 && Ends(program) && child > 0 && Ends(child));
+}
+
+TEST_F(Exec, TakesAnInvalidLimitForTheDefault) {
+    for (const char *szLimit : {"0", "-1", "1s", "0.1", "99999999999999999999", ""}) {
+        Write("/etc/zeloinfo.conf", std::string("exec_timeout=\"") + szLimit + "\"\n");
+        EXPECT_EQ(Shell(szLimit[0] == '1' ? "sleep 1.1; :" : "sleep 0.05; :"), 0) << szLimit;
+    }
+}
+
+TEST_F(Exec, LeavesADaemonAlone) {
+    EXPECT_EQ(Shell("sleep 300 & echo $! >/tmp/out"), 0);
+    const int daemon = std::atoi(Output().c_str());
+    EXPECT_EQ(YLIBCProcAlive(daemon), 1);
+    kill(daemon, SIGKILL);
+    EXPECT_TRUE(Ends(daemon));
+}
+
+TEST_F(Exec, AddsToTheEnvironment) {
+    setenv("KEPT", "kept", 1);
+    setenv("NAME", "old", 1);
+    const char *const szScript = "(echo $KEPT $NAME $NAME_2; env | grep -c ^NAME) >/tmp/out";
+    const host::ProgramEnd end = host::RunProgram(
+        {"/bin/sh", "-c", szScript}, {"NAME=a =b", "NAME_2="}, std::chrono::minutes(1));
+    EXPECT_EQ(end.kind, host::ProgramEnd::Kind::kExited);
+    EXPECT_EQ(Output(), "kept a =b\n2\n");
+}
+
+TEST(ProcAlive, KnowsTheLivingFromTheDead) {
+    const pid_t zombie = fork();
+    if (zombie == 0) {
+        _exit(0);
+    }
+    siginfo_t info = {};
+    waitid(P_PID, static_cast<id_t>(zombie), &info, WEXITED | WNOWAIT);
+    EXPECT_EQ(kill(zombie, 0), 0);
+    EXPECT_EQ(YLIBCProcAlive(zombie), 0);
+    waitpid(zombie, nullptr, 0);
+    const struct {
+        int pid;
+        int result;
+    } rows[] = {{getpid(), 1}, {1, 1}, {zombie, 0}, {0, 0}, {-1, 0}, {-getpid(), 0}};
+    for (const auto &row : rows) {
+        EXPECT_EQ(YLIBCProcAlive(row.pid), row.result) << row.pid;
+    }
+    // The id of a thread is no process's.
+    std::thread([] { EXPECT_EQ(YLIBCProcAlive(gettid()), 0); }).join();
+}
+
+}  // namespace
