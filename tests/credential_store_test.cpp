@@ -172,6 +172,41 @@ TEST(CredentialStore, ProcessesWriteAtOnceAndLoseNothing) {
     EXPECT_GE(stored::AddCredential("Parent", "still works"), 0);
 }
 
+TEST(CredentialStore, AListCountsWhatIsThereNow) {
+    const auto count = [](const char *szApplication = "ZELO.QRM") {
+        ZELO_CRED *pList = nullptr;
+        const int kept = ZELOCredListGet(&pList, ZELOCredKeepByApplication, szApplication);
+        ZELOCredListFree(&pList);
+        return kept;
+    };
+    RemoveStore();
+    stored::AddCredential("ZELO.QRM", "a");
+    // The other process starts before this one counts: a fork closes the connection.
+    int start[2] = {-1, -1};
+    ASSERT_EQ(pipe(start), 0);
+    const pid_t pid = fork();
+    if (pid == 0) {
+        char c = 0;
+        _exit(read(start[0], &c, 1) == 1 && stored::AddCredential("ZELO.QRM", "b") >= 0 ? 0 : 1);
+    }
+    EXPECT_EQ(count(), 1);
+    EXPECT_EQ(write(start[1], "x", 1), 1);
+    int status = -1;
+    waitpid(pid, &status, 0);
+    EXPECT_EQ(status, 0);
+    close(start[0]);
+    close(start[1]);
+    EXPECT_EQ(count(), 2) << "another process's change";
+    const long id = stored::AddCredential("ZELO.QRM", "c");
+    EXPECT_EQ(count(), 3) << "a change of its own";
+    EXPECT_EQ(count("Other"), 0);
+    stored::AddCredential("Other", "d");
+    EXPECT_EQ(count("Other"), 1);
+    EXPECT_EQ(count(), 3) << "of another application than the last";
+    ZELOCredRemoveByID(id);
+    EXPECT_EQ(count(), 2);
+}
+
 TEST(CredentialStore, FollowsTheFileThatStandsAtItsPlace) {
     RemoveStore();
     stored::AddCredential("ZELO.QRM", "old");

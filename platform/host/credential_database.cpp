@@ -14,6 +14,8 @@
 #include <cstring>
 #include <memory>
 #include <mutex>
+#include <optional>
+#include <string>
 
 #include "last_error.h"
 
@@ -56,6 +58,7 @@ constexpr const char *kSettings =
 enum StatementKind {
     kReadCredential,
     kReadFirst,
+    kCount,
     kReadAll,
     kFindId,
     kInsertCredential,
@@ -69,9 +72,8 @@ enum StatementKind {
 
 constexpr std::array<const char *, kStatementCount> kStatements = {
     "SELECT " CREDENTIAL_COLUMNS " FROM credential WHERE id = ?1",
-    "SELECT " CREDENTIAL_COLUMNS
-    ", (SELECT COUNT(*) FROM credential WHERE application = ?1)"
-    " FROM credential WHERE application = ?1 ORDER BY id LIMIT 1",
+    "SELECT " CREDENTIAL_COLUMNS " FROM credential WHERE application = ?1 ORDER BY id LIMIT 1",
+    "SELECT COUNT(*) FROM credential WHERE application = ?1",
     "SELECT " CREDENTIAL_COLUMNS " FROM credential ORDER BY id",
     "SELECT MIN(id) FROM credential WHERE application = ?1",
     "INSERT INTO credential (application, host, protocol, extra_info, port, owner, create_time,"
@@ -93,11 +95,19 @@ struct FinalizeStatement {
 using DatabaseHandle = std::unique_ptr<sqlite3, CloseDatabase>;
 using StatementHandle = std::unique_ptr<sqlite3_stmt, FinalizeStatement>;
 
+// How many credentials an application has in one version of the store.
+struct Count {
+    std::string strApplication;
+    unsigned version = 0;
+    int count = 0;
+};
+
 // The statements go before the database that they belong to.
 struct Connection {
     dev_t device = 0;
     ino_t inode = 0;
     bool blHasSchema = false;
+    std::optional<Count> lastCount;
     DatabaseHandle pDb;
     std::array<StatementHandle, kStatementCount> statements;
 };
@@ -282,17 +292,11 @@ class Run {
         if (m_result != Result::kDone) {
             return;
         }
-        m_pDb = shared.pConnection->pDb.get();
-        StatementHandle &pCached = shared.pConnection->statements[kind];
-        if (pCached == nullptr) {
-            sqlite3_stmt *pRaw = nullptr;
-            const int error = sqlite3_prepare_v3(m_pDb, kStatements[kind], -1,
-                                                 SQLITE_PREPARE_PERSISTENT, &pRaw, nullptr);
-            pCached.reset(pRaw);
-            Check(error, __LINE__);
-        }
-        m_pStatement = pCached.get();
+        Prepare(shared.pConnection.get(), kind);
     }
+    // A further statement while the outer run is on a row, and thereby on the same version of the
+    // store.
+    Run(const Run &outer, StatementKind kind) { Prepare(outer.m_pConnection, kind); }
     ~Run() {
         if (m_pStatement != nullptr) {
             sqlite3_reset(m_pStatement);
@@ -366,14 +370,37 @@ class Run {
     long LastId() const { return sqlite3_last_insert_rowid(m_pDb); }
     int Changes() const { return sqlite3_changes(m_pDb); }
 
+    // The version of the store that the row belongs to; any process's change makes another one.
+    unsigned Version() const {
+        unsigned version = 0;
+        sqlite3_file_control(m_pDb, "main", SQLITE_FCNTL_DATA_VERSION, &version);
+        return version;
+    }
+    std::optional<Count> &LastCount() const { return m_pConnection->lastCount; }
+
   private:
+    void Prepare(Connection *pConnection, StatementKind kind) {
+        m_pConnection = pConnection;
+        m_pDb = pConnection->pDb.get();
+        StatementHandle &pCached = pConnection->statements[kind];
+        if (pCached == nullptr) {
+            sqlite3_stmt *pRaw = nullptr;
+            const int error = sqlite3_prepare_v3(m_pDb, kStatements[kind], -1,
+                                                 SQLITE_PREPARE_PERSISTENT, &pRaw, nullptr);
+            pCached.reset(pRaw);
+            Check(error, __LINE__);
+        }
+        m_pStatement = pCached.get();
+    }
+
     void Check(int error, int line) {
         if (error != SQLITE_OK) {
             m_result = Fail(error, sqlite3_errmsg(m_pDb), line);
         }
     }
 
-    std::lock_guard<std::mutex> m_lock;
+    std::unique_lock<std::mutex> m_lock;
+    Connection *m_pConnection = nullptr;
     sqlite3 *m_pDb = nullptr;
     sqlite3_stmt *m_pStatement = nullptr;
     Result m_result = Result::kDone;
@@ -389,6 +416,24 @@ void ReadRow(const Run &run, ZELO_CRED &cred) {
     cred.owner = run.OptionalNumber(6);
     cred.createTime_s = run.OptionalNumber(7);
     cred.modifyTime_s = run.OptionalNumber(8);
+}
+
+// Counting walks the application's part of the index, so it is done once for each version of the
+// store.
+Result CountOf(const Run &run, const std::string &strApplication, int &count) {
+    std::optional<Count> &last = run.LastCount();
+    const unsigned version = run.Version();
+    if (!last || last->version != version || last->strApplication != strApplication) {
+        Run counting(run, kCount);
+        counting.Bind(1, strApplication);
+        const Result result = counting.Step();
+        if (result != Result::kDone) {
+            return result;
+        }
+        last = Count{strApplication, version, static_cast<int>(counting.Number(0))};
+    }
+    count = last->count;
+    return Result::kDone;
 }
 
 Result RemoveById(StatementKind kind, long id) {
@@ -415,11 +460,11 @@ Result ReadFirst(const char *szApplication, ZELO_CRED &cred, int &count) {
     Run run(kReadFirst, false);
     run.Bind(1, strApplication);
     const Result result = run.Step();
-    if (result == Result::kDone) {
-        ReadRow(run, cred);
-        count = static_cast<int>(run.Number(9));
+    if (result != Result::kDone) {
+        return result;
     }
-    return result;
+    ReadRow(run, cred);
+    return CountOf(run, strApplication, count);
 }
 
 Result ReadAll(std::vector<ZELO_CRED> &creds) {
