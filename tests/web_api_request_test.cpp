@@ -119,18 +119,19 @@ TEST_F(Request, OnlyKnownProtocolsAndPlainHostsAreUsed) {
 }
 
 TEST_F(Request, ProxyVariablesCountOnlyWhereTheConfigurationSaysSo) {
-    for (const char *szName : {"http_proxy", "https_proxy", "ALL_PROXY"}) {
+    for (const char *szName :
+         {"http_proxy", "https_proxy", "HTTPS_PROXY", "all_proxy", "ALL_PROXY"}) {
+        SCOPED_TRACE(szName);
+        const bool blPlain = szName == std::string("http_proxy");
         setenv(szName, "http://127.0.0.1:1", 1);
-    }
-    EXPECT_EQ(Http(), "/qrm/rpc");
-    EXPECT_EQ(Https(), "/qrm/rpc");
-    Write(kConfig, "use_proxy_environment=yes\n");
-    EXPECT_EQ(Http(), "");
-    Write(kConfig, "use_proxy_environment=no\nfarlink_relay=\"127.0.0.1:1\"\n");
-    EXPECT_EQ(PathOf("fld", m_pServer->HttpsPort()), "");
-    for (const char *szName : {"http_proxy", "https_proxy", "ALL_PROXY"}) {
+        Write(kConfig, "use_proxy_environment=no\n");
+        EXPECT_EQ(blPlain ? Http() : Https(), "/qrm/rpc");
+        Write(kConfig, "use_proxy_environment=yes\n");
+        EXPECT_EQ(blPlain ? Http() : Https(), "");
         unsetenv(szName);
     }
+    Write(kConfig, "farlink_relay=\"127.0.0.1:1\"\n");
+    EXPECT_EQ(PathOf("fld", m_pServer->HttpsPort()), "");
 }
 
 TEST_F(Request, UnusableAnswersCountAsNone) {

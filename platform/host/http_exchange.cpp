@@ -11,6 +11,7 @@
 
 #include <algorithm>
 #include <array>
+#include <cstdlib>
 #include <memory>
 #include <mutex>
 #include <new>
@@ -246,6 +247,15 @@ void SetTransport(CURL *pEasy, Connection *pConnection) {
     curl_easy_setopt(pEasy, CURLOPT_SSL_CTX_FUNCTION, AddAuthorities);
 }
 
+// Whether the environment names a proxy, in one of the variables that libcurl looks at. Where it
+// names none, as on most appliances, an exchange need not read the configuration.
+bool NamesProxy() {
+    constexpr std::array<const char *, 5> kVariables = {"http_proxy", "https_proxy", "HTTPS_PROXY",
+                                                        "all_proxy", "ALL_PROXY"};
+    return std::any_of(kVariables.begin(), kVariables.end(),
+                       [](const char *szName) { return std::getenv(szName) != nullptr; });
+}
+
 // Chooses the way: through the relay, as the environment says where the configuration allows it, or
 // direct. False when the relay is asked for and none is named.
 bool SetWay(CURL *pEasy, bool blRelay) {
@@ -262,6 +272,7 @@ bool SetWay(CURL *pEasy, bool blRelay) {
         return true;
     }
     const bool blEnvironment =
+        NamesProxy() &&
         LookUpKey(kConfigFile, "use_proxy_environment", strValue) == LookUp::kFound &&
         strValue == "yes";
     if (!blEnvironment) {
@@ -305,6 +316,14 @@ void SetRequest(CURL *pEasy, const HttpRequest &request, const curl_slist *pHead
         curl_easy_setopt(pEasy, CURLOPT_POSTFIELDSIZE_LARGE,
                          static_cast<curl_off_t>(request.strBody.size()));
     }
+}
+
+// Whether the text holds nothing but letters, digits, '.', '-', '_' and the one other character.
+bool IsPlain(const std::string &strText, char other) {
+    return std::all_of(strText.begin(), strText.end(), [other](char c) {
+        return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || (c >= '0' && c <= '9') ||
+               c == '.' || c == '-' || c == '_' || c == other;
+    });
 }
 
 // The error of a request as the platform's last error.
@@ -392,6 +411,12 @@ std::string BuildUrl(const std::string &strScheme, const std::string &strHost, l
                                       [](unsigned char c) { return c <= ' ' || c == 0x7F; });
     if (port < 1 || port > 65535 || !blPlain) {
         return {};
+    }
+    // Plain parts, as nearly all are, make an URL as they stand; all others are left to libcurl.
+    if (!strHost.empty() && IsPlain(strHost, '.') && IsPlain(strPath, '/') &&
+        IsPlain(strQuery, '=') && strQuery.find('=') == strQuery.rfind('=')) {
+        return strScheme + "://" + strHost + ':' + std::to_string(port) + strPath +
+               (strQuery.empty() ? "" : "?") + strQuery;
     }
     const bool blBareIPv6 = strHost.find(':') != std::string::npos && strHost.front() != '[';
     const std::string strUrlHost = blBareIPv6 ? '[' + strHost + ']' : strHost;
