@@ -1,9 +1,6 @@
 // The credential store's database: one SQLite file, "/usr/zelo/etc/credentials/credentials.db".
 //
-// Every operation is one statement and thereby one transaction, durable when it returns. The
-// process keeps one connection, which its threads take in turn. Reading never creates or changes
-// the file: a store that does not exist yet has no records. A file that is damaged or of another
-// format is left as it is; each operation on it fails with a log line.
+// Every operation is one statement of it, with all that sqlite_database.h says about statements.
 
 #ifndef ZELO_HOST_CREDENTIAL_DATABASE_H
 #define ZELO_HOST_CREDENTIAL_DATABASE_H
@@ -11,10 +8,11 @@
 #include <vector>
 
 #include "credential_record.h"
+#include "sqlite_database.h"
 
 namespace host::credential_database {
 
-enum class Result { kDone, kAbsent, kFailed };  // kFailed and kAbsent set the last error
+using sqlite::Result;
 
 Result ReadCredential(long id, ZELO_CRED &cred);
 

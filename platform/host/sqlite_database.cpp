@@ -1,0 +1,346 @@
+#include "sqlite_database.h"
+
+#include <fcntl.h>
+#include <pthread.h>
+#include <sqlite3.h>
+#include <sys/stat.h>
+#include <syslog.h>
+#include <unistd.h>
+
+#include <atomic>
+#include <cerrno>
+#include <cstring>
+#include <vector>
+
+#include "last_error.h"
+
+namespace host::sqlite {
+namespace {
+
+constexpr const char *kFile = "sqlite_database";
+
+// How long a writer of another process is waited for.
+constexpr int kBusyTimeout_ms = 10000;
+
+// EXTRA: a removal is durable too, the journal's directory entry included. What is removed is
+// overwritten.
+constexpr const char *kSettings =
+    "PRAGMA synchronous = EXTRA; PRAGMA secure_delete = ON; PRAGMA trusted_schema = OFF;";
+
+struct CloseDatabase {
+    void operator()(sqlite3 *pDb) const { sqlite3_close_v2(pDb); }
+};
+struct FinalizeStatement {
+    void operator()(sqlite3_stmt *pStatement) const { sqlite3_finalize(pStatement); }
+};
+using DatabaseHandle = std::unique_ptr<sqlite3, CloseDatabase>;
+using StatementHandle = std::unique_ptr<sqlite3_stmt, FinalizeStatement>;
+
+// The chain of all databases. The mutex goes before those of the databases.
+std::mutex g_chainMutex;
+
+// How many connections the process has opened.
+std::atomic<unsigned> g_connections{0};
+Database *g_pFirst = nullptr;
+
+bool ReadPragma(sqlite3 *pDb, const char *szPragma, int &value, int &error) {
+    sqlite3_stmt *pRaw = nullptr;
+    error = sqlite3_prepare_v2(pDb, szPragma, -1, &pRaw, nullptr);
+    const StatementHandle pStatement(pRaw);
+    if (error == SQLITE_OK) {
+        error = sqlite3_step(pRaw);
+    }
+    if (error != SQLITE_ROW) {
+        return false;
+    }
+    value = sqlite3_column_int(pRaw, 0);
+    return true;
+}
+
+Result Absent(int line) {
+    YLIBCErrSetEx(YLIBC_ERR_NOT_FOUND, kFile, line);
+    return Result::kAbsent;
+}
+
+}  // namespace
+
+// The statements go before the database that they belong to.
+struct Connection {
+    unsigned serial = ++g_connections;  // tells it from every other one of the process
+    dev_t device = 0;
+    ino_t inode = 0;
+    bool blHasSchema = false;
+    DatabaseHandle pDb;
+    std::vector<StatementHandle> statements;
+};
+
+// --- Database -----------------------------------------------------------------------------------
+
+Database::Database(const Store &store) : m_store(store) {
+    const std::lock_guard<std::mutex> lock(g_chainMutex);
+    if (g_pFirst == nullptr) {
+        pthread_atfork(CloseAllBeforeFork, UnlockAllAfterFork, UnlockAllAfterFork);
+    }
+    m_pNext = g_pFirst;
+    g_pFirst = this;
+}
+
+// SQLite's connections do not survive a fork.
+void Database::CloseAllBeforeFork() {
+    g_chainMutex.lock();
+    for (Database *p = g_pFirst; p != nullptr; p = p->m_pNext) {
+        p->m_mutex.lock();
+        p->m_pConnection.reset();
+    }
+}
+
+void Database::UnlockAllAfterFork() {
+    for (Database *p = g_pFirst; p != nullptr; p = p->m_pNext) {
+        p->m_mutex.unlock();
+    }
+    g_chainMutex.unlock();
+}
+
+// SQLite's error as the platform's, with one log line.
+Result Database::Fail(int sqliteError, const char *szWhat, int line) const {
+    switch (sqliteError & 0xFF) {
+        case SQLITE_NOTADB:
+        case SQLITE_CORRUPT:
+            syslog(LOG_ERR,
+                   "%s:%d %s '%s' is damaged or of another format, nothing was changed: move it "
+                   "aside or restore a copy",
+                   kFile, line, m_store.szName, m_store.szPath);
+            YLIBCErrSetEx(YLIBC_ERR_STORE_DAMAGED, kFile, line);
+            break;
+        case SQLITE_BUSY:
+        case SQLITE_LOCKED:
+            syslog(LOG_ERR, "%s:%d %s '%s' stayed locked for %d s", kFile, line, m_store.szName,
+                   m_store.szPath, kBusyTimeout_ms / 1000);
+            YLIBCErrSetEx(YLIBC_ERR_STORE_BUSY, kFile, line);
+            break;
+        default:
+            syslog(LOG_ERR, "%s:%d %s '%s': %s", kFile, line, m_store.szName, m_store.szPath,
+                   szWhat);
+            YLIBCErrSetEx(YLIBC_ERR_STORE, kFile, line);
+    }
+    return Result::kFailed;
+}
+
+Result Database::FailErrno(int line) const {
+    return Fail(SQLITE_CANTOPEN, std::strerror(errno), line);
+}
+
+// Makes sure that the file is there, ours alone. SQLite's journal takes over its mode.
+Result Database::CreateFile() const {
+    if (mkdir(m_store.szFolder, 0700) != 0 && errno != EEXIST) {
+        return FailErrno(__LINE__);
+    }
+    const int fd = open(m_store.szPath, O_RDWR | O_CREAT | O_NOFOLLOW | O_CLOEXEC, 0600);
+    if (fd < 0) {
+        return FailErrno(__LINE__);
+    }
+    close(fd);
+    return Result::kDone;
+}
+
+// Is it ours?
+Result Database::CheckFormat() {
+    sqlite3 *const pDb = m_pConnection->pDb.get();
+    int applicationId = 0;
+    int format = 0;
+    int error = SQLITE_OK;
+    if (!ReadPragma(pDb, "PRAGMA application_id", applicationId, error) ||
+        !ReadPragma(pDb, "PRAGMA user_version", format, error)) {
+        return Fail(error, sqlite3_errmsg(pDb), __LINE__);
+    }
+    if (applicationId != m_store.applicationId || format != m_store.format) {
+        return Fail(SQLITE_NOTADB, "", __LINE__);
+    }
+    m_pConnection->blHasSchema = true;
+    return Result::kDone;
+}
+
+Result Database::Open(dev_t device, ino_t inode, bool blEmpty) {
+    m_pConnection = std::make_unique<Connection>();
+    m_pConnection->device = device;
+    m_pConnection->inode = inode;
+    m_pConnection->statements.resize(m_store.cStatements);
+    sqlite3 *pRaw = nullptr;
+    const int error = sqlite3_open_v2(m_store.szPath, &pRaw,
+                                      SQLITE_OPEN_READWRITE | SQLITE_OPEN_NOMUTEX, nullptr);
+    m_pConnection->pDb.reset(pRaw);
+    if (error != SQLITE_OK) {
+        return Fail(error, pRaw == nullptr ? sqlite3_errstr(error) : sqlite3_errmsg(pRaw),
+                    __LINE__);
+    }
+    sqlite3_busy_timeout(pRaw, kBusyTimeout_ms);
+    const int settingsError = sqlite3_exec(pRaw, kSettings, nullptr, nullptr, nullptr);
+    if (settingsError != SQLITE_OK) {
+        return Fail(settingsError, sqlite3_errmsg(pRaw), __LINE__);
+    }
+    // A process that died while creating the file leaves an empty one behind.
+    return blEmpty ? Result::kDone : CheckFormat();
+}
+
+// The marks of the format go in with the tables: a file has all of it or nothing.
+Result Database::CreateSchema() {
+    const std::string strSchema =
+        std::string("BEGIN IMMEDIATE;") + m_store.szSchema +
+        "PRAGMA application_id = " + std::to_string(m_store.applicationId) +
+        "; PRAGMA user_version = " + std::to_string(m_store.format) + "; COMMIT;";
+    sqlite3 *const pDb = m_pConnection->pDb.get();
+    const int error = sqlite3_exec(pDb, strSchema.c_str(), nullptr, nullptr, nullptr);
+    if (error != SQLITE_OK) {
+        return Fail(error, sqlite3_errmsg(pDb), __LINE__);
+    }
+    m_pConnection->blHasSchema = true;
+    return Result::kDone;
+}
+
+// Makes m_pConnection a connection to the file that stands at the path now, or none when that
+// fails.
+Result Database::Connect(bool blWrite) {
+    struct stat status = {};
+    if (stat(m_store.szPath, &status) != 0) {
+        if (errno != ENOENT) {
+            return FailErrno(__LINE__);
+        }
+        m_pConnection.reset();
+        if (!blWrite) {
+            return Absent(__LINE__);
+        }
+        if (CreateFile() != Result::kDone) {
+            return Result::kFailed;
+        }
+        if (stat(m_store.szPath, &status) != 0) {
+            return FailErrno(__LINE__);
+        }
+    }
+    Result result = Result::kDone;
+    if (m_pConnection == nullptr || m_pConnection->device != status.st_dev ||
+        m_pConnection->inode != status.st_ino) {
+        m_pConnection.reset();
+        result = Open(status.st_dev, status.st_ino, status.st_size == 0);
+    }
+    if (result == Result::kDone && !m_pConnection->blHasSchema) {
+        if (!blWrite && status.st_size == 0) {
+            return Absent(__LINE__);
+        }
+        result = CreateSchema();
+    }
+    if (result != Result::kDone) {
+        m_pConnection.reset();
+    }
+    return result;
+}
+
+// --- Run ----------------------------------------------------------------------------------------
+
+Run::Run(Database &database, std::size_t statement, bool blWrite)
+    : m_database(database), m_lock(database.m_mutex) {
+    m_result = database.Connect(blWrite);
+    if (m_result == Result::kDone) {
+        Prepare(statement);
+    }
+}
+
+Run::Run(const Run &outer, std::size_t statement) : m_database(outer.m_database) {
+    Prepare(statement);
+}
+
+void Run::Prepare(std::size_t statement) {
+    m_pDb = m_database.m_pConnection->pDb.get();
+    StatementHandle &pCached = m_database.m_pConnection->statements[statement];
+    if (pCached == nullptr) {
+        sqlite3_stmt *pRaw = nullptr;
+        const int error = sqlite3_prepare_v3(m_pDb, m_database.m_store.pStatements[statement], -1,
+                                             SQLITE_PREPARE_PERSISTENT, &pRaw, nullptr);
+        pCached.reset(pRaw);
+        Check(error, __LINE__);
+    }
+    m_pStatement = pCached.get();
+}
+
+Run::~Run() {
+    if (m_pStatement != nullptr) {
+        sqlite3_reset(m_pStatement);
+        sqlite3_clear_bindings(m_pStatement);
+    }
+}
+
+void Run::Bind(int at, long value) {
+    if (m_result == Result::kDone) {
+        Check(sqlite3_bind_int64(m_pStatement, at, value), __LINE__);
+    }
+}
+
+void Run::Bind(int at, const std::string &strText) {
+    if (m_result == Result::kDone) {
+        Check(sqlite3_bind_text64(m_pStatement, at, strText.data(), strText.size(), SQLITE_STATIC,
+                                  SQLITE_UTF8),
+              __LINE__);
+    }
+}
+
+Result Run::Step() {
+    if (m_result != Result::kDone) {
+        return m_result;
+    }
+    const int error = sqlite3_step(m_pStatement);
+    if (error == SQLITE_ROW) {
+        return Result::kDone;
+    }
+    if (error == SQLITE_DONE) {
+        return Absent(__LINE__);
+    }
+    Check(error, __LINE__);
+    return m_result;
+}
+
+Result Run::Execute() {
+    const Result result = Step();
+    return result == Result::kAbsent ? Result::kDone : result;
+}
+
+bool Run::IsNull(int column) const {
+    return sqlite3_column_type(m_pStatement, column) == SQLITE_NULL;
+}
+
+long Run::Number(int column) const {
+    return sqlite3_column_int64(m_pStatement, column);
+}
+
+std::optional<long> Run::OptionalNumber(int column) const {
+    return IsNull(column) ? std::nullopt : std::optional<long>(Number(column));
+}
+
+std::optional<std::string> Run::OptionalText(int column) const {
+    const auto *pText = sqlite3_column_text(m_pStatement, column);
+    if (pText == nullptr) {
+        return std::nullopt;
+    }
+    return std::string(reinterpret_cast<const char *>(pText),
+                       static_cast<std::size_t>(sqlite3_column_bytes(m_pStatement, column)));
+}
+
+std::uint64_t Run::Version() const {
+    unsigned version = 0;
+    sqlite3_file_control(m_pDb, "main", SQLITE_FCNTL_DATA_VERSION, &version);
+    return std::uint64_t{m_database.m_pConnection->serial} << 32U | version;
+}
+
+long Run::LastId() const {
+    return sqlite3_last_insert_rowid(m_pDb);
+}
+
+int Run::Changes() const {
+    return sqlite3_changes(m_pDb);
+}
+
+void Run::Check(int sqliteError, int line) {
+    if (sqliteError != SQLITE_OK) {
+        m_result = m_database.Fail(sqliteError, sqlite3_errmsg(m_pDb), line);
+    }
+}
+
+}  // namespace host::sqlite

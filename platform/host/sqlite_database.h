@@ -1,0 +1,128 @@
+// Stores of the host platform: each is one SQLite file in a folder of its own.
+//
+// What every store keeps to. A statement is a transaction, durable when it returns; another
+// process's write is waited for, within a bound. Reading never creates or changes the file: a store
+// that does not exist yet has no records. A file that is damaged or of another format is left as it
+// is, and each operation on it fails with a log line. What is removed is overwritten. The process
+// keeps one connection to each store, which its threads take in turn; it is closed before a fork,
+// and opened anew when another file has taken the place of the one that it leads to.
+
+#ifndef ZELO_HOST_SQLITE_DATABASE_H
+#define ZELO_HOST_SQLITE_DATABASE_H
+
+#include <sys/types.h>
+
+#include <cstddef>
+#include <cstdint>
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <string>
+
+struct sqlite3;
+struct sqlite3_stmt;
+
+namespace host::sqlite {
+
+enum class Result { kDone, kAbsent, kFailed };  // kFailed and kAbsent set the last error
+
+// What makes a store. Everything that it designates is constant and stays.
+struct Store {
+    const char *szName;              // what log lines call it
+    const char *szFolder;            // made together with the file, mode 0700
+    const char *szPath;              // mode 0600
+    int applicationId;               // tells the file from any other SQLite database
+    int format;                      // one that another version of this code wrote is not ours
+    const char *szSchema;            // creates what is not there of tables and indexes
+    const char *const *pStatements;  // a run names its statement by the place in this list
+    std::size_t cStatements;
+};
+
+struct Connection;
+
+// The process's access to one store. Made once, while the library is loaded, and never destroyed,
+// so that it serves until the very end of a process.
+class Database {
+  public:
+    explicit Database(const Store &store);
+    ~Database() = delete;
+    Database(const Database &) = delete;
+    Database &operator=(const Database &) = delete;
+
+  private:
+    friend class Run;
+
+    static void CloseAllBeforeFork();
+    static void UnlockAllAfterFork();
+
+    // The caller of these holds the mutex.
+    Result Connect(bool blWrite);
+    Result Open(dev_t device, ino_t inode, bool blEmpty);
+    Result CreateFile() const;
+    Result CheckFormat();
+    Result CreateSchema();
+    Result Fail(int sqliteError, const char *szWhat, int line) const;
+    Result FailErrno(int line) const;
+
+    const Store &m_store;
+    std::mutex m_mutex;
+    std::unique_ptr<Connection> m_pConnection;
+    Database *m_pNext = nullptr;  // all databases are in one chain, for the fork handlers
+};
+
+// One run of a prepared statement: takes the mutex and the connection, gives both back when it goes
+// out of scope. A failure on the way is kept: later steps do nothing and return it. With blWrite
+// the store is created when it is not there; without, it then counts as empty.
+class Run {
+  public:
+    Run(Database &database, std::size_t statement, bool blWrite);
+    // A further statement while the outer run is on a row, and thereby on the same version of the
+    // store.
+    Run(const Run &outer, std::size_t statement);
+    ~Run();
+    Run(const Run &) = delete;
+    Run &operator=(const Run &) = delete;
+
+    // Parameters, from 1. A text has to outlive the run; an optional without a value stays NULL.
+    void Bind(int at, long value);
+    void Bind(int at, const std::string &strText);
+    template <typename Value>
+    void Bind(int at, const std::optional<Value> &value) {
+        if (value) {
+            Bind(at, *value);
+        }
+    }
+
+    // kDone: on a row. kAbsent: there is no (other) row.
+    Result Step();
+
+    // Runs a statement that changes the store. A store that is not there counts as changed.
+    Result Execute();
+
+    // Columns of the row, from 0.
+    bool IsNull(int column) const;
+    long Number(int column) const;
+    std::optional<long> OptionalNumber(int column) const;
+    std::optional<std::string> OptionalText(int column) const;
+
+    // The version of the store that the row belongs to: any process's change, and another file in
+    // the store's place, make another one.
+    std::uint64_t Version() const;
+
+    long LastId() const;
+    int Changes() const;
+
+  private:
+    void Prepare(std::size_t statement);
+    void Check(int sqliteError, int line);
+
+    Database &m_database;
+    std::unique_lock<std::mutex> m_lock;  // holds nothing in a further run
+    sqlite3 *m_pDb = nullptr;
+    sqlite3_stmt *m_pStatement = nullptr;
+    Result m_result = Result::kDone;
+};
+
+}  // namespace host::sqlite
+
+#endif
