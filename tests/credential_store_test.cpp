@@ -47,10 +47,12 @@ int Mode(const char *szPath) {
 TEST(CredentialStore, LooksAreNotWrites) {
     RemoveStore();
     EXPECT_EQ(stored::Describe(), "");
+    YLIBCErrSetEx(YLIBC_ERR_NONE, "", 0);
     EXPECT_EQ(ZELOCredRemoveByID(5), 0);
     EXPECT_EQ(ZELOCredSessRemoveByID(5), 0);
     ZELO_CRED *pList = nullptr;
     EXPECT_EQ(ZELOCredListGet(&pList, ZELOCredKeepByApplication, "ZELO.QRM"), 0);
+    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_NONE)) << "nothing has failed";
     EXPECT_FALSE(fs::exists(stored::kFolder));
 
     stored::AddCredential("ZELO.QRM", "a");
@@ -242,10 +244,17 @@ TEST(CredentialStore, DamagedOrForeignFilesAreLeftAsTheyAre) {
         EXPECT_LT(ZELOCredRemoveByID(1), 0);
         EXPECT_EQ(Content(stored::kDatabase), strContent);
     }
-    // A process that dies while it creates the file leaves an empty one: that is no damage.
-    std::ofstream(stored::kDatabase, std::ios::binary | std::ios::trunc).flush();
-    EXPECT_EQ(stored::Describe(), "");
-    EXPECT_GE(stored::AddCredential("ZELO.QRM", "a"), 0);
+    // A process that dies while it creates the file leaves an empty one: that is no damage. What
+    // comes into that file afterwards is looked at again.
+    for (const std::string &strContent : {std::string(), strForeign}) {
+        RemoveStore();
+        fs::create_directory(stored::kFolder);
+        std::ofstream file(stored::kDatabase, std::ios::binary);
+        EXPECT_EQ(stored::Describe(), "");
+        file << strContent << std::flush;
+        EXPECT_EQ(stored::AddCredential("ZELO.QRM", "a") >= 0, strContent.empty());
+        EXPECT_EQ(Content(stored::kDatabase) == strForeign, !strContent.empty());
+    }
 }
 
 TEST(CredentialStore, RemovedTokensAreGoneFromTheFile) {

@@ -4,15 +4,12 @@
 
 #include <array>
 
-#include "last_error.h"
 #include "sqlite_database.h"
 
 namespace host::credential_database {
 namespace {
 
 using sqlite::Run;
-
-constexpr const char *kFile = "credential_database";
 
 // AUTOINCREMENT: an id is never used again, also not after the record with the highest one is gone.
 constexpr const char *kSchema =
@@ -67,11 +64,6 @@ constexpr sqlite::Store kStore = {"credential store",
                                   kStatements.size()};
 
 sqlite::Database &g_database = *new sqlite::Database(kStore);
-
-Result Absent(int line) {
-    YLIBCErrSetEx(YLIBC_ERR_NOT_FOUND, kFile, line);
-    return Result::kAbsent;
-}
 
 void ReadRow(const Run &run, ZELO_CRED &cred) {
     cred.id = run.Number(0);
@@ -159,7 +151,7 @@ Result FindId(const char *szApplication, long &id) {
         return result;
     }
     if (run.IsNull(0)) {
-        return Absent(__LINE__);
+        return Result::kAbsent;
     }
     id = run.Number(0);
     return Result::kDone;
@@ -185,7 +177,7 @@ Result WriteCredential(ZELO_CRED &cred) {
     if (cred.id < 0) {
         cred.id = run.LastId();
     } else if (run.Changes() == 0) {
-        return Absent(__LINE__);
+        return Result::kAbsent;
     }
     return Result::kDone;
 }

@@ -29,7 +29,11 @@ int NoThrow(Body &&body) {
     }
 }
 
+// For operations that fail on what is not there.
 int ToInt(Result result) {
+    if (result == Result::kAbsent) {
+        return HOST_FAIL(YLIBC_ERR_NOT_FOUND);
+    }
     return result == Result::kDone ? 0 : -1;
 }
 

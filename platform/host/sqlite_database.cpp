@@ -57,11 +57,6 @@ bool ReadPragma(sqlite3 *pDb, const char *szPragma, int &value, int &error) {
     return true;
 }
 
-Result Absent(int line) {
-    YLIBCErrSetEx(YLIBC_ERR_NOT_FOUND, kFile, line);
-    return Result::kAbsent;
-}
-
 }  // namespace
 
 // The statements go before the database that they belong to.
@@ -143,15 +138,21 @@ Result Database::CreateFile() const {
     return Result::kDone;
 }
 
-// Is it ours?
+// Is it ours? kAbsent: nothing is in it yet, as a process leaves it that dies while creating it.
+// That is asked of SQLite, not of the file's size: its journal may still have to undo something.
 Result Database::CheckFormat() {
     sqlite3 *const pDb = m_pConnection->pDb.get();
+    int pages = 0;
     int applicationId = 0;
     int format = 0;
     int error = SQLITE_OK;
-    if (!ReadPragma(pDb, "PRAGMA application_id", applicationId, error) ||
+    if (!ReadPragma(pDb, "PRAGMA page_count", pages, error) ||
+        !ReadPragma(pDb, "PRAGMA application_id", applicationId, error) ||
         !ReadPragma(pDb, "PRAGMA user_version", format, error)) {
         return Fail(error, sqlite3_errmsg(pDb), __LINE__);
+    }
+    if (pages == 0) {
+        return Result::kAbsent;
     }
     if (applicationId != m_store.applicationId || format != m_store.format) {
         return Fail(SQLITE_NOTADB, "", __LINE__);
@@ -160,7 +161,7 @@ Result Database::CheckFormat() {
     return Result::kDone;
 }
 
-Result Database::Open(dev_t device, ino_t inode, bool blEmpty) {
+Result Database::Open(dev_t device, ino_t inode) {
     m_pConnection = std::make_unique<Connection>();
     m_pConnection->device = device;
     m_pConnection->inode = inode;
@@ -178,8 +179,7 @@ Result Database::Open(dev_t device, ino_t inode, bool blEmpty) {
     if (settingsError != SQLITE_OK) {
         return Fail(settingsError, sqlite3_errmsg(pRaw), __LINE__);
     }
-    // A process that died while creating the file leaves an empty one behind.
-    return blEmpty ? Result::kDone : CheckFormat();
+    return Result::kDone;
 }
 
 // The marks of the format go in with the tables: a file has all of it or nothing.
@@ -198,7 +198,7 @@ Result Database::CreateSchema() {
 }
 
 // Makes m_pConnection a connection to the file that stands at the path now, or none when that
-// fails.
+// fails. kAbsent: there is no file, or nothing in it.
 Result Database::Connect(bool blWrite) {
     struct stat status = {};
     if (stat(m_store.szPath, &status) != 0) {
@@ -207,7 +207,7 @@ Result Database::Connect(bool blWrite) {
         }
         m_pConnection.reset();
         if (!blWrite) {
-            return Absent(__LINE__);
+            return Result::kAbsent;
         }
         if (CreateFile() != Result::kDone) {
             return Result::kFailed;
@@ -220,15 +220,15 @@ Result Database::Connect(bool blWrite) {
     if (m_pConnection == nullptr || m_pConnection->device != status.st_dev ||
         m_pConnection->inode != status.st_ino) {
         m_pConnection.reset();
-        result = Open(status.st_dev, status.st_ino, status.st_size == 0);
+        result = Open(status.st_dev, status.st_ino);
     }
     if (result == Result::kDone && !m_pConnection->blHasSchema) {
-        if (!blWrite && status.st_size == 0) {
-            return Absent(__LINE__);
+        result = CheckFormat();
+        if (result == Result::kAbsent && blWrite) {
+            result = CreateSchema();
         }
-        result = CreateSchema();
     }
-    if (result != Result::kDone) {
+    if (result == Result::kFailed) {
         m_pConnection.reset();
     }
     return result;
@@ -291,7 +291,7 @@ Result Run::Step() {
         return Result::kDone;
     }
     if (error == SQLITE_DONE) {
-        return Absent(__LINE__);
+        return Result::kAbsent;
     }
     Check(error, __LINE__);
     return m_result;

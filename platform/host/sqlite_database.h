@@ -24,7 +24,7 @@ struct sqlite3_stmt;
 
 namespace host::sqlite {
 
-enum class Result { kDone, kAbsent, kFailed };  // kFailed and kAbsent set the last error
+enum class Result { kDone, kAbsent, kFailed };  // only kFailed sets the last error
 
 // What makes a store. Everything that it designates is constant and stays.
 struct Store {
@@ -57,7 +57,7 @@ class Database {
 
     // The caller of these holds the mutex.
     Result Connect(bool blWrite);
-    Result Open(dev_t device, ino_t inode, bool blEmpty);
+    Result Open(dev_t device, ino_t inode);
     Result CreateFile() const;
     Result CheckFormat();
     Result CreateSchema();
