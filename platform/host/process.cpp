@@ -7,46 +7,22 @@
 #include <unistd.h>
 
 #include <cerrno>
-#include <charconv>
 #include <chrono>
 #include <csignal>
 #include <new>
 #include <string>
-#include <system_error>
 #include <vector>
 
-#include "key_value_lookup.h"
 #include "last_error.h"
 #include "program.h"
+#include "time_limit.h"
 
 namespace {
 
 constexpr const char *kFile = "process";
-constexpr int kDefaultLimit_s = 60;
+constexpr const char *kLimitKey = "exec_timeout";
+constexpr std::chrono::seconds kDefaultLimit(60);
 constexpr int kSignalledBase = 128;
-
-// A key that is not there is no failure of the caller's operation: the last error stays as it was.
-bool FindSetting(const char *szKey, std::string &strValue) {
-    const unsigned int code = YLIBCErrGet();
-    const char *const szErrorFile = YLIBCErrorGetFile();
-    const int line = YLIBCErrorGetLine();
-    const bool blFound =
-        host::LookUpKey(host::kConfigFile, szKey, strValue) == host::LookUp::kFound;
-    YLIBCErrSetEx(code, szErrorFile, line);
-    return blFound;
-}
-
-std::chrono::seconds Limit() {
-    std::string strLimit;
-    int limit_s = 0;
-    if (!FindSetting("exec_timeout", strLimit)) {
-        return std::chrono::seconds(kDefaultLimit_s);
-    }
-    const char *const szEnd = strLimit.data() + strLimit.size();
-    const std::from_chars_result read = std::from_chars(strLimit.data(), szEnd, limit_s);
-    const bool blValid = read.ec == std::errc() && read.ptr == szEnd && limit_s > 0;
-    return std::chrono::seconds(blValid ? limit_s : kDefaultLimit_s);
-}
 
 }  // namespace
 
@@ -63,7 +39,8 @@ int YLIBCExec(const char *szProgram, const char *szArgument1, const char *szArgu
             }
             arguments.emplace_back(szArgument);
         }
-        const host::ProgramEnd end = host::RunProgram(arguments, {}, Limit());
+        const host::ProgramEnd end =
+            host::RunProgram(arguments, {}, host::TimeLimit(kLimitKey, kDefaultLimit));
         switch (end.kind) {
             case host::ProgramEnd::Kind::kExited:
                 return end.value;
