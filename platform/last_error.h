@@ -26,6 +26,7 @@ enum YLIBC_ERROR {
     YLIBC_ERR_UNCHANGED = 0x0602,      // the server has nothing newer than the caller's copy
     YLIBC_ERR_EXEC = 0x0700,           // a program could not be run
     YLIBC_ERR_EXEC_TIME = 0x0701,      // a program ran for too long and was ended
+    YLIBC_ERR_EXEC_STATUS = 0x0702,    // a program that had to succeed ended in another way
     YLIBC_ERR_INVALID_ARGUMENT = 0x0D00  // a null or unusable argument
 };
 

@@ -1,0 +1,174 @@
+// What any plug-in SDK has to promise, and what the host's adds: a plug-in is a folder of programs.
+
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+
+#include <chrono>
+#include <filesystem>
+#include <fstream>
+#include <sstream>
+#include <string>
+
+#include "last_error.h"
+#include "plugin_sdk.h"
+
+namespace {
+
+namespace fs = std::filesystem;
+
+constexpr const char *kRoot = "/usr/zelo/etc/plugins";
+constexpr const char *kFolder = "/usr/zelo/etc/plugins/qrm_client/disjoin";
+constexpr const char *kSettings = "/etc/zeloinfo.conf";
+constexpr const char *kRan = "/tmp/ran";
+
+// Every program says first that it has run.
+void AddProgram(const std::string &strName, const std::string &strBody, int mode = 0755) {
+    const fs::path path = fs::path(kFolder) / strName;
+    std::ofstream(path) << "#!/bin/sh\necho \"${0##*/}\" >>" << kRan << '\n' << strBody << '\n';
+    EXPECT_EQ(chmod(path.c_str(), static_cast<mode_t>(mode)), 0);
+}
+
+std::string Content(const char *szPath) {
+    std::ostringstream text;
+    text << std::ifstream(szPath).rdbuf();
+    return text.str();
+}
+
+class PluginSdk : public testing::Test {
+  protected:
+    void SetUp() override {
+        fs::remove_all(kRoot);
+        fs::remove(kRan);
+        fs::create_directories(kFolder);
+        YLIBCErrSetEx(YLIBC_ERR_NONE, "", 0);
+    }
+    void TearDown() override { YLIBPluginExit(pHandle); }
+
+    int Init(const char *szFamily = "qrm_client", const char *szPlugin = "qrm_client/disjoin") {
+        YLIBPluginExit(pHandle);
+        return YLIBPluginSDKInit(szFamily, szPlugin, &pHandle);
+    }
+    int Run(_tag_sdk_plugin_action_ action = SDK_PLUGIN_ACTION_PRE) {
+        return YLIBPluginAction(action, pHandle);
+    }
+
+    YLIBPLUGIN *pHandle = nullptr;
+};
+
+TEST_F(PluginSdk, RunsProgramsInTheOrderOfTheirNamesWithTheArguments) {
+    const std::string strBody =
+        std::string("echo \"$# $1 $QRM_CLIENT_RESULT $QRM_CLIENT_HOST ${HOST-none}\" >>") + kRan;
+    for (const char *szName : {"9-last", "10-first", "20-second"}) {
+        AddProgram(szName, strBody);
+    }
+    ASSERT_GE(Init(), 0);
+    EXPECT_NE(YLIBPluginHasInit(pHandle), 0);
+    EXPECT_GE(YLIBPluginSetArgByInt(pHandle, "RESULT", 0), 0);
+    EXPECT_GE(YLIBPluginSetArg(pHandle, "HOST", "$(a) \"b\"='c'"), 0);
+    EXPECT_EQ(Run(SDK_PLUGIN_ACTION_PRE), 0);
+    EXPECT_GE(YLIBPluginSetArgByInt(pHandle, "RESULT", -1), 0);
+    EXPECT_EQ(Run(SDK_PLUGIN_ACTION_POST), 0);
+
+    std::string strExpected;
+    for (const char *szLine : {"1 pre 0", "1 post -1"}) {
+        for (const char *szName : {"10-first", "20-second", "9-last"}) {
+            strExpected += std::string(szName) + '\n' + szLine + " $(a) \"b\"='c' none\n";
+        }
+    }
+    EXPECT_EQ(Content(kRan), strExpected);
+    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_NONE));
+}
+
+TEST_F(PluginSdk, AllProgramsRunAndTheFirstFailureIsTheResult) {
+    const struct {
+        const char *szFirst;
+        int result;
+        unsigned int code;
+    } rows[] = {{"exit 3", -3, YLIBC_ERR_EXEC_STATUS},
+                {"kill -KILL $$", -137, YLIBC_ERR_EXEC_STATUS},
+                {"sleep 60 & wait", -124, YLIBC_ERR_EXEC_TIME}};
+    const std::string strSettings = Content(kSettings);
+    std::ofstream(kSettings, std::ios::app) << "plugin_timeout=\"1\"\n";
+    AddProgram("0", "true");
+    AddProgram("2", "exit 255");
+    ASSERT_GE(Init(), 0);
+    const auto begin = std::chrono::steady_clock::now();
+    for (const auto &row : rows) {
+        fs::remove(kRan);
+        AddProgram("1", row.szFirst);
+        EXPECT_EQ(Run(), row.result);
+        EXPECT_EQ(YLIBCErrGet(), row.code);
+        EXPECT_EQ(Content(kRan), "0\n1\n2\n");
+    }
+    EXPECT_LT(std::chrono::steady_clock::now() - begin, std::chrono::seconds(20));
+    std::ofstream(kSettings) << strSettings;
+
+    std::ofstream(fs::path(kFolder) / "1") << "#!/no/such/interpreter\n";
+    EXPECT_EQ(Run(), -126);
+    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_EXEC));
+}
+
+TEST_F(PluginSdk, RunsOnlyWhatNobodyElseCanChange) {
+    AddProgram("good", "");
+    AddProgram("group", "", 0775);
+    AddProgram("others", "", 0757);
+    AddProgram("plain", "", 0644);
+    AddProgram(".hidden", "");
+    fs::create_symlink("good", fs::path(kFolder) / "link");
+    fs::create_directory(fs::path(kFolder) / "folder");
+    ASSERT_GE(Init(), 0);
+    EXPECT_EQ(Run(), 0);
+    EXPECT_EQ(Content(kRan), "good\n");
+
+    // The folders on the way are as good as the programs.
+    for (const fs::path &folder : {fs::path(kFolder), fs::path(kFolder).parent_path()}) {
+        fs::permissions(folder, fs::perms::others_write, fs::perm_options::add);
+        EXPECT_LT(Run(), 0);
+        EXPECT_LT(Init(), 0);
+        EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_UNSAFE_FILE));
+        EXPECT_EQ(YLIBPluginHasInit(pHandle), 0);
+        fs::permissions(folder, fs::perms::others_write, fs::perm_options::remove);
+        ASSERT_GE(Init(), 0);
+    }
+    EXPECT_EQ(Content(kRan), "good\n");
+}
+
+TEST_F(PluginSdk, AFreshApplianceHasNothingToRun) {
+    fs::remove_all(kRoot);
+    ASSERT_GE(Init(), 0);
+    EXPECT_NE(YLIBPluginHasInit(pHandle), 0);
+    EXPECT_EQ(Run(), 0);
+    EXPECT_FALSE(fs::exists(kRoot));
+    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_NONE));
+}
+
+TEST_F(PluginSdk, RefusesUnusableNames) {
+    AddProgram("a", "");
+    ASSERT_GE(Init(), 0);
+    const char *const rows[][2] = {{"qrm_client", ""},
+                                   {"qrm_client", "/qrm_client/disjoin"},
+                                   {"qrm_client", "qrm_client/disjoin/"},
+                                   {"qrm_client", "qrm_client//disjoin"},
+                                   {"qrm_client", "qrm_client/../qrm_client/disjoin"},
+                                   {"", "qrm_client/disjoin"},
+                                   {"LD", "qrm_client/disjoin"},
+                                   {"qrm=client", "qrm_client/disjoin"}};
+    for (const auto &row : rows) {
+        SCOPED_TRACE(testing::PrintToString(row));
+        YLIBPLUGIN *pRefused = pHandle;
+        EXPECT_LT(YLIBPluginSDKInit(row[0], row[1], &pRefused), 0);
+        EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_INVALID_ARGUMENT));
+        EXPECT_EQ(pRefused, nullptr);
+    }
+    for (const char *szName : {"", "A=B", "A B"}) {
+        EXPECT_LT(YLIBPluginSetArg(pHandle, szName, "x"), 0);
+        EXPECT_LT(YLIBPluginSetArgByInt(pHandle, szName, 1), 0);
+    }
+    EXPECT_LT(YLIBPluginSetArg(pHandle, "A", nullptr), 0);
+    EXPECT_LT(YLIBPluginAction(SDK_PLUGIN_ACTION_PRE, nullptr), 0);
+    EXPECT_LT(Run(static_cast<_tag_sdk_plugin_action_>(3)), 0);
+    EXPECT_EQ(YLIBPluginExit(nullptr), 0);
+    EXPECT_EQ(Content(kRan), "");
+}
+
+}  // namespace
