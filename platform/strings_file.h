@@ -4,11 +4,13 @@
 //     [section]
 //     key="value"
 //     # comment (the first character that is no blank is '#')
-// or blank. A key belongs to the section above it; the same key may stand in several sections, with
-// a text of its own in each. In a value a backslash begins an escape: \n is a line feed, \t a tab,
-// \r a carriage return, \" a quote and \\ a backslash; a backslash before any other character
-// stands for that character. A line of any other form is passed over. When a section, or a key in
-// it, stands in the file more than once, the first line that answers a question holds.
+// or blank. Blanks at the ends of a line and around the "=" do not count. A key belongs to the
+// section above it; the same key may stand in several sections, with a text of its own in each. In
+// a value a backslash begins an escape: \n is a line feed, \t a tab, \r a carriage return, \" a
+// quote and \\ a backslash; a backslash before any other character stands for that character. A
+// line of any other form, such as one with a zero byte in its value, is passed over. When a
+// section, or a key in it, stands in the file more than once, the first line that answers a
+// question holds.
 //
 // A file may be replaced at any time: a read sees the old file or the new one.
 

@@ -1,0 +1,240 @@
+// Building directories, and the table of those that the process keeps.
+
+#include "strings_directory.h"
+
+#include <pthread.h>
+
+#include <algorithm>
+#include <cstddef>
+#include <ctime>
+#include <limits>
+#include <mutex>
+#include <utility>
+
+namespace host::strings_directory {
+namespace {
+
+constexpr std::size_t kMaxDirectories = 64;
+constexpr std::size_t kMaxBytes = std::size_t{64} * 1024;
+constexpr std::size_t kMaxEntries = (kMaxBytes - sizeof(Directory)) / sizeof(Entry);
+static_assert(kMaxEntries < kNoEntry, "an entry is named by its index");
+
+// What a section's text takes besides its bytes, generously.
+constexpr std::size_t kTextOverhead = 128;
+
+// Larger sections are not kept: one of them would drive out all others.
+constexpr std::size_t kMaxText = std::size_t{16} * 1024;
+
+struct Place {
+    unsigned long lastUse = 0;
+    DirectoryHandle pDirectory;
+};
+
+// Never destroyed, so that it serves until the very end of a process. The lock is never held while
+// a file is read.
+struct Table {
+    std::mutex mutex;
+    unsigned long uses = 0;
+    std::vector<Place> places;
+};
+
+Table &TheTable() {
+    static auto *const pTable = new Table;
+    return *pTable;
+}
+
+void LockBeforeFork() {
+    TheTable().mutex.lock();
+}
+
+void UnlockAfterFork() {
+    TheTable().mutex.unlock();
+}
+
+const int g_forkHandlers = pthread_atfork(LockBeforeFork, UnlockAfterFork, UnlockAfterFork);
+
+bool IsSameFile(const struct stat &a, const struct stat &b) {
+    return a.st_ino == b.st_ino && a.st_dev == b.st_dev;
+}
+
+bool IsSameTime(const timespec &a, const timespec &b) {
+    return a.tv_sec == b.tv_sec && a.tv_nsec == b.tv_nsec;
+}
+
+bool IsUnchanged(const struct stat &a, const struct stat &b) {
+    return IsSameFile(a, b) && a.st_size == b.st_size && IsSameTime(a.st_mtim, b.st_mtim) &&
+           IsSameTime(a.st_ctim, b.st_ctim);
+}
+
+// From a to b; differences of more than a few seconds are all the same.
+std::int64_t Nanoseconds(const timespec &a, const timespec &b) {
+    constexpr std::int64_t kFew = 8;
+    const std::int64_t seconds = std::clamp<std::int64_t>(b.tv_sec - a.tv_sec, -kFew, kFew);
+    return seconds * 1000000000 + b.tv_nsec - a.tv_nsec;
+}
+
+// The steps in which a file's times advance: the kernel's ticks, or two seconds in a file system
+// that keeps no fractions.
+std::int64_t TimeStep(const timespec &time) {
+    timespec tick = {};
+    clock_getres(CLOCK_REALTIME_COARSE, &tick);
+    return time.tv_nsec == 0 ? Nanoseconds({0, 0}, {2, 0}) : 2 * Nanoseconds({0, 0}, tick);
+}
+
+// Reads the file's state. blSettled says whether a later change will show in it: a file that has
+// just been changed can be changed again within the same step of time.
+bool ReadState(int fd, struct stat &state, bool &blSettled) {
+    timespec before = {};
+    timespec after = {};
+    clock_gettime(CLOCK_REALTIME, &before);
+    if (fstat(fd, &state) != 0) {
+        return false;
+    }
+    clock_gettime(CLOCK_REALTIME, &after);
+    const std::int64_t step = TimeStep(state.st_ctim);
+    blSettled =
+        Nanoseconds(state.st_ctim, before) > step || Nanoseconds(after, state.st_ctim) > step;
+    return true;
+}
+
+// Takes the place of the same file's former directory, a new one, or the one used least recently.
+void Keep(const DirectoryHandle &pDirectory) {
+    Table &table = TheTable();
+    const std::lock_guard<std::mutex> lock(table.mutex);
+    auto &places = table.places;
+    auto place = std::find_if(places.begin(), places.end(), [&](const Place &p) {
+        return IsSameFile(p.pDirectory->file, pDirectory->file);
+    });
+    if (place == places.end() && places.size() < kMaxDirectories) {
+        place = places.insert(places.end(), Place());
+    } else if (place == places.end()) {
+        place = std::min_element(places.begin(), places.end(), [](const Place &a, const Place &b) {
+            return a.lastUse < b.lastUse;
+        });
+    }
+    *place = {++table.uses, pDirectory};
+}
+
+// Back to front, so that each bucket has its entries in the file's order.
+void FillBuckets(Directory &directory) {
+    directory.buckets.fill(kNoEntry);
+    for (std::size_t i = directory.entries.size(); i-- > 0;) {
+        Entry &entry = directory.entries[i];
+        auto &first = directory.buckets[entry.hash % kBuckets];
+        entry.next = std::exchange(first, static_cast<std::uint16_t>(i));
+    }
+}
+
+DirectoryHandle Build(int fd) {
+    const auto pDirectory = std::make_shared<Directory>();
+    bool blSettled = false;
+    if (!ReadState(fd, pDirectory->file, blSettled)) {
+        return nullptr;
+    }
+    pDirectory->end = pDirectory->file.st_size;
+    auto &entries = pDirectory->entries;
+    const auto add = [&](off_t begin, std::string_view name) {
+        if (entries.size() == kMaxEntries || begin > std::numeric_limits<std::uint32_t>::max()) {
+            pDirectory->end = begin;
+            return false;
+        }
+        entries.push_back({Hash(name), static_cast<std::uint32_t>(begin), kNoEntry});
+        return true;
+    };
+    if (!WalkSections(fd, 0, pDirectory->end, add)) {
+        return nullptr;
+    }
+    entries.shrink_to_fit();
+    FillBuckets(*pDirectory);
+    if (blSettled) {
+        Keep(pDirectory);
+    }
+    return pDirectory;
+}
+
+std::shared_ptr<const std::string> FindTextLocked(const Directory &directory, std::size_t index) {
+    for (const KeptText &kept : directory.texts) {
+        if (kept.index == index) {
+            return kept.pText;
+        }
+    }
+    return nullptr;
+}
+
+std::size_t Size(const KeptText &kept) {
+    return kept.pText->size() + kTextOverhead;
+}
+
+}  // namespace
+
+// FNV-1a.
+std::uint32_t Hash(std::string_view name) {
+    std::uint32_t hash = 2166136261U;
+    for (const char c : name) {
+        hash = (hash ^ static_cast<unsigned char>(c)) * 16777619U;
+    }
+    return hash;
+}
+
+DirectoryHandle Find(const struct stat &state) {
+    Table &table = TheTable();
+    const std::lock_guard<std::mutex> lock(table.mutex);
+    for (Place &place : table.places) {
+        if (IsUnchanged(place.pDirectory->file, state)) {
+            place.lastUse = ++table.uses;
+            return place.pDirectory;
+        }
+    }
+    return nullptr;
+}
+
+DirectoryHandle Get(int fd) {
+    struct stat state = {};
+    if (fstat(fd, &state) != 0 || !S_ISREG(state.st_mode)) {
+        return nullptr;
+    }
+    auto pDirectory = Find(state);
+    return pDirectory != nullptr ? pDirectory : Build(fd);
+}
+
+void Forget(const Directory &directory) {
+    Table &table = TheTable();
+    const std::lock_guard<std::mutex> lock(table.mutex);
+    auto &places = table.places;
+    places.erase(std::remove_if(places.begin(), places.end(),
+                                [&](const Place &place) {
+                                    return IsSameFile(place.pDirectory->file, directory.file);
+                                }),
+                 places.end());
+}
+
+void KeepText(const Directory &directory, std::size_t index, std::string_view text) {
+    if (text.size() > kMaxText) {
+        return;
+    }
+    KeptText kept = {index, std::make_shared<const std::string>(text)};
+    const std::lock_guard<std::mutex> lock(TheTable().mutex);
+    if (FindTextLocked(directory, index) != nullptr) {
+        return;  // another thread was faster
+    }
+    auto &texts = directory.texts;
+    std::size_t cb = sizeof(Directory) + directory.entries.size() * sizeof(Entry) + Size(kept);
+    for (const KeptText &other : texts) {
+        cb += Size(other);
+    }
+    auto keepFrom = texts.begin();
+    for (; keepFrom != texts.end() && cb > kMaxBytes; ++keepFrom) {
+        cb -= Size(*keepFrom);
+    }
+    texts.erase(texts.begin(), keepFrom);
+    if (cb <= kMaxBytes) {
+        texts.push_back(std::move(kept));
+    }
+}
+
+std::shared_ptr<const std::string> FindText(const Directory &directory, std::size_t index) {
+    const std::lock_guard<std::mutex> lock(TheTable().mutex);
+    return FindTextLocked(directory, index);
+}
+
+}  // namespace host::strings_directory

@@ -1,0 +1,205 @@
+// Strings files: looking a key up with the help of the file's directory.
+
+#include "../strings_file.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+
+#include <new>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <utility>
+
+#include "file_descriptor.h"
+#include "last_error.h"
+#include "line_blocks.h"
+#include "strings_directory.h"
+#include "strings_text.h"
+#include "text_buffer.h"
+
+namespace {
+
+constexpr const char *kFile = "strings_file";
+
+// How often a file is looked at anew that changes while it is read.
+constexpr int kAttempts = 5;
+
+namespace directory = host::strings_directory;
+namespace text = host::strings_text;
+
+enum class Result {
+    kFound,
+    kAbsent,
+    kUnread,  // the file has to be opened to know
+    kChanged  // the file is not what the directory describes
+};
+
+struct Question {
+    int fd;  // negative: the file is not open
+    std::string_view section;
+    std::string_view key;
+};
+
+Result SearchLines(std::string_view lines, const Question &question, std::string &strValue) {
+    auto value = text::FindKey(lines, question.key);
+    if (!value) {
+        return Result::kAbsent;
+    }
+    strValue = std::move(*value);
+    return Result::kFound;
+}
+
+// Whether the text is what the directory says: a section of the question's name, or of another one
+// with the same hash.
+Result CheckSection(std::string_view lines, const Question &question) {
+    const auto name = text::SectionName(text::LineAt(lines, 0));
+    if (name == question.section) {
+        return Result::kFound;
+    }
+    return name && directory::Hash(*name) == directory::Hash(question.section) ? Result::kAbsent
+                                                                               : Result::kChanged;
+}
+
+// Reads and searches the section in a part of the file. keep(text) gets a section that is read in
+// one piece.
+template <typename Keep>
+Result SearchPart(const Question &question, off_t begin, off_t end, Keep &&keep,
+                  std::string &strValue) {
+    host::LineBlocks blocks(question.fd, begin, end);
+    auto lines = blocks.Next();
+    Result result = CheckSection(lines.value_or(""), question);
+    if (result != Result::kFound) {
+        return result;
+    }
+    if (static_cast<off_t>(lines->size()) == end - begin) {
+        keep(*lines);
+    }
+    for (; lines; lines = blocks.Next()) {
+        result = SearchLines(*lines, question, strValue);
+        if (result == Result::kFound) {
+            return result;
+        }
+    }
+    return blocks.Cut() ? Result::kChanged : Result::kAbsent;
+}
+
+// Searches one section of the directory.
+Result SearchSection(const Question &question, const directory::Directory &directory,
+                     std::size_t index, std::string &strValue) {
+    const auto &entries = directory.entries;
+    if (const auto pText = directory::FindText(directory, index)) {
+        const Result result = CheckSection(*pText, question);
+        return result == Result::kFound ? SearchLines(*pText, question, strValue) : result;
+    }
+    if (question.fd < 0) {
+        return Result::kUnread;
+    }
+    const off_t end = index + 1 < entries.size() ? entries[index + 1].begin : directory.end;
+    const auto keep = [&](std::string_view lines) { directory::KeepText(directory, index, lines); };
+    return SearchPart(question, entries[index].begin, end, keep, strValue);
+}
+
+// Searches the sections that did not fit into the directory.
+Result SearchRest(const Question &question, off_t begin, off_t end, std::string &strValue) {
+    constexpr off_t kNone = -1;
+    off_t ours = kNone;  // a section of the name, whose end is not known yet
+    Result result = Result::kAbsent;
+    const auto keepNothing = [](std::string_view /*lines*/) {};
+    const auto visit = [&](off_t next, std::string_view name) {
+        if (ours != kNone) {
+            result = SearchPart(question, ours, next, keepNothing, strValue);
+        }
+        ours = name == question.section ? next : kNone;
+        return result == Result::kAbsent;
+    };
+    if (!directory::WalkSections(question.fd, begin, end, visit)) {
+        return Result::kChanged;
+    }
+    return result == Result::kAbsent && ours != kNone
+               ? SearchPart(question, ours, end, keepNothing, strValue)
+               : result;
+}
+
+Result Search(const Question &question, const directory::Directory &directory,
+              std::string &strValue) {
+    const std::uint32_t hash = directory::Hash(question.section);
+    const auto &entries = directory.entries;
+    for (std::size_t i = directory.buckets[hash % directory::kBuckets]; i != directory::kNoEntry;
+         i = entries[i].next) {
+        if (entries[i].hash != hash) {
+            continue;
+        }
+        const Result result = SearchSection(question, directory, i, strValue);
+        if (result != Result::kAbsent) {
+            return result;
+        }
+    }
+    if (directory.end == directory.file.st_size) {
+        return Result::kAbsent;
+    }
+    return question.fd < 0 ? Result::kUnread
+                           : SearchRest(question, directory.end, directory.file.st_size, strValue);
+}
+
+// Answers from what is kept, as long as the file at the path is the one that it came from.
+Result SearchKept(const char *szPath, const Question &question, std::string &strValue) {
+    struct stat state = {};
+    if (stat(szPath, &state) != 0) {
+        return Result::kUnread;
+    }
+    const auto pDirectory = directory::Find(state);
+    return pDirectory == nullptr ? Result::kUnread : Search(question, *pDirectory, strValue);
+}
+
+Result SearchFile(const Question &question, std::string &strValue) {
+    for (int attempt = 0; attempt < kAttempts; ++attempt) {
+        const auto pDirectory = directory::Get(question.fd);
+        if (pDirectory == nullptr) {
+            continue;
+        }
+        const Result result = Search(question, *pDirectory, strValue);
+        if (result != Result::kChanged) {
+            return result;
+        }
+        directory::Forget(*pDirectory);
+    }
+    return Result::kUnread;
+}
+
+Result Read(const char *szPath, Question question, std::string &strValue) {
+    const Result result = SearchKept(szPath, question, strValue);
+    if (result == Result::kFound || result == Result::kAbsent) {
+        return result;
+    }
+    // Should a FIFO stand at the path, its writer is not waited for.
+    const host::FileDescriptor file(open(szPath, O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
+    if (!file.IsOpen()) {
+        return Result::kUnread;
+    }
+    question.fd = file.Get();
+    return SearchFile(question, strValue);
+}
+
+}  // namespace
+
+int YLIBCFileGetSectionValue(const char *szPath, const char *szSection, const char *szKey,
+                             char *szValue, int cbValue) {
+    if (szPath == nullptr || szSection == nullptr || szKey == nullptr || szValue == nullptr ||
+        cbValue <= 0) {
+        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
+    }
+    try {
+        std::string strValue;
+        switch (Read(szPath, {-1, szSection, szKey}, strValue)) {
+            case Result::kFound:
+                return host::CopyWholeCharacters(strValue, szValue, cbValue);
+            case Result::kAbsent:
+                return HOST_FAIL(YLIBC_ERR_NOT_FOUND);
+            default:
+                return HOST_FAIL(YLIBC_ERR_FILE);
+        }
+    } catch (const std::bad_alloc &) {
+        return HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
+    }
+}

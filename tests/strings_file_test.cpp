@@ -1,0 +1,253 @@
+// Strings files: what a line means, and that no look-up is ever answered from a file's past.
+
+#include "strings_file.h"
+
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <atomic>
+#include <ctime>
+#include <filesystem>
+#include <fstream>
+#include <random>
+#include <sstream>
+#include <thread>
+#include <vector>
+
+#include "last_error.h"
+
+namespace {
+
+constexpr const char *kFile = "/tmp/strings";
+
+// In place: the file stays the same one.
+void Write(const std::string &strText, const char *szPath = kFile) {
+    std::ofstream(szPath, std::ios::binary | std::ios::trunc) << strText;
+}
+
+void Replace(const std::string &strText) {
+    Write(strText, "/tmp/strings.new");
+    std::filesystem::rename("/tmp/strings.new", kFile);
+}
+
+// The value, or "-" and the code of the failure.
+std::string Get(const std::string &strSection, const std::string &strKey) {
+    char sz[256] = "before";
+    const int cb = YLIBCFileGetSectionValue(kFile, strSection.c_str(), strKey.c_str(), sz, 256);
+    if (cb < 0) {
+        return std::string(sz) == "before" ? "-" + std::to_string(YLIBCErrGet()) : "changed";
+    }
+    return static_cast<std::size_t>(cb) == std::string(sz).size() ? sz : "wrong length";
+}
+
+const std::string kNotFound = "-" + std::to_string(YLIBC_ERR_NOT_FOUND);
+
+// Until the system tells the file's last change from a change made now, nothing is kept of it.
+void AwaitAge() {
+    struct stat status = {};
+    ASSERT_EQ(stat(kFile, &status), 0);
+    timespec now = {};
+    do {
+        clock_gettime(CLOCK_REALTIME, &now);
+    } while ((now.tv_sec - status.st_ctim.tv_sec) * 1000000000 + now.tv_nsec -
+                 status.st_ctim.tv_nsec <
+             100000000);
+}
+
+TEST(StringsFile, ReadsEveryFormOfALine) {
+    Replace(
+        "early=\"no section\"\n"
+        "[one]\n"
+        "plain=\"text\"\r\n"
+        " \tspaced \t= \" a b \" \t\r\n"
+        "escapes=\"a\\nb\\tc\\rd\\\"e\\\\f\\x\"\n"
+        "utf8=\"Größe ≥ 1 [x]\"\n"
+        "empty=\"\"\n"
+        "bare=text\nopen=\"text\nescapedend=\"text\\\"\nmore=\"a\" b\ntwo=\"a\"b\"\n"
+        "#plain=\"comment\"\n  # hidden=\"comment\"\n"
+        "[two] tail\n"
+        "after=\"no section\"\n"
+        "  [two]\t\r\n"
+        "plain=\"other\"\n"
+        "=\"no key\"\n"
+        "plain=\"too late\"\n"
+        "[]\n"
+        "key=\"nameless\"\n"
+        "[one]\n"
+        "plain=\"too late\"\n"
+        "more=\"second section\"\n"
+        "last=\"no line feed\"");
+    const struct {
+        const char *szSection;
+        const char *szKey;
+        std::string strValue;
+    } rows[] = {
+        {"one", "plain", "text"},
+        {"one", "spaced", " a b "},
+        {"one", "utf8", "Größe ≥ 1 [x]"},
+        {"one", "escapes", "a\nb\tc\rd\"e\\fx"},
+        {"one", "empty", ""},
+        {"two", "plain", "other"},
+        {"", "key", "nameless"},
+        {"one", "more", "second section"},
+        {"one", "last", "no line feed"},
+        {"one", "after", "no section"},
+        {"one", "early", kNotFound},
+        {"one", "bare", kNotFound},
+        {"one", "open", kNotFound},
+        {"one", "escapedend", kNotFound},
+        {"one", "two", kNotFound},
+        {"one", "hidden", kNotFound},
+        {"one", "#plain", kNotFound},
+        {"one", "spaced ", kNotFound},
+        {"one", "plai", kNotFound},
+        {"one", "", kNotFound},
+        {"two", "", kNotFound},
+        {"two] tail", "after", kNotFound},
+        {"three", "plain", kNotFound},
+        {"on", "plain", kNotFound},
+    };
+    for (const bool blKept : {false, true}) {
+        for (const auto &row : rows) {
+            EXPECT_EQ(Get(row.szSection, row.szKey), row.strValue)
+                << row.szSection << ":" << row.szKey << blKept;
+        }
+        AwaitAge();
+    }
+}
+
+TEST(StringsFile, CutsBetweenCharactersAndRefusesWhatItCannotUse) {
+    Replace("[s]\nk=\"aé€\"\n");
+    const char *const cuts[] = {"", "a", "a", "aé", "aé", "aé", "aé€", "aé€"};
+    for (int cb = 1; cb <= 8; ++cb) {
+        char sz[8] = "xxxxxxx";
+        EXPECT_EQ(YLIBCFileGetSectionValue(kFile, "s", "k", sz, cb),
+                  static_cast<int>(std::string(cuts[cb - 1]).size()));
+        EXPECT_STREQ(sz, cuts[cb - 1]);
+    }
+    char sz[8] = "before";
+    mkfifo("/tmp/fifo", 0600);
+    for (const char *szPath : {"/tmp/fifo", "/tmp", "/tmp/none", "/dev/null"}) {
+        EXPECT_LT(YLIBCFileGetSectionValue(szPath, "s", "k", sz, 8), 0) << szPath;
+        EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_FILE));
+    }
+    EXPECT_LT(YLIBCFileGetSectionValue(kFile, "s", nullptr, sz, 8), 0);
+    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_INVALID_ARGUMENT));
+    EXPECT_LT(YLIBCFileGetSectionValue(kFile, "s", "k", sz, 0), 0);
+    EXPECT_STREQ(sz, "before");
+}
+
+TEST(StringsFile, SeesEveryChangeAtOnce) {
+    const std::string strSections[] = {"[a]\nk=\"1\"\n[b]\nk=\"1\"\n",
+                                       "[b]\nk=\"2\"\n[a]\nk=\"2\"\n"};
+    // Changes of the same size, faster than the file's times advance.
+    for (int i = 0; i < 300; ++i) {
+        Write(strSections[i % 2]);
+        ASSERT_EQ(Get("a", "k"), i % 2 == 0 ? "1" : "2");
+    }
+    // Of the same size, and with the former time of modification, after the file has been kept.
+    for (const bool blInPlace : {true, false}) {
+        Write(strSections[0]);
+        AwaitAge();
+        ASSERT_EQ(Get("a", "k"), "1");
+        struct stat status = {};
+        stat(kFile, &status);
+        blInPlace ? Write(strSections[1]) : Replace(strSections[1]);
+        const timespec times[] = {status.st_atim, status.st_mtim};
+        utimensat(AT_FDCWD, kFile, times, 0);
+        EXPECT_EQ(Get("a", "k"), "2");
+    }
+    AwaitAge();
+    EXPECT_EQ(Get("a", "k"), "2");
+    std::filesystem::resize_file(kFile, 11);
+    EXPECT_EQ(Get("a", "k"), kNotFound);
+    EXPECT_EQ(Get("b", "k"), "2");
+    std::filesystem::remove(kFile);
+    EXPECT_EQ(Get("b", "k"), "-" + std::to_string(YLIBC_ERR_FILE));
+}
+
+// The meaning of a file of plain lines, without any haste.
+std::string Meaning(const std::string &strText, const std::string &strSection,
+                    const std::string &strKey) {
+    std::istringstream lines(strText);
+    bool blOurs = false;
+    for (std::string strLine; std::getline(lines, strLine);) {
+        if (strLine.front() == '[') {
+            blOurs = strLine == "[" + strSection + "]";
+        } else if (blOurs && strLine.rfind(strKey + "=\"", 0) == 0) {
+            return strLine.substr(strKey.size() + 2, strLine.size() - strKey.size() - 3);
+        }
+    }
+    return kNotFound;
+}
+
+TEST(StringsFile, AnswersAlikeHoweverManySectionsThereAre) {
+    std::mt19937 random(1);
+    // Few sections with long lines between them, some that come twice, more than are kept.
+    for (const unsigned sections : {5U, 300U, 20000U}) {
+        std::string strText;
+        for (unsigned i = 0; i < sections; ++i) {
+            strText += "[s" + std::to_string(random() % sections) + "]\n";
+            for (unsigned n = random() % 4; n > 0; --n) {
+                strText += "k" + std::to_string(random() % 4) + "=\"" + std::to_string(random()) +
+                           "\"\n#" + std::string(random() % (200000 / sections), '[') + "\n";
+            }
+        }
+        Replace(strText);
+        for (const bool blKept : {false, true}) {
+            for (int i = 0; i < 25; ++i) {
+                const std::string strSection = "s" + std::to_string(random() % (sections + 1));
+                const std::string strKey = "k" + std::to_string(random() % 4);
+                ASSERT_EQ(Get(strSection, strKey), Meaning(strText, strSection, strKey))
+                    << sections << strSection << strKey << blKept;
+            }
+            AwaitAge();
+        }
+    }
+}
+
+TEST(StringsFile, IsSafeWhileTheFileIsCutShortAndProcessesFork) {
+    std::string strText;
+    for (int i = 0; i < 100; ++i) {
+        strText += "#" + std::string(2000, ' ') + "\n[s" + std::to_string(i) + "]\nk=\"value\"\n";
+    }
+    Replace(strText);
+    std::atomic<bool> blDone(false);
+    std::atomic<int> found(0);
+    std::vector<std::thread> readers;
+    readers.reserve(3);
+    for (int t = 0; t < 3; ++t) {
+        readers.emplace_back([&, t] {
+            for (int i = t; !blDone; i = (i + 7) % 100) {
+                const std::string strValue = Get("s" + std::to_string(i), "k");
+                EXPECT_TRUE(strValue == "value" || strValue[0] == '-') << strValue;
+                found += strValue == "value" ? 1 : 0;
+            }
+        });
+    }
+    for (int i = 0; i < 150 || found < 300; ++i) {
+        i % 3 == 0 ? Replace(strText) : Write(strText.substr(0, strText.size() * (i % 3) / 2));
+    }
+    Replace(strText);
+    AwaitAge();
+    EXPECT_EQ(Get("s1", "k"), "value");
+    int status = 0;
+    for (int i = 0; i < 40 && status == 0; ++i) {
+        const pid_t pid = fork();
+        if (pid == 0) {
+            alarm(10);
+            _exit(Get("s1", "k") == "value" ? 0 : 1);
+        }
+        waitpid(pid, &status, 0);
+    }
+    EXPECT_EQ(status, 0);
+    blDone = true;
+    for (std::thread &reader : readers) {
+        reader.join();
+    }
+}
+
+}  // namespace
