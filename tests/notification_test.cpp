@@ -1,0 +1,238 @@
+// Notifications: what stands in the journal, what hooks are told, and which hooks are run at all.
+
+#include "notification.h"
+
+#include <gtest/gtest.h>
+#include <json/reader.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <syslog.h>
+#include <unistd.h>
+
+#include <cstdarg>
+#include <cstdio>
+#include <filesystem>
+#include <fstream>
+#include <map>
+#include <set>
+#include <vector>
+
+#include "last_error.h"
+#include "strings_file.h"
+
+namespace {
+
+namespace fs = std::filesystem;
+
+constexpr const char *kJournal = "/var/log/notifications.jsonl";
+constexpr const char *kFormerJournal = "/var/log/notifications.jsonl.1";
+constexpr const char *kHooks = "/usr/zelo/etc/notify.d";
+constexpr const char *kHookOutput = "/var/log/hooks";
+
+using Variables = std::vector<std::pair<std::string, std::string>>;
+
+std::vector<std::string> g_logLines;
+
+int Send(const char *szTag, const Variables &variables = {}) {
+    YLIBSZHASH *pHash = YLIBCSzHashAlloc(512);
+    for (const auto &[strName, strValue] : variables) {
+        YLIBCSzHashSetValue(&pHash, strName.c_str(), strValue.c_str());
+    }
+    const int result = ZELOSysNotifySendNotifiction(szTag, &pHash);
+    YLIBCSzHashFree(pHash);
+    return result;
+}
+
+std::vector<std::string> Lines(const char *szPath) {
+    std::ifstream file(szPath);
+    std::vector<std::string> lines;
+    for (std::string strLine; std::getline(file, strLine);) {
+        lines.push_back(strLine);
+    }
+    return lines;
+}
+
+Json::Value Parse(const std::string &strLine) {
+    Json::Value entry;
+    EXPECT_TRUE(Json::Reader().parse(strLine, entry)) << strLine;
+    return entry;
+}
+
+void Hook(const std::string &strName, const std::string &strScript, mode_t mode = 0755) {
+    const std::string strPath = std::string(kHooks) + "/" + strName;
+    std::ofstream(strPath) << "#!/bin/sh\n" << strScript << "\n";
+    chmod(strPath.c_str(), mode);
+}
+
+class Notification : public testing::Test {
+  protected:
+    void SetUp() override {
+        fs::remove_all(kJournal);
+        fs::remove_all(kFormerJournal);
+        fs::remove_all(kHooks);
+        fs::remove_all(kHookOutput);
+        fs::create_directory(kHooks);
+        chmod(kHooks, 0755);
+        g_logLines.clear();
+    }
+};
+
+TEST_F(Notification, TheJournalHoldsTheTextsInTheLanguage) {
+    const struct {
+        const char *szLanguage;
+        const char *szTag;
+        const char *szTitle;
+        const char *szTextStart;
+    } rows[] = {
+        {"", "QRMClientConnectFailed", "QRM server cannot be reached", "This appliance could not"},
+        {"ger", "QRMClientDetachSuccess", "Nicht mehr vom QRM-Server verwaltet", "Dieses Gerät"},
+        {"jpn", "QRMClientConnectFailed", "QRM サーバーに接続できません", "このデバイスは"},
+        {"xyz", "QRMClientDetachSuccess", "No longer managed by the QRM server", "This appliance"},
+        {"../ger", "QRMClientConnectFailed", "QRM server cannot be reached", "This appliance"},
+        {"ger", "NoSuchTag", "NoSuchTag", ""},
+    };
+    const std::string strServer = "%OTHER%\n\"x\"\\\x01 é";
+    std::size_t count = 0;
+    for (const auto &row : rows) {
+        std::ofstream("/etc/zeloinfo.conf") << "language=\"" << row.szLanguage << "\"\n";
+        YLIBCErrSetEx(0x1234, "before", 7);
+        ASSERT_EQ(Send(row.szTag, {{"%QRM_SERVER%", strServer}, {"%OTHER%", "wrong"}}), 0);
+        EXPECT_EQ(YLIBCErrGet(), 0x1234U) << "a success is no error";
+        const auto lines = Lines(kJournal);
+        ASSERT_EQ(lines.size(), ++count);
+        const Json::Value entry = Parse(lines.back());
+        EXPECT_EQ(entry["tag"], row.szTag);
+        EXPECT_EQ(entry["title"], row.szTitle);
+        const std::string strText = entry["text"].asString();
+        EXPECT_EQ(strText.rfind(row.szTextStart, 0), 0U) << strText;
+        EXPECT_EQ(strText.find(strServer) != std::string::npos, *row.szTextStart != '\0');
+        EXPECT_EQ(entry["variables"]["%QRM_SERVER%"], strServer);
+        EXPECT_EQ(entry["variables"].size(), 2U);
+        EXPECT_EQ(entry["time"].asString().size(), std::string("2000-01-01T00:00:00Z").size());
+    }
+    EXPECT_EQ(ZELOSysNotifySendNotifiction("NoSuchTag", nullptr), 0);
+    EXPECT_LT(ZELOSysNotifySendNotifiction(nullptr, nullptr), 0);
+    EXPECT_LT(ZELOSysNotifySendNotifiction("", nullptr), 0);
+    EXPECT_EQ(Lines(kJournal).size(), count + 1);
+}
+
+TEST_F(Notification, HooksRunInTheirOrderWhateverOneOfThemDoes) {
+    const std::string strTell =
+        "echo ${0##*/} $1 $ZELO_NOTIFY_TITLE/$ZELO_NOTIFY_VAR_QRM_SERVER >>";
+    for (const char *szName : {"30-d", "10-a", "40-e", "20-c", "Z", "11-b"}) {
+        Hook(szName, strTell + kHookOutput);
+    }
+    Hook("15-fails", "exit 3");
+    Hook("16-dies", "kill -9 $$");
+    Hook("17-open", strTell + kHookOutput, 0775);
+    Hook("README", strTell + kHookOutput, 0644);
+    fs::create_directory(std::string(kHooks) + "/folder");
+    fs::create_symlink("10-a", std::string(kHooks) + "/18-link");
+    EXPECT_EQ(Send("Tag", {{"%QRM_SERVER%", "a b;c"}}), 0);
+    const std::vector<std::string> expected = {"10-a Tag Tag/a b;c", "11-b Tag Tag/a b;c",
+                                               "20-c Tag Tag/a b;c", "30-d Tag Tag/a b;c",
+                                               "40-e Tag Tag/a b;c", "Z Tag Tag/a b;c"};
+    EXPECT_EQ(Lines(kHookOutput), expected);
+    std::string strLog;
+    for (const std::string &strLine : g_logLines) {
+        strLog += strLine + "\n";
+    }
+    EXPECT_EQ(g_logLines.size(), 4U) << strLog;
+    for (const char *szPart : {"15-fails' failed for 'Tag': exit status 3", "16-dies' failed",
+                               "17-open' is not run", "18-link' is not run"}) {
+        EXPECT_NE(strLog.find(szPart), std::string::npos) << szPart << " in " << strLog;
+    }
+
+    // A journal that cannot be written is a failure, but hooks are told all the same.
+    fs::remove(kJournal);
+    std::ofstream("/var/log/elsewhere").flush();
+    fs::create_symlink("elsewhere", kJournal);
+    EXPECT_LT(Send("Tag"), 0);
+    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_UNSAFE_FILE));
+    EXPECT_EQ(fs::file_size("/var/log/elsewhere"), 0U);
+    EXPECT_EQ(Lines(kHookOutput).size(), 2 * expected.size());
+
+    chmod(kHooks, 0777);
+    Send("Tag");
+    EXPECT_EQ(Lines(kHookOutput).size(), 2 * expected.size())
+        << "anybody could have put a hook there";
+}
+
+TEST_F(Notification, ProcessesAppendAtOnceAndEveryLineIsWhole) {
+    constexpr int kProcesses = 4;
+    constexpr int kEach = 50;
+    std::ofstream(kJournal) << "{\"half";
+    std::vector<pid_t> children;
+    for (int process = 0; process < kProcesses; ++process) {
+        children.push_back(fork());
+        if (children.back() == 0) {
+            int result = 0;
+            for (int i = 0; i < kEach; ++i) {
+                const std::string strId = std::to_string(process) + ":" + std::to_string(i);
+                result |= Send("Tag", {{"id", strId}, {"filler", std::string(8000, 'x')}});
+            }
+            _exit(result == 0 ? 0 : 1);
+        }
+    }
+    for (const pid_t pid : children) {
+        int status = -1;
+        waitpid(pid, &status, 0);
+        EXPECT_EQ(status, 0);
+    }
+    std::set<std::string> ids;
+    auto lines = Lines(kFormerJournal);
+    ASSERT_FALSE(lines.empty()) << "1.6 MB fit into no single journal";
+    EXPECT_EQ(lines.front(), "{\"half");
+    lines.erase(lines.begin());
+    for (const char *szPath : {kFormerJournal, kJournal}) {
+        EXPECT_LE(fs::file_size(szPath), 1024U * 1024U);
+    }
+    for (const std::string &strLine : Lines(kJournal)) {
+        lines.push_back(strLine);
+    }
+    for (const std::string &strLine : lines) {
+        ids.insert(Parse(strLine)["variables"]["id"].asString());
+    }
+    EXPECT_EQ(lines.size(), static_cast<std::size_t>(kProcesses * kEach));
+    EXPECT_EQ(ids.size(), lines.size());
+}
+
+TEST(InterfaceTexts, EveryLanguageHasEveryTextWithTheSameMarkers) {
+    const std::string strFolder = "/usr/zelo/zeloman/webman/texts/";
+    int languages = 0;
+    for (const auto &language : fs::directory_iterator(strFolder)) {
+        ++languages;
+        std::string strSection;
+        for (const std::string &strLine : Lines((strFolder + "enu/strings").c_str())) {
+            if (strLine[0] == '[') {
+                strSection = strLine.substr(1, strLine.size() - 2);
+            } else if (const auto equals = strLine.find('='); equals != std::string::npos) {
+                char sz[512] = {};
+                const std::string strKey = strLine.substr(0, equals);
+                ASSERT_GT(YLIBCFileGetSectionValue((language.path() / "strings").c_str(),
+                                                   strSection.c_str(), strKey.c_str(), sz, 512),
+                          0)
+                    << language.path() << strKey;
+                for (const char *szMarker : {"{0}", "{1}", "{2}", "%QRM_SERVER%"}) {
+                    EXPECT_EQ(std::string(sz).find(szMarker) == std::string::npos,
+                              strLine.find(szMarker) == std::string::npos)
+                        << language.path() << strKey;
+                }
+            }
+        }
+    }
+    EXPECT_EQ(languages, 20);
+}
+
+}  // namespace
+
+// The host platform's log lines end here.
+extern "C" __attribute__((visibility("default"))) void syslog(int /*level*/, const char *szFormat,
+                                                              ...) {
+    char sz[1024];
+    va_list args;
+    va_start(args, szFormat);
+    std::vsnprintf(sz, sizeof(sz), szFormat, args);
+    va_end(args);
+    g_logLines.emplace_back(sz);
+}
