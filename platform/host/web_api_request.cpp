@@ -3,6 +3,7 @@
 #include "../web_api_request.h"
 
 #include <pthread.h>
+#include <syslog.h>
 
 #include <algorithm>
 #include <map>
@@ -131,6 +132,15 @@ struct Observer {
 
 thread_local Observer t_observer;
 
+// A server without a path for the API: says why. The query names nothing that helps, and it came
+// from a caller.
+std::string NoPath(const std::string &strUrl, const std::string &strReason, int line) {
+    syslog(LOG_WARNING, "%s:%d %s: %s", kFile, line, strUrl.substr(0, strUrl.find('?')).c_str(),
+           strReason.c_str());
+    YLIBCErrSetEx(YLIBC_ERR_REPLY, kFile, line);
+    return {};
+}
+
 std::string Discover(const Server &server, const std::string &api) {
     host::HttpRequest request;
     request.strUrl =
@@ -138,23 +148,29 @@ std::string Discover(const Server &server, const std::string &api) {
     request.blRelay = server.blRelay;
     host::HttpReply reply;
     if (request.strUrl.empty()) {
+        syslog(LOG_WARNING, "%s:%d a host or port that cannot stand in an URL", kFile, __LINE__);
         HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
         return {};
     }
     if (host::Perform(request, reply) != CRED_REQ_ERR_NONE) {
         return {};
     }
+    if (reply.status != kStatusOk) {
+        return NoPath(request.strUrl, "answers with status " + std::to_string(reply.status),
+                      __LINE__);
+    }
     Json::Value envelope;
-    if (reply.status != kStatusOk || !json_text::FromString(reply.strBody, envelope) ||
-        !json_text::IsTrue(json_text::Member(envelope, "success"))) {
-        HOST_FAIL(YLIBC_ERR_REPLY);
-        return {};
+    if (!json_text::FromString(reply.strBody, envelope) ||
+        !json_text::HasMember(envelope, "success")) {
+        return NoPath(request.strUrl, "does not answer like a QRM server", __LINE__);
+    }
+    if (!json_text::IsTrue(json_text::Member(envelope, "success"))) {
+        return NoPath(request.strUrl, "does not serve the Web API", __LINE__);
     }
     const char *szPath =
         json_text::Text(json_text::Member(json_text::Member(envelope, "data"), "path"));
     if (szPath == nullptr || !IsPath(szPath)) {
-        HOST_FAIL(YLIBC_ERR_REPLY);
-        return {};
+        return NoPath(request.strUrl, "names no path that can be used", __LINE__);
     }
     Paths().Learn(server.Key(api), szPath);
     return szPath;
