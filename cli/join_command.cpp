@@ -1,13 +1,17 @@
 // qrmctl join: the enrolling program. The library's join stores where the server is; the session
 // with the access token is this program's to store, and what is added is its to remove on failure.
 
+#include <algorithm>
+#include <cstring>
 #include <memory>
+#include <vector>
 
 #include "candidates.h"
 #include "commands.h"
 #include "credential_store.h"
 #include "input_file.h"
 #include "json_text.h"
+#include "platform_handles.h"
 #include "serial_number.h"
 #include "zeloqrmclient.h"
 
@@ -16,7 +20,6 @@ namespace {
 
 constexpr const char *kApplication = "ZELO.QRM";
 constexpr const char *kApi = "ZELO.QRM.RPC";
-constexpr int kMaxRecords = 1000;
 
 struct Options {
     std::string strServer;
@@ -29,11 +32,6 @@ struct Options {
     bool blAllowHttp = false;
 };
 
-struct FreeSession {
-    void operator()(ZELO_CRED_SESS *pSess) const { ZELOCredSessFree(pSess); }
-};
-using SessionHandle = std::unique_ptr<ZELO_CRED_SESS, FreeSession>;
-
 std::string SerialNumber() {
     char sz[36] = {};
     if (YLIBGetCustomSerialNumber(sz, 31) < 0 || sz[0] == '\0') {
@@ -42,24 +40,61 @@ std::string SerialNumber() {
     return sz;
 }
 
-// Only the server's records: the notification center's have an owner of their own.
-bool RemoveServerCredentials() {
-    for (int i = 0; i < kMaxRecords; ++i) {
-        const long id = ZELOCredIDGetByApplication(kApplication);
+// A filter that keeps the server's credentials but those whose ids are in a text such as " 3 7 ".
+int KeepUnlisted(const ZELO_CRED *pCred, const char *szIds) {
+    long id = -1;
+    return ZELOCredKeepByApplication(pCred, kApplication) != 0 &&
+                   ZELOCredItemGetID(&id, pCred) >= 0 &&
+                   std::strstr(szIds, (' ' + std::to_string(id) + ' ').c_str()) == nullptr
+               ? 1
+               : 0;
+}
+
+// Looks for a server credential that is not among the known ones; id is negative when there is
+// none. Returns false when the store cannot be read.
+bool FindUnknown(const std::vector<long> &known, long &id) {
+    std::string strIds = " ";
+    for (long knownId : known) {
+        strIds += std::to_string(knownId) + ' ';
+    }
+    ZELO_CRED *pFirst = nullptr;
+    const int count = ZELOCredListGet(&pFirst, KeepUnlisted, strIds.c_str());
+    const CredListHandle list(pFirst);
+    id = -1;
+    return count == 0 || (count > 0 && ZELOCredItemGetID(&id, pFirst) >= 0);
+}
+
+bool FindAll(std::vector<long> &ids) {
+    long id = -1;
+    while (FindUnknown(ids, id)) {
         if (id < 0) {
             return true;
         }
-        if (ZELOCredSessRemoveByID(id) < 0 || ZELOCredRemoveByID(id) < 0) {
+        ids.push_back(id);
+    }
+    return false;
+}
+
+bool Remove(long id) {
+    return ZELOCredSessRemoveByID(id) >= 0 && ZELOCredRemoveByID(id) >= 0;
+}
+
+bool RemoveUnknown(const std::vector<long> &known) {
+    long id = -1;
+    while (FindUnknown(known, id)) {
+        if (id < 0) {
+            return true;
+        }
+        if (!Remove(id)) {
             return false;
         }
     }
     return false;
 }
 
-bool StoreSession(const std::string &strToken) {
-    const long id = ZELOCredIDGetByApplication(kApplication);
-    const SessionHandle pSess(ZELOCredSessAlloc());
-    return id >= 0 && pSess != nullptr && ZELOCredSessItemSetID(pSess.get(), id) >= 0 &&
+bool StoreSession(long id, const std::string &strToken) {
+    const CredSessHandle pSess(ZELOCredSessAlloc());
+    return pSess != nullptr && ZELOCredSessItemSetID(pSess.get(), id) >= 0 &&
            ZELOCredSessItemSetAccessToken(pSess.get(), strToken.c_str()) >= 0 &&
            ZELOCredSessSave(pSess.get()) >= 0;
 }
@@ -118,19 +153,50 @@ Json::Value AllCandidates(const Json::Value &joinInfo) {
     return all;
 }
 
-// Takes back what a failed join added, and puts the credential back that stood before.
-ExitCode FailAndRestore(const std::string &strError, const Json::Value &before, Report &report) {
-    if (!RemoveServerCredentials()) {
+// Takes back what a failed join added to the credentials that were stored before.
+ExitCode FailAndTakeBack(const std::string &strError, const std::vector<long> &before,
+                         Report &report) {
+    if (!RemoveUnknown(before)) {
         return report.Fail(strError +
                            "; what it stored could not be removed: run "
                            "'qrmctl credential delete'");
     }
-    if (before.isMember("access_token")) {
-        return ZELOQRMClientCreateServerCredential(before)
-                   ? report.Fail(strError + "; the credential stored before is in force again")
-                   : report.Fail(strError + "; the credential stored before is lost");
+    return report.Fail(strError + (before.empty() ? "; nothing of it stays stored"
+                                                  : "; the credential stored before is in force"));
+}
+
+// The lowest id is in force, so a credential that is there already stays in force until the new one
+// is complete, whenever this program ends.
+ExitCode JoinAndStore(const Json::Value &joinInfo, Report &report) {
+    std::vector<long> before;
+    if (!FindAll(before)) {
+        return report.Fail(
+            "the credential store cannot be read, nothing was changed; -v shows the reason");
     }
-    return report.Fail(strError + "; nothing of it stays stored");
+    if (ZELOQRMClientSendCreateClient(joinInfo) != 0) {
+        return FailAndTakeBack(
+            "the server did not accept the join (check token and serial number; -v shows its "
+            "answer), or the appliance's model, version or ports could not be read (check "
+            "/etc.defaults/zeloinfo.conf, /etc.defaults/VERSION and /etc/zeloinfo.conf)",
+            before, report);
+    }
+    long id = -1;
+    if (!FindUnknown(before, id) || !StoreSession(id, joinInfo["access_token"].asString())) {
+        return FailAndTakeBack("the session could not be stored", before, report);
+    }
+    if (!std::all_of(before.begin(), before.end(), Remove)) {
+        return report.Fail(
+            "the server accepted the join, but a credential stored before could not be removed "
+            "and may be in force: run 'qrmctl credential delete' and join again");
+    }
+    Json::Value server(Json::objectValue);
+    ZELOQRMClientGetServerCredential(server);
+    for (const char *szName : {"protocol", "host", "port"}) {
+        report.Fact(szName, server[szName]);
+    }
+    report.Fact("sn", joinInfo["sn"]);
+    report.Say("Joined. The server's address and the access token are stored.");
+    return report.Done();
 }
 
 ExitCode Join(const Options &options, Report &report) {
@@ -145,39 +211,14 @@ ExitCode Join(const Options &options, Report &report) {
             "no candidate has an https port, and the access token does not go over plain http: "
             "give --https-port, or accept the risk with --allow-http");
     }
+    // A join without a connection would look to its caller like one that the server refused.
     Json::Value connection;
     if (!ZELOQRMClientTestConnect(candidates, kApi, connection)) {
         return report.Fail("no server answered at '" + options.strServer +
                            "' or any other candidate, nothing was changed: check address, ports "
                            "and certificate; -v shows the reason of each attempt");
     }
-
-    // The lowest id is in force, so a credential that is there already has to go first.
-    Json::Value before(Json::objectValue);
-    if (ZELOCredIDGetByApplication(kApplication) >= 0) {
-        ZELOQRMClientGetServerCredentialWithToken(before);
-        if (before.isMember("sn")) {
-            before["extra_info"]["sn"] = before["sn"];
-        }
-    }
-    if (!RemoveServerCredentials()) {
-        return FailAndRestore("the credential stored before could not be removed", before, report);
-    }
-    if (ZELOQRMClientSendCreateClient(joinInfo) != 0) {
-        return FailAndRestore(
-            "the server did not accept the join: check token and serial number; -v shows its "
-            "answer",
-            before, report);
-    }
-    if (!StoreSession(joinInfo["access_token"].asString())) {
-        return FailAndRestore("the session could not be stored", before, report);
-    }
-    report.Fact("protocol", connection["protocol"]);
-    report.Fact("host", connection["host"]);
-    report.Fact("port", connection["port"]);
-    report.Fact("sn", joinInfo["sn"]);
-    report.Say("Joined. The server's address and the access token are stored.");
-    return report.Done();
+    return JoinAndStore(joinInfo, report);
 }
 
 }  // namespace
