@@ -227,7 +227,10 @@ void AddJoin(CLI::App &app, Action &action) {
     auto *const pCommand = app.add_subcommand("join", "Join a QRM server");
     const auto pOptions = std::make_shared<Options>();
     pCommand->add_option("--server", pOptions->strServer, "The server's name or address")
-        ->required();
+        ->required()
+        ->check([](const std::string &strHost) {
+            return std::string(strHost.empty() ? "name the server" : "");
+        });
     pCommand->add_option("--http-port", pOptions->httpPort, "Its port for plain HTTP")
         ->required()
         ->check(CLI::Range(0, 65535));

@@ -10,20 +10,28 @@
 
 namespace {
 
-// Every command at every level takes the same two flags.
+// Every command at every level takes the same two flags, so that they may stand anywhere.
 void AddCommonFlags(CLI::App &app, bool &blJson, bool &blVerbose) {
+    app.add_flag("--json", blJson, "Print one JSON object");
+    app.add_flag("-v", blVerbose, "Show the library's log lines on standard error");
     for (CLI::App *pCommand : app.get_subcommands(nullptr)) {
-        if (pCommand->get_subcommands(nullptr).empty()) {
-            pCommand->add_flag("--json", blJson, "Print one JSON object");
-            pCommand->add_flag("-v", blVerbose, "Show the library's log lines on standard error");
-        }
         AddCommonFlags(*pCommand, blJson, blVerbose);
     }
+}
+
+// A misspelt command or option is what the user has to know, not what is missing because of it.
+std::string UsageMessage(const CLI::App *pApp, const CLI::Error &error) {
+    const std::vector<std::string> unknown = pApp->remaining(true);
+    const std::string strWhat =
+        unknown.empty() ? error.what() : "'" + unknown.front() + "' is no command or option here";
+    return "qrmctl: " + qrmctl::Printable(strWhat) +
+           "; 'qrmctl --help' shows the commands, 'qrmctl COMMAND --help' the options of one\n";
 }
 
 int Run(int argc, char **argv) {
     CLI::App app("Makes this appliance a client of a QRM server, and shows what it is.", "qrmctl");
     app.require_subcommand(1);
+    app.failure_message(UsageMessage);
     qrmctl::Action action;
     qrmctl::AddTestConnection(app, action);
     qrmctl::AddJoin(app, action);
