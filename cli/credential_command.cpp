@@ -1,8 +1,10 @@
 // qrmctl credential: show, create, update and delete the stored server credential.
 
+#include <cstring>
 #include <memory>
 
 #include "commands.h"
+#include "credential_store.h"
 #include "input_file.h"
 #include "json_text.h"
 #include "zeloqrmclient.h"
@@ -40,9 +42,12 @@ std::string Flaw(const Json::Value &cred, bool blComplete) {
     }
     for (const char *szName : {"protocol", "host", "application", "access_token"}) {
         const bool blNeeded = blComplete || std::string(szName) == "application";
-        if (!HasMember(cred, szName) ? blNeeded
-                                     : json_text::Text(Member(cred, szName)) == nullptr) {
+        const char *szText = json_text::Text(Member(cred, szName));
+        if (szText == nullptr && (blNeeded || HasMember(cred, szName))) {
             return std::string("\"") + szName + "\" has to be a text";
+        }
+        if (szText != nullptr && std::strlen(szText) > kMaxStoredText) {
+            return std::string("\"") + szName + "\" has to be a text of at most 1023 bytes";
         }
     }
     int port = 0;
@@ -62,13 +67,19 @@ ExitCode Change(const std::string &strFile, bool blCreate, Report &report) {
     if (!strFlaw.empty()) {
         return report.Fail("cannot use credential '" + strFile + "': " + strFlaw);
     }
+    const std::string strApplication = cred["application"].asString();
+    const bool blBehind = blCreate && ZELOCredIDGetByApplication(strApplication.c_str()) >= 0;
     if (blCreate && !ZELOQRMClientCreateServerCredential(cred)) {
         return report.Fail("the credential could not be stored; -v shows the reason");
     }
     if (!blCreate && !ZELOQRMClientUpdateServerCredential(cred)) {
         return report.Fail(
             "the credential could not be changed: is one stored for the application '" +
-            cred["application"].asString() + "', with a session? -v shows more");
+            strApplication + "', with a session? -v shows more");
+    }
+    if (blBehind) {
+        report.Warn("the credential that was stored for '" + strApplication +
+                    "' before stays in force: 'qrmctl credential delete' removes it");
     }
     report.Say(blCreate ? "The credential is stored." : "The credential is changed.");
     return report.Done();
@@ -77,6 +88,10 @@ ExitCode Change(const std::string &strFile, bool blCreate, Report &report) {
 ExitCode Delete(Report &report) {
     if (!ZELOQRMClientDeleteServerCredential()) {
         return report.Fail("the credential could not be removed whole; -v shows the reason");
+    }
+    if (ZELOCredIDGetByApplication("ZELO.QRM") >= 0) {
+        report.Warn("a server credential that was stored later is in force now: delete again");
+        return report.Done();
     }
     report.Say("No server credential is stored any more.");
     return report.Done();

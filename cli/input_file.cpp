@@ -11,10 +11,6 @@
 namespace qrmctl {
 namespace {
 
-// The credential store gives a token back through a buffer of this size; a longer one would come
-// back cut.
-constexpr std::size_t kMaxToken = 1023;
-
 bool ReadAll(const char *szWhat, const std::string &strFile, std::string &strText,
              std::string &strError) {
     std::ostringstream text;
@@ -28,7 +24,8 @@ bool ReadAll(const char *szWhat, const std::string &strFile, std::string &strTex
         }
         if (!file.is_open() || file.bad() || errno == EISDIR) {
             strError = std::string("cannot read ") + szWhat + " '" + strFile +
-                       "': " + std::strerror(errno == 0 ? EIO : errno);
+                       "': " + std::strerror(errno == 0 ? EIO : errno) +
+                       "; name a file that can be read, or - for standard input";
             return false;
         }
     }
@@ -65,8 +62,8 @@ bool ReadTokenFile(const std::string &strFile, std::string &strToken, std::strin
     const char *szReason = nullptr;
     if (strText.empty()) {
         szReason = "it is empty; write the access token into it";
-    } else if (strText.size() > kMaxToken) {
-        szReason = "a token has at most 1023 bytes";
+    } else if (strText.size() > kMaxStoredText) {
+        szReason = "a token has at most 1023 bytes; check that the file holds nothing else";
     }
     for (char c : strText) {
         if (static_cast<unsigned char>(c) <= 0x20 || c == 0x7F) {

@@ -5,9 +5,13 @@
 
 #include <json/value.h>
 
+#include <cstddef>
 #include <string>
 
 namespace qrmctl {
+
+// A longer text would come back from the credential store cut.
+constexpr std::size_t kMaxStoredText = 1023;
 
 // Each returns whether the input can be used; if not, strError says in one line what is wrong with
 // which file. "-" is standard input. szWhat names the input in messages, such as "candidate list".
