@@ -41,8 +41,10 @@ bool ReadToken(const std::string &strFile, std::string &strToken) {
         return Complain("cannot read token file '" + strFile + "': name a file that can be read");
     }
     strText.resize(static_cast<std::size_t>(file.gcount()));
-    if (!strText.empty() && strText.back() == '\n') {
-        strText.pop_back();
+    for (char c : {'\n', '\r'}) {
+        if (!strText.empty() && strText.back() == c) {
+            strText.pop_back();
+        }
     }
     if (strText.empty() || strText.size() >= kMaxToken ||
         strText.find_first_of(std::string("\n\0", 2)) != std::string::npos) {
@@ -117,7 +119,11 @@ int Serve(const devserver::Options &options, const Files &files) {
 int Run(int argc, char **argv) {
     devserver::Options options;
     Files files;
-    CLI::App app("A QRM server for development, on loopback");
+    CLI::App app("A QRM server for development, on loopback", "qrm-devserver");
+    app.failure_message([](const CLI::App *, const CLI::Error &error) {
+        return std::string("qrm-devserver: ") + error.what() +
+               "; 'qrm-devserver --help' shows the options\n";
+    });
     app.add_option("--token-file", files.token, "File with the access token")->required();
     app.add_option("--http-port", options.http_port, "Port for HTTP, 0 for a free one")
         ->check(CLI::Range(0, 65535));
