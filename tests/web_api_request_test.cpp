@@ -18,6 +18,7 @@ namespace {
 
 constexpr const char *kApi = "ZELO.QRM.RPC";
 constexpr const char *kCaFile = "/usr/zelo/etc/ssl/ca.d/server.pem";
+constexpr const char *kOtherCaFile = "/usr/zelo/etc/ssl/ca.d/other.pem";
 constexpr const char *kConfig = "/etc/zeloinfo.conf";
 
 using Cred = std::unique_ptr<ZELO_CRED, void (*)(ZELO_CRED *)>;
@@ -73,9 +74,15 @@ TEST_F(Request, OnlyAVerifiedServerIsSpokenTo) {
     std::filesystem::remove(kCaFile);
     EXPECT_EQ(Https(), "") << "an authority that is gone is not trusted any more";
     EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_NETWORK));
-    Write(kCaFile, "no certificate");
-    EXPECT_EQ(Https(), "");
     Write(kCaFile, m_pServer->CaPem());
+    EXPECT_EQ(Https(), "/qrm/rpc");
+    std::ofstream(kCaFile) << "no certificate";
+    EXPECT_EQ(Https(), "") << "a file that is written to is another one";
+    Write(kCaFile, m_pServer->CaPem());
+    EXPECT_EQ(Https(), "/qrm/rpc");
+    Write(kOtherCaFile, "no certificate");
+    EXPECT_EQ(Https(), "") << "a file that came counts too";
+    std::filesystem::remove(kOtherCaFile);
     EXPECT_EQ(Https(), "/qrm/rpc");
 
     devserver::Options options;

@@ -9,8 +9,8 @@
 #include <algorithm>
 #include <filesystem>
 #include <memory>
+#include <string>
 #include <system_error>
-#include <vector>
 
 namespace host {
 namespace {
@@ -77,25 +77,37 @@ bool AddApplianceCa(X509_STORE *pStore) {
     return blAll;
 }
 
-std::string ApplianceCaState() {
-    std::vector<std::string> states;
+CaState CaState::Now() {
+    CaState state;
+    // The folder first: what comes while it is read makes another state later.
+    state.Add(kFolder);
     std::error_code error;
     fs::directory_iterator entries(kFolder, error);
     for (; !error && entries != fs::directory_iterator(); entries.increment(error)) {
-        struct stat status = {};
-        if (IsPemName(entries->path()) && stat(entries->path().c_str(), &status) == 0) {
-            states.push_back(entries->path().filename().string() + ' ' +
-                             std::to_string(status.st_ino) + ' ' + std::to_string(status.st_size) +
-                             ' ' + std::to_string(status.st_ctim.tv_sec) + '.' +
-                             std::to_string(status.st_ctim.tv_nsec));
+        if (IsPemName(entries->path())) {
+            state.Add(entries->path().string());
         }
     }
-    std::sort(states.begin(), states.end());
-    std::string strState = error ? "?" : "";
-    for (const std::string &strFile : states) {
-        strState += strFile + '\n';
+    return state;
+}
+
+bool CaState::Holds() const {
+    return std::all_of(m_entries.begin(), m_entries.end(),
+                       [](const auto &entry) { return Look(entry.first) == entry.second; });
+}
+
+bool CaState::Version::operator==(const Version &other) const {
+    return device == other.device && inode == other.inode && size == other.size &&
+           changed.tv_sec == other.changed.tv_sec && changed.tv_nsec == other.changed.tv_nsec;
+}
+
+CaState::Version CaState::Look(const std::string &strPath) {
+    struct stat status = {};
+    // What is not there looks the same each time.
+    if (stat(strPath.c_str(), &status) != 0) {
+        status = {};
     }
-    return strState;
+    return {status.st_dev, status.st_ino, status.st_size, status.st_ctim};
 }
 
 }  // namespace host

@@ -55,7 +55,7 @@ struct FreeText {
 // process can close its copies without a word on the wire.
 struct Connection {
     std::set<curl_socket_t> sockets;
-    std::string strCaState;
+    CaState caState;
     // Goes first: cleaning it up closes its sockets, which calls back to the set above.
     std::unique_ptr<CURL, CleanupEasy> pEasy;
 };
@@ -169,12 +169,11 @@ class Borrowed {
         if (globalInit != CURLE_OK) {
             return;
         }
-        const std::string strCaState = ApplianceCaState();
-        m_pConnection = TakeIdle(strCaState);
+        m_pConnection = TakeIdle();
         if (m_pConnection == nullptr) {
             m_pConnection = std::make_unique<Connection>();
             m_pConnection->pEasy.reset(curl_easy_init());
-            m_pConnection->strCaState = strCaState;
+            m_pConnection->caState = CaState::Now();
         }
         const std::lock_guard<std::mutex> lock(ThePool().mutex);
         ThePool().inUse.insert(m_pConnection.get());
@@ -201,7 +200,7 @@ class Borrowed {
 
   private:
     // Connections verified against another set of authorities are not used again.
-    static std::unique_ptr<Connection> TakeIdle(const std::string &strCaState) {
+    static std::unique_ptr<Connection> TakeIdle() {
         Pool &pool = ThePool();
         std::unique_ptr<Connection> pConnection;
         while (true) {
@@ -214,7 +213,7 @@ class Borrowed {
                 pConnection = std::move(pool.idle.back());
                 pool.idle.pop_back();
             }
-            if (pConnection->strCaState == strCaState) {
+            if (pConnection->caState.Holds()) {
                 return pConnection;
             }
             // Outside the lock: closing a connection calls back into the pool.
