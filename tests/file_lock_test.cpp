@@ -1,0 +1,187 @@
+// Locks by lock file: who excludes whom, when a lock is free again, and what is no lock file.
+
+#include "file_lock.h"
+
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+
+#include <chrono>
+#include <filesystem>
+#include <fstream>
+#include <thread>
+
+#include "children.h"
+#include "last_error.h"
+
+namespace {
+
+namespace fs = std::filesystem;
+using Clock = std::chrono::steady_clock;
+
+constexpr const char *kLock = "/tmp/a.lock";
+constexpr const char *kVictim = "/tmp/victim";
+
+// Whether the lock could be had in the time; it is released again.
+bool IsFree(int timeout_s = 0) {
+    int handle = 5;
+    const int result = YLIBCFileLockTimeByFile(kLock, 1, timeout_s, &handle);
+    EXPECT_TRUE(result == 1 ? handle >= 0 : result < 0 && handle == -1) << result << ' ' << handle;
+    return result == 1 && YLIBCFileUnlockByFile(handle) == 0;
+}
+
+int Take() {
+    int handle = -1;
+    EXPECT_EQ(YLIBCFileLockByFile(kLock, 0, &handle), 1);
+    return handle;
+}
+
+unsigned Mode(const char *szPath) {
+    struct stat status = {};
+    return stat(szPath, &status) == 0 ? status.st_mode & 07777U : 0;
+}
+
+bool HasOpen(pid_t pid, const char *szPath) {
+    for (const auto &entry : fs::directory_iterator("/proc/" + std::to_string(pid) + "/fd")) {
+        std::error_code gone;
+        if (fs::read_symlink(entry.path(), gone) == szPath) {
+            return true;
+        }
+    }
+    return false;
+}
+
+TEST(FileLock, IsHeldFromTakingToRelease) {
+    // Whoever may open a lock file could hold it.
+    std::ofstream(kLock).flush();
+    chmod(kLock, 0666);
+    const int handle = Take();
+    EXPECT_EQ(Mode(kLock), 0600U);
+    EXPECT_FALSE(IsFree());
+    EXPECT_TRUE(children::Ended(children::Start([] { return !IsFree(); })));
+    EXPECT_EQ(YLIBCFileUnlockByFile(handle), 0);
+    EXPECT_TRUE(IsFree());
+    for (int none : {handle, -1, STDERR_FILENO, 123456}) {
+        EXPECT_LT(YLIBCFileUnlockByFile(none), 0);
+        EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_INVALID_ARGUMENT));
+    }
+    EXPECT_NE(fcntl(STDERR_FILENO, F_GETFD), -1);
+}
+
+TEST(FileLock, ThreadsAndProcessesWaitForEachOther) {
+    constexpr const char *kCounter = "/tmp/counter";
+    std::ofstream(kCounter) << 0;
+    const auto countUp = [] {
+        for (int i = 0; i < 100; ++i) {
+            const int handle = Take();
+            int n = -1;
+            std::ifstream(kCounter) >> n;
+            std::ofstream(kCounter) << n + 1;
+            YLIBCFileUnlockByFile(handle);
+        }
+    };
+    const auto countUpTwice = [&] {
+        std::thread other(countUp);
+        countUp();
+        other.join();
+        return true;
+    };
+    const pid_t pids[] = {children::Start(countUpTwice), children::Start(countUpTwice)};
+    EXPECT_TRUE(children::Ended(pids[0]));
+    EXPECT_TRUE(children::Ended(pids[1]));
+    int n = -1;
+    std::ifstream(kCounter) >> n;
+    EXPECT_EQ(n, 400);
+}
+
+TEST(FileLock, WaitsNoLongerThanItsTime) {
+    const int handle = Take();
+    const struct {
+        int timeout_s;
+        std::chrono::milliseconds least;
+        std::chrono::milliseconds most;
+    } rows[] = {{1, std::chrono::seconds(1), std::chrono::milliseconds(1900)},
+                {0, {}, std::chrono::milliseconds(900)},
+                {-1, {}, std::chrono::milliseconds(900)}};
+    for (const auto &row : rows) {
+        const auto begin = Clock::now();
+        EXPECT_FALSE(IsFree(row.timeout_s));
+        EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_BUSY));
+        const auto waited = Clock::now() - begin;
+        EXPECT_TRUE(waited >= row.least && waited <= row.most) << row.timeout_s;
+    }
+    EXPECT_EQ(YLIBCFileUnlockByFile(handle), 0);
+}
+
+TEST(FileLock, IsNoChildsAndNoProgrammes) {
+    const children::Signal end;
+    const std::pair<const char *, std::function<bool(int handle)>> rows[] = {
+        {"killed, with a child that lives on",
+         [&](int handle) {
+             children::Start([&] { return YLIBCFileUnlockByFile(handle) < 0 && end.Await(); });
+             return raise(SIGKILL) == 0;
+         }},
+        {"replaced by a program",
+         [&](int) { return end.BecomeInput() && execl("/bin/cat", "cat", nullptr) == 0; }},
+    };
+    for (const auto &row : rows) {
+        SCOPED_TRACE(row.first);
+        const children::Signal held;
+        const children::Signal goOn;
+        const pid_t pid = children::Start([&] {
+            const int handle = Take();
+            return held.Give() && goOn.Await() && row.second(handle);
+        });
+        ASSERT_TRUE(held.Await());
+        EXPECT_FALSE(IsFree());
+        EXPECT_TRUE(goOn.Give());
+        EXPECT_TRUE(IsFree(5));
+        EXPECT_TRUE(end.Give());
+        children::Kill(pid);
+    }
+}
+
+TEST(FileLock, IsOneLockAlsoWhenItsFileIsRemoved) {
+    const int handle = Take();
+    const children::Signal begun;
+    const pid_t waiter = children::Start([&] {
+        begun.Give();
+        const int own = Take();
+        return !IsFree() && YLIBCFileUnlockByFile(own) == 0;
+    });
+    ASSERT_TRUE(begun.Await());
+    const auto end = Clock::now() + std::chrono::seconds(10);
+    while (!HasOpen(waiter, kLock)) {
+        ASSERT_LT(Clock::now(), end);
+    }
+    fs::remove(kLock);
+    EXPECT_EQ(YLIBCFileUnlockByFile(handle), 0);
+    EXPECT_TRUE(children::Ended(waiter));
+}
+
+TEST(FileLock, TrapsAreRefused) {
+    std::ofstream(kVictim).flush();
+    chmod(kVictim, 0644);
+    const std::pair<YLIBC_ERROR, std::function<void()>> rows[] = {
+        {YLIBC_ERR_UNSAFE_FILE, [] { fs::create_symlink(kVictim, kLock); }},
+        {YLIBC_ERR_UNSAFE_FILE, [] { fs::create_symlink("/tmp/lured", kLock); }},
+        {YLIBC_ERR_UNSAFE_FILE, [] { fs::create_hard_link(kVictim, kLock); }},
+        {YLIBC_ERR_UNSAFE_FILE, [] { mkfifo(kLock, 0600); }},
+        {YLIBC_ERR_FILE, [] { fs::create_directory(kLock); }},
+    };
+    for (const auto &[code, set] : rows) {
+        fs::remove(kLock);
+        set();
+        EXPECT_FALSE(IsFree(20));
+        EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(code));
+    }
+    fs::remove(kLock);
+    EXPECT_EQ(Mode(kVictim), 0644U);
+    EXPECT_FALSE(fs::exists("/tmp/lured"));
+    int handle = -1;
+    EXPECT_LT(YLIBCFileLockByFile(nullptr, 0, &handle), 0);
+    EXPECT_LT(YLIBCFileLockByFile(kLock, 0, nullptr), 0);
+    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_INVALID_ARGUMENT));
+}
+
+}  // namespace
