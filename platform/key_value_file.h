@@ -6,17 +6,20 @@
 //     # comment (the first character that is no blank is '#')
 // or blank. Blanks around the key, around the "=" and after the value do not count. Inside double
 // quotes a backslash takes the next character as it is, so a value may hold quotes and backslashes;
-// without quotes the value runs to the end of the line. Lines of any other form are passed over.
-// When a key stands in a file more than once, the first line with it holds.
+// without quotes the value runs to the end of the line. Lines of any other form are passed over,
+// such as those without a key or with a zero byte. When a key stands in a file more than once, the
+// first line with it holds.
 //
 // The operations open and close the file in each call; nothing is cached and any thread may call
 // them at any time. A file is only ever replaced as a whole: a reader sees the old file or the new
 // one, also when the writer dies half-way. Two writers at once are the callers' to keep apart
 // (file_lock.h): each writes whole files, so the later one may undo the earlier one's change.
 //
-// A file may stand in a folder that everybody can write to, such as "/tmp": there a link, or a file
-// that belongs to somebody else (root excepted), is refused. A failure sets the last error
-// (last_error.h).
+// A file may stand in a folder that everybody can write to, such as "/tmp": what is no regular file
+// there, or belongs to somebody else (root excepted), or is a link or a second name of another file
+// is refused (YLIBC_ERR_UNSAFE_FILE), and a change does not wait for the disk. In any other folder
+// links are followed, a change through a link replaces the file that it leads to, and a change is
+// durable when the operation returns. A failure sets the last error (last_error.h).
 
 #ifndef ZELO_PLATFORM_KEY_VALUE_FILE_H
 #define ZELO_PLATFORM_KEY_VALUE_FILE_H
@@ -47,15 +50,17 @@ ZELO_PLATFORM_API int YLIBCFileGetKeyValue(const char *szPath, const char *szKey
 ZELO_PLATFORM_API int YLIBCFileCheckKeyValue(const char *szPath, const char *szKey,
                                              const char *szExpected, int flags);
 
-// Writes the value of szKey into the file szPath; a file that is not there is created (mode 0644).
-// The line with the key (of several the first) gets the new value, and a new key becomes the last
-// line; all other lines stay as they are, comments and order included, and the file keeps its mode
-// and owner. A value that the file holds already is not written again.
+// Writes the value of szKey into the file szPath; a file that is not there is created (mode 0644,
+// whatever the process's umask). The line with the key (of several the first) gets the new value,
+// and a new key becomes the last line; all other lines stay as they are, comments and order
+// included, and the file keeps its mode and owner. A value that the file holds already is not
+// written again.
 //
 // Returns 0 on success. Returns a negative value, with the file as it was, when it cannot be read
 // or written, or (YLIBC_ERR_INVALID_ARGUMENT) when the format cannot hold the key or the value: a
 // line feed or carriage return in either, a key that is empty, holds "=", begins with "#" or has
-// blanks at its ends.
+// blanks at its ends. When the change is there and only could not be made durable, the result is
+// negative too.
 //
 // flags is reserved: callers pass 0, a port ignores it.
 ZELO_PLATFORM_API int YLIBCFileSetKeyValue(const char *szPath, const char *szKey,
@@ -63,20 +68,22 @@ ZELO_PLATFORM_API int YLIBCFileSetKeyValue(const char *szPath, const char *szKey
 
 // Removes every line with szKey from the file szPath, in the same way.
 //
-// Returns 0 or more on success; a key or a file that is not there counts as removed. Returns a
-// negative value, with the file as it was, when it cannot be read or written.
+// Returns 0 or more on success; a key or a file that is not there counts as removed, and nothing is
+// written then. Returns a negative value, with the file as it was, when it cannot be read or
+// written.
 ZELO_PLATFORM_API int YLIBCFileRemoveKey(const char *szPath, const char *szKey);
 
-// Reads all pairs of the file szPath into the hash, in the order of the file; of a key that stands
-// there more than once the first value. Pairs that are in the hash already stay unless the file has
-// their key.
+// Reads all pairs of the file szPath into the hash *ppHash, in the order of the file; of a key that
+// stands there more than once the first value. Pairs that are in the hash already stay, and one
+// whose key the file has too gets the file's value in its old place.
 //
-// Returns the number of pairs read, 0 or more, or a negative value when the file cannot be read;
-// the hash may then hold some of them.
+// Returns the number of keys read, 0 or more, or a negative value when the file cannot be read or
+// is not there, or memory is short; the hash may then hold some of the pairs.
 ZELO_PLATFORM_API int YLIBCFileGetPair(const char *szPath, YLIBSZHASH **ppHash);
 
 // Writes the value of szKey into the platform's own configuration, "/etc/zeloinfo.conf", as
-// YLIBCFileSetKeyValue does, and excludes other writers of that file meanwhile.
+// YLIBCFileSetKeyValue does, and excludes other callers of this operation meanwhile. No other
+// file than that one and its lock file comes into being.
 //
 // Returns 0 on success, a negative value otherwise.
 ZELO_PLATFORM_API int YLIBCINFOSetKeyValue(const char *szKey, const char *szValue);

@@ -1,4 +1,4 @@
-// Key-value files, serial numbers, the host name, and the facts that the library makes of them.
+// Serial numbers, the host name, and the facts that the library makes of them.
 
 #include <gtest/gtest.h>
 #include <sched.h>
@@ -9,77 +9,13 @@
 #include <fstream>
 
 #include "host_name.h"
-#include "key_value_file.h"
-#include "last_error.h"
 #include "qrm_client_description.h"
 #include "serial_number.h"
 
 namespace {
 
-constexpr const char *kFile = "/tmp/settings.conf";
-
 void Write(const char *szPath, const std::string &strText) {
     std::ofstream(szPath) << strText;
-}
-
-TEST(KeyValueFile, ReadsEveryFormOfALine) {
-    Write(kFile,
-          "# plain=comment\n"
-          "  #blank=comment\n"
-          "plain=value one\n"
-          "quoted=\"value two\"\r\n"
-          " spaced = \t\"three\"  \n"
-          "escaped=\"a \\\"b\\\" \\\\ c\"\n"
-          "empty=\n"
-          "emptyquoted=\"\"\n"
-          "no line\n"
-          "open=\"never closed\n"
-          "equals=a=b\n"
-          "plain=second\n"
-          "last=no line feed");
-    const struct {
-        const char *szKey;
-        int result;
-        const char *szValue;
-    } rows[] = {
-        {"plain", 9, "value one"},
-        {"quoted", 9, "value two"},
-        {"spaced", 5, "three"},
-        {"escaped", 9, "a \"b\" \\ c"},
-        {"empty", 0, ""},
-        {"emptyquoted", 0, ""},
-        {"open", 12, "never closed"},
-        {"equals", 3, "a=b"},
-        {"last", 12, "no line feed"},
-        {"absent", 0, ""},
-        {"blank", 0, ""},
-        {"#blank", 0, ""},
-        {"plai", 0, ""},
-    };
-    for (const auto &row : rows) {
-        char sz[64] = "before";
-        EXPECT_EQ(YLIBCFileGetKeyValue(kFile, row.szKey, sz, sizeof(sz), 0), row.result)
-            << row.szKey;
-        EXPECT_STREQ(sz, row.szValue);
-        EXPECT_EQ(YLIBCFileCheckKeyValue(kFile, row.szKey, row.szValue, 0),
-                  row.result > 0 || std::string(row.szKey).find("empty") == 0);
-    }
-}
-
-TEST(KeyValueFile, CutsAndRefuses) {
-    Write(kFile, "key=0123456789\n");
-    char sz[5] = "xxxx";
-    EXPECT_EQ(YLIBCFileGetKeyValue(kFile, "key", sz, sizeof(sz), 0), 4);
-    EXPECT_STREQ(sz, "0123");
-    EXPECT_EQ(YLIBCFileCheckKeyValue(kFile, "key", "0123", 0), 0);
-    EXPECT_LT(YLIBCFileGetKeyValue("/tmp/none", "key", sz, sizeof(sz), 0), 0);
-    EXPECT_STREQ(sz, "");
-    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_FILE));
-    EXPECT_LT(YLIBCFileCheckKeyValue("/tmp", "key", "x", 0), 0);
-    EXPECT_LT(YLIBCFileGetKeyValue(nullptr, "key", sz, sizeof(sz), 0), 0);
-    EXPECT_LT(YLIBCFileGetKeyValue(kFile, "key", sz, 0, 0), 0);
-    EXPECT_LT(YLIBCFileCheckKeyValue(kFile, nullptr, "x", 0), 0);
-    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_INVALID_ARGUMENT));
 }
 
 TEST(SerialNumber, TheCustomOneComesFirst) {

@@ -1,31 +1,24 @@
-// Key-value files: a line reader without state.
+// Key-value files: read as a whole, line by line, and written as a whole.
 
 #include "../key_value_file.h"
 
-#include <cstdio>
-#include <cstdlib>
-#include <memory>
 #include <new>
 #include <string_view>
+#include <unordered_set>
 
+#include "../file_lock.h"
+#include "file_replacement.h"
 #include "key_value_lookup.h"
 #include "last_error.h"
 #include "text_buffer.h"
+#include "trusted_file.h"
 
 namespace {
 
 constexpr const char *kFile = "key_value_file";
+constexpr const char *kConfigLock = "/etc/.zeloinfo.conf.lock";
 
-using FileHandle = std::unique_ptr<std::FILE, int (*)(std::FILE *)>;
-
-struct LineBuffer {
-    char *sz = nullptr;
-    std::size_t cb = 0;
-    LineBuffer() = default;
-    LineBuffer(const LineBuffer &) = delete;
-    LineBuffer &operator=(const LineBuffer &) = delete;
-    ~LineBuffer() { std::free(sz); }
-};
+// --- The format ---------------------------------------------------------------------------------
 
 std::string_view Trim(std::string_view text) {
     constexpr std::string_view kBlanks = " \t\r\n";
@@ -49,48 +42,175 @@ std::string Unquote(std::string_view quoted) {
     return strValue;
 }
 
-bool ParseLine(std::string_view line, std::string_view key, std::string &strValue) {
-    line = Trim(line);
-    const std::size_t equals = line.find('=');
-    if (line.empty() || line.front() == '#' || equals == std::string_view::npos ||
-        Trim(line.substr(0, equals)) != key) {
-        return false;
+std::string ValueOf(std::string_view text) {
+    return !text.empty() && text.front() == '"' ? Unquote(text) : std::string(text);
+}
+
+// A line of a file, with its line feed. One that is no pair has an empty key, and so has one with a
+// zero byte: no caller could be handed it whole.
+struct Line {
+    std::string_view text;
+    std::string_view key;
+    std::string_view value;
+
+    bool HasKey(std::string_view wanted) const { return !key.empty() && key == wanted; }
+};
+
+// Takes the next line off the front of the text. False at the end.
+bool TakeLine(std::string_view &text, Line &line) {
+    const std::size_t end = text.find('\n');
+    line = {text.substr(0, end == std::string_view::npos ? end : end + 1), {}, {}};
+    text.remove_prefix(line.text.size());
+    const std::size_t equals = line.text.find('=');
+    if (equals == std::string_view::npos || line.text.find('\0') != std::string_view::npos) {
+        return !line.text.empty();
     }
-    const std::string_view value = Trim(line.substr(equals + 1));
-    strValue = !value.empty() && value.front() == '"' ? Unquote(value) : std::string(value);
+    const std::string_view key = Trim(line.text.substr(0, equals));
+    if (!key.empty() && key.front() != '#') {
+        line.key = key;
+        line.value = Trim(line.text.substr(equals + 1));
+    }
     return true;
 }
 
-host::LookUp Read(const char *szPath, const char *szKey, std::string &strValue) {
-    try {
-        return host::LookUpKey(szPath, szKey, strValue);
-    } catch (const std::bad_alloc &) {
-        HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
-        return host::LookUp::kUnreadable;
+// Takes lines off the front of the text up to the first one with the key. False when there is none.
+bool TakeLineWithKey(std::string_view &text, std::string_view key, Line &line) {
+    while (TakeLine(text, line)) {
+        if (line.HasKey(key)) {
+            return true;
+        }
     }
+    return false;
+}
+
+bool HoldsLineEnd(std::string_view text) {
+    return text.find_first_of("\r\n") != std::string_view::npos;
+}
+
+// Whether a line written with the key and the value reads as that pair.
+bool CanHold(std::string_view key, std::string_view value) {
+    return !key.empty() && key.front() != '#' && key.find('=') == std::string_view::npos &&
+           Trim(key) == key && !HoldsLineEnd(key) && !HoldsLineEnd(value);
+}
+
+// In quotes every value reads as it was written, whatever it begins or ends with.
+void AppendLine(std::string &strText, std::string_view key, std::string_view value) {
+    strText.append(key).append("=\"");
+    for (char c : value) {
+        if (c == '"' || c == '\\') {
+            strText += '\\';
+        }
+        strText += c;
+    }
+    strText += "\"\n";
+}
+
+// --- Reading and changing -----------------------------------------------------------------------
+
+// Runs the body of an operation. Short memory fails it like anything else.
+template <typename Body>
+int Guarded(const Body &body) {
+    try {
+        return body();
+    } catch (const std::bad_alloc &) {
+        return HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
+    }
+}
+
+bool Read(const char *szPath, std::string &strText) {
+    host::FoundFile found;
+    switch (host::FindFile(szPath, found)) {
+        case host::Find::kFile:
+            return host::ReadContent(found, strText);
+        case host::Find::kNoFile:
+            HOST_FAIL(YLIBC_ERR_FILE);
+            return false;
+        default:
+            return false;
+    }
+}
+
+// The same for a file that may be missing: it then counts as empty.
+bool ReadForChange(const char *szPath, host::FoundFile &found, std::string &strText) {
+    const host::Find find = host::FindFile(szPath, found);
+    return find == host::Find::kNoFile ||
+           (find == host::Find::kFile && host::ReadContent(found, strText));
+}
+
+int SetValue(const char *szPath, std::string_view key, std::string_view value) {
+    host::FoundFile found;
+    std::string strOld;
+    if (!ReadForChange(szPath, found, strOld)) {
+        return -1;
+    }
+    std::string strNew;
+    Line line;
+    std::string_view rest = strOld;
+    if (TakeLineWithKey(rest, key, line)) {
+        if (ValueOf(line.value) == value) {
+            return 0;
+        }
+        strNew.assign(strOld, 0, strOld.size() - rest.size() - line.text.size());
+    } else {
+        strNew = strOld;
+        if (!strNew.empty() && strNew.back() != '\n') {
+            strNew += '\n';
+        }
+    }
+    AppendLine(strNew, key, value);
+    strNew.append(rest);
+    return host::ReplaceFile(found, strNew);
+}
+
+int RemoveLines(const char *szPath, std::string_view key) {
+    host::FoundFile found;
+    std::string strOld;
+    if (!ReadForChange(szPath, found, strOld)) {
+        return -1;
+    }
+    std::string strNew;
+    Line line;
+    for (std::string_view rest = strOld; TakeLine(rest, line);) {
+        if (!line.HasKey(key)) {
+            strNew.append(line.text);
+        }
+    }
+    return strNew.size() == strOld.size() ? 0 : host::ReplaceFile(found, strNew);
+}
+
+int ReadPairs(const char *szPath, YLIBSZHASH **ppHash) {
+    std::string strText;
+    if (!Read(szPath, strText)) {
+        return -1;
+    }
+    std::unordered_set<std::string_view> keys;
+    Line line;
+    for (std::string_view rest = strText; TakeLine(rest, line);) {
+        // Of several lines with a key the first one holds.
+        if (!line.key.empty() && keys.insert(line.key).second &&
+            YLIBCSzHashSetValue(ppHash, std::string(line.key).c_str(),
+                                ValueOf(line.value).c_str()) < 0) {
+            return -1;
+        }
+    }
+    return static_cast<int>(keys.size());
 }
 
 }  // namespace
 
 host::LookUp host::LookUpKey(const char *szPath, const char *szKey, std::string &strValue) {
-    const FileHandle pFile(std::fopen(szPath, "re"), std::fclose);
-    if (pFile == nullptr) {
-        HOST_FAIL(YLIBC_ERR_FILE);
+    std::string strText;
+    if (!Read(szPath, strText)) {
         return LookUp::kUnreadable;
     }
-    LineBuffer line;
-    ssize_t cb = 0;
-    while ((cb = getline(&line.sz, &line.cb, pFile.get())) >= 0) {
-        if (ParseLine({line.sz, static_cast<std::size_t>(cb)}, szKey, strValue)) {
-            return LookUp::kFound;
-        }
+    Line line;
+    std::string_view rest = strText;
+    if (!TakeLineWithKey(rest, szKey, line)) {
+        HOST_FAIL(YLIBC_ERR_NOT_FOUND);
+        return LookUp::kAbsent;
     }
-    if (std::ferror(pFile.get()) != 0) {
-        HOST_FAIL(YLIBC_ERR_FILE);
-        return LookUp::kUnreadable;
-    }
-    HOST_FAIL(YLIBC_ERR_NOT_FOUND);
-    return LookUp::kAbsent;
+    strValue = ValueOf(line.value);
+    return LookUp::kFound;
 }
 
 int YLIBCFileGetKeyValue(const char *szPath, const char *szKey, char *szValue, int cbValue,
@@ -102,15 +222,17 @@ int YLIBCFileGetKeyValue(const char *szPath, const char *szKey, char *szValue, i
     if (szPath == nullptr || szKey == nullptr) {
         return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
     }
-    std::string strValue;
-    switch (Read(szPath, szKey, strValue)) {
-        case host::LookUp::kFound:
-            return host::CopyText(strValue, szValue, cbValue);
-        case host::LookUp::kAbsent:
-            return 0;
-        default:
-            return -1;
-    }
+    return Guarded([&] {
+        std::string strValue;
+        switch (host::LookUpKey(szPath, szKey, strValue)) {
+            case host::LookUp::kFound:
+                return host::CopyText(strValue, szValue, cbValue);
+            case host::LookUp::kAbsent:
+                return 0;
+            default:
+                return -1;
+        }
+    });
 }
 
 int YLIBCFileCheckKeyValue(const char *szPath, const char *szKey, const char *szExpected,
@@ -118,13 +240,52 @@ int YLIBCFileCheckKeyValue(const char *szPath, const char *szKey, const char *sz
     if (szPath == nullptr || szKey == nullptr || szExpected == nullptr) {
         return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
     }
-    std::string strValue;
-    switch (Read(szPath, szKey, strValue)) {
-        case host::LookUp::kFound:
-            return strValue == szExpected ? 1 : 0;
-        case host::LookUp::kAbsent:
-            return 0;
-        default:
-            return -1;
+    return Guarded([&] {
+        std::string strValue;
+        switch (host::LookUpKey(szPath, szKey, strValue)) {
+            case host::LookUp::kFound:
+                return strValue == szExpected ? 1 : 0;
+            case host::LookUp::kAbsent:
+                return 0;
+            default:
+                return -1;
+        }
+    });
+}
+
+int YLIBCFileSetKeyValue(const char *szPath, const char *szKey, const char *szValue,
+                         int /*flags*/) {
+    if (szPath == nullptr || szPath[0] == '\0' || szKey == nullptr || szValue == nullptr ||
+        !CanHold(szKey, szValue)) {
+        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
     }
+    return Guarded([&] { return SetValue(szPath, szKey, szValue); });
+}
+
+int YLIBCFileRemoveKey(const char *szPath, const char *szKey) {
+    if (szPath == nullptr || szPath[0] == '\0' || szKey == nullptr) {
+        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
+    }
+    return Guarded([&] { return RemoveLines(szPath, szKey); });
+}
+
+int YLIBCFileGetPair(const char *szPath, YLIBSZHASH **ppHash) {
+    if (szPath == nullptr || ppHash == nullptr || *ppHash == nullptr) {
+        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
+    }
+    return Guarded([&] { return ReadPairs(szPath, ppHash); });
+}
+
+int YLIBCINFOSetKeyValue(const char *szKey, const char *szValue) {
+    // What is refused does not leave a lock file behind.
+    if (szKey == nullptr || szValue == nullptr || !CanHold(szKey, szValue)) {
+        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
+    }
+    int lock = -1;
+    if (YLIBCFileLockByFile(kConfigLock, 0, &lock) < 0) {
+        return -1;
+    }
+    const int result = YLIBCFileSetKeyValue(host::kConfigFile, szKey, szValue, 0);
+    YLIBCFileUnlockByFile(lock);
+    return result;
 }

@@ -1,0 +1,404 @@
+// Key-value files: what is read, what a change leaves as it was, and what stands in its way.
+
+#include "key_value_file.h"
+
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+#include <sys/syscall.h>
+
+#include <algorithm>
+#include <atomic>
+#include <chrono>
+#include <filesystem>
+#include <fstream>
+#include <random>
+#include <set>
+#include <sstream>
+
+#include "children.h"
+#include "file_lock.h"
+#include "last_error.h"
+
+namespace {
+std::atomic<int> g_syncs = 0;
+}  // namespace
+
+// The platform's calls come here first.
+extern "C" __attribute__((visibility("default"))) int fsync(int fd) {
+    ++g_syncs;
+    return static_cast<int>(syscall(SYS_fsync, fd));
+}
+
+namespace {
+
+namespace fs = std::filesystem;
+using Clock = std::chrono::steady_clock;
+using Set = std::set<std::string>;
+using std::string_literals::operator""s;
+
+constexpr const char *kFolder = "/tmp/shared";
+constexpr const char *kFile = "/tmp/shared/a.conf";
+constexpr const char *kLock = "/tmp/shared/a.lock";
+constexpr const char *kTemporary = "/tmp/shared/.a.conf.zelo-new";
+constexpr const char *kVictim = "/tmp/victim.conf";
+
+// A folder that everybody can write to, empty.
+class KeyValueFile : public testing::Test {
+  protected:
+    void SetUp() override {
+        fs::remove_all(kFolder);
+        fs::create_directory(kFolder);
+        chmod(kFolder, 01777);
+    }
+};
+
+void Write(const std::string &strPath, const std::string &strText) {
+    std::ofstream(strPath, std::ios::binary) << strText;
+}
+
+std::string Content(const std::string &strPath) {
+    std::ostringstream text;
+    text << std::ifstream(strPath, std::ios::binary).rdbuf();
+    return text.str();
+}
+
+Set Names(const char *szFolder) {
+    Set names;
+    for (const auto &entry : fs::directory_iterator(szFolder)) {
+        names.insert(entry.path().filename());
+    }
+    return names;
+}
+
+struct stat Status(const char *szPath) {
+    struct stat status = {};
+    lstat(szPath, &status);
+    return status;
+}
+
+std::string Value(const char *szPath, const char *szKey) {
+    std::string strValue(100000, 'x');
+    const int cb = YLIBCFileGetKeyValue(szPath, szKey, strValue.data(), 100000, 0);
+    return cb < 0 ? "unreadable" : strValue.substr(0, static_cast<std::size_t>(cb));
+}
+
+int SetValue(const char *szPath, const std::string &strKey, const std::string &strValue) {
+    return YLIBCFileSetKeyValue(szPath, strKey.c_str(), strValue.c_str(), 0);
+}
+
+bool SetLocked(const std::string &strKey, const std::string &strValue) {
+    int lock = -1;
+    const bool blSet =
+        YLIBCFileLockByFile(kLock, 0, &lock) == 1 && SetValue(kFile, strKey, strValue) == 0;
+    return YLIBCFileUnlockByFile(lock) == 0 && blSet;
+}
+
+// Sets keys in so many processes at once; false when one of them has failed.
+bool SetInProcesses(int processes, int keys,
+                    const std::function<bool(const std::string &strKey)> &set) {
+    std::set<pid_t> pids;
+    for (int process = 0; process < processes; ++process) {
+        pids.insert(children::Start([&, process] {
+            bool blAll = true;
+            for (int i = 0; i < keys; ++i) {
+                blAll = set(std::to_string(process) + '.' + std::to_string(i)) && blAll;
+            }
+            return blAll;
+        }));
+    }
+    return std::count_if(pids.begin(), pids.end(), children::Ended) == processes;
+}
+
+Set Lines(const char *szPath) {
+    Set lines;
+    std::istringstream text(Content(szPath));
+    for (std::string strLine; std::getline(text, strLine);) {
+        lines.insert(strLine);
+    }
+    return lines;
+}
+
+TEST_F(KeyValueFile, ReadsEveryFormOfALine) {
+    const std::string strLong(60000, 'v');
+    Write(kFile,
+          "# plain=comment\n"
+          "  #blank=comment\n"
+          "plain=value one\n"
+          "quoted=\"value two\"\r\n"
+          " spaced = \t\"three\"  \n"
+          "escaped=\"a \\\"b\\\" \\\\ c\"\n"
+          "empty=\n"
+          "emptyquoted=\"\"\n"
+          "no line\n"
+          "=no key\n"
+          "open=\"never closed\n"
+          "equals=a=b\n"
+          "zero=a\0b\n"
+          "zero\0=c\n"
+          "plain=second\n"
+          "long="s +
+              strLong + "\nlast=no line feed");
+    const struct {
+        const char *szKey;
+        std::string strValue;
+        int holds;
+    } rows[] = {
+        {"plain", "value one", 1},
+        {"quoted", "value two", 1},
+        {"spaced", "three", 1},
+        {"escaped", "a \"b\" \\ c", 1},
+        {"empty", "", 1},
+        {"emptyquoted", "", 1},
+        {"open", "never closed", 1},
+        {"equals", "a=b", 1},
+        {"long", strLong, 1},
+        {"last", "no line feed", 1},
+        {"absent", "", 0},
+        {"blank", "", 0},
+        {"#blank", "", 0},
+        {"plai", "", 0},
+        {"zero", "", 0},
+        {"", "", 0},
+    };
+    for (const auto &row : rows) {
+        EXPECT_EQ(Value(kFile, row.szKey), row.strValue) << row.szKey;
+        EXPECT_EQ(YLIBCFileCheckKeyValue(kFile, row.szKey, row.strValue.c_str(), 0), row.holds);
+    }
+}
+
+TEST_F(KeyValueFile, GivesAllPairsInOrderAndOfAKeyTheFirst) {
+    Write(kFile, "b=1\n#c=2\njunk\n a = \"x \\\" y\" \nb=3\nold=new\nempty=\n=4\n");
+    YLIBSZHASH *pHash = YLIBCSzHashAlloc(16);
+    YLIBCSzHashSetValue(&pHash, "old", "old");
+    YLIBCSzHashSetValue(&pHash, "own", "stays");
+    EXPECT_EQ(YLIBCFileGetPair(kFile, &pHash), 4);
+    std::string strPairs;
+    for (int i = 0; i < pHash->nItem; ++i) {
+        strPairs += YLIBCSzHashKeyAt(pHash, i) + "="s + YLIBCSzHashValueAt(pHash, i) + ";";
+    }
+    EXPECT_EQ(strPairs, "old=new;own=stays;b=1;a=x \" y;empty=;");
+    EXPECT_LT(YLIBCFileGetPair("/tmp/none", &pHash), 0);
+    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_FILE));
+    EXPECT_LT(YLIBCFileGetPair(kFile, nullptr), 0);
+    YLIBCSzHashFree(pHash);
+}
+
+TEST_F(KeyValueFile, CutsAndRefuses) {
+    Write(kFile, "key=0123456789\n");
+    char sz[5] = "xxxx";
+    EXPECT_EQ(YLIBCFileGetKeyValue(kFile, "key", sz, sizeof(sz), 0), 4);
+    EXPECT_STREQ(sz, "0123");
+    EXPECT_EQ(YLIBCFileCheckKeyValue(kFile, "key", "0123", 0), 0);
+    EXPECT_LT(YLIBCFileGetKeyValue("/tmp/none", "key", sz, sizeof(sz), 0), 0);
+    EXPECT_STREQ(sz, "");
+    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_FILE));
+    EXPECT_LT(YLIBCFileCheckKeyValue("/etc", "key", "x", 0), 0);
+    EXPECT_LT(YLIBCFileGetKeyValue(nullptr, "key", sz, sizeof(sz), 0), 0);
+    EXPECT_LT(YLIBCFileGetKeyValue(kFile, "key", sz, 0, 0), 0);
+    EXPECT_LT(YLIBCFileCheckKeyValue(kFile, nullptr, "x", 0), 0);
+    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_INVALID_ARGUMENT));
+}
+
+TEST_F(KeyValueFile, ValuesComeBackAsTheyWentIn) {
+    Write(kFile, "odd=first\nother=stays\n");
+    for (const std::string &strValue :
+         {"plain"s, ""s, " blanks at both ends\t"s, "\"quoted\""s, "\""s, "\\"s, "ends in \\"s,
+          "a\\\"b\\\\\"c"s, "# no comment"s, "a=b"s, "\x01\x7f\xff"s, std::string(50000, '"')}) {
+        EXPECT_EQ(SetValue(kFile, "odd", strValue), 0);
+        EXPECT_EQ(Value(kFile, "odd"), strValue);
+        EXPECT_EQ(Value(kFile, "other"), "stays");
+    }
+    EXPECT_EQ(SetValue(kFile, "a \"key\" with\\blanks", "v"), 0);
+    EXPECT_EQ(Value(kFile, "a \"key\" with\\blanks"), "v");
+}
+
+TEST_F(KeyValueFile, WhatTheFormatCannotHoldIsRefused) {
+    Write(kFile, "key=value\n");
+    const std::pair<const char *, const char *> rows[] = {
+        {"key", "a\nother=b"}, {"key", "a\r"}, {"k\ney", "a"},  {"key\n", "a"},
+        {"ke=y", "a"},         {"", "a"},      {"#key", "a"},   {" key", "a"},
+        {"key\t", "a"},        {nullptr, "a"}, {"key", nullptr}};
+    const Set namesBefore = Names("/etc");
+    for (const auto &[szKey, szValue] : rows) {
+        for (int result : {YLIBCFileSetKeyValue(kFile, szKey, szValue, 0),
+                           YLIBCINFOSetKeyValue(szKey, szValue)}) {
+            EXPECT_LT(result, 0);
+            EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_INVALID_ARGUMENT));
+        }
+    }
+    EXPECT_EQ(Content(kFile), "key=value\n");
+    EXPECT_EQ(Names("/etc"), namesBefore);
+}
+
+TEST_F(KeyValueFile, AChangeLeavesAllOtherLinesAndTheModeAsTheyWere) {
+    const std::string strOdd = "# k=1\r\n\n junk \0 = \xff\nk\0=z\n b = 2 \r\n"s;
+    const struct {
+        std::string strBefore;
+        const char *szValue;  // null: the key is removed
+        std::string strAfter;
+    } rows[] = {
+        {"", "v", "k=\"v\"\n"},
+        {"a=1", "v", "a=1\nk=\"v\"\n"},
+        {strOdd, "v", strOdd + "k=\"v\"\n"},
+        {strOdd + " k = old # x\r\n" + strOdd, "v", strOdd + "k=\"v\"\n" + strOdd},
+        {"k=old\nk=second\n", "v", "k=\"v\"\nk=second\n"},
+        {strOdd + "k=1\n" + strOdd + " k =2\nk=", nullptr, strOdd + strOdd},
+        {"k=1\n", nullptr, ""},
+    };
+    const mode_t umaskBefore = umask(077);
+    for (const auto &row : rows) {
+        for (mode_t mode : {0644U, 0600U, 0666U, 0640U}) {
+            Write(kFile, row.strBefore);
+            chmod(kFile, mode);
+            EXPECT_EQ(row.szValue == nullptr ? YLIBCFileRemoveKey(kFile, "k")
+                                             : SetValue(kFile, "k", row.szValue),
+                      0);
+            EXPECT_EQ(Content(kFile), row.strAfter);
+            EXPECT_EQ(Status(kFile).st_mode & 07777U, mode);
+        }
+    }
+    SetUp();
+    EXPECT_EQ(SetValue(kFile, "k", "v"), 0);
+    EXPECT_EQ(Status(kFile).st_mode & 07777U, 0644U);
+    umask(umaskBefore);
+}
+
+TEST_F(KeyValueFile, WritesOnlyWhatIsNewAndWaitsOnlyForWhatOutlivesARestart) {
+    fs::remove("/etc/a.conf");
+    const std::pair<const char *, int> rows[] = {{kFile, 0}, {"/etc/a.conf", 2}};
+    for (const auto &[szPath, syncs] : rows) {
+        g_syncs = 0;
+        EXPECT_EQ(YLIBCFileRemoveKey(szPath, "k"), 0);
+        EXPECT_FALSE(fs::exists(szPath));
+        EXPECT_EQ(SetValue(szPath, "k", "v w"), 0);
+        const ino_t inode = Status(szPath).st_ino;
+        EXPECT_EQ(SetValue(szPath, "k", "v w"), 0);
+        EXPECT_EQ(YLIBCFileRemoveKey(szPath, "absent"), 0);
+        EXPECT_EQ(Status(szPath).st_ino, inode);
+        EXPECT_EQ(g_syncs, syncs);
+    }
+}
+
+TEST_F(KeyValueFile, InASharedFolderTrapsAreLeftAlone) {
+    using Trap = std::function<void(const char *szPath)>;
+    const std::pair<const char *, Trap> traps[] = {
+        {"link", [](const char *szPath) { fs::create_symlink(kVictim, szPath); }},
+        {"dangling link", [](const char *szPath) { fs::create_symlink("/tmp/lured", szPath); }},
+        {"second name", [](const char *szPath) { fs::create_hard_link(kVictim, szPath); }},
+        {"folder", [](const char *szPath) { fs::create_directory(szPath); }},
+        {"FIFO", [](const char *szPath) { mkfifo(szPath, 0666); }},
+    };
+    fs::remove("/etc/to-shared.conf");
+    fs::create_symlink(kFile, "/etc/to-shared.conf");
+    Write(kVictim, "k=secret\n");
+    for (const auto &[szTrap, set] : traps) {
+        SCOPED_TRACE(szTrap);
+        SetUp();
+        set(kFile);
+        for (const char *szPath : {kFile, "/etc/to-shared.conf"}) {
+            for (int result : {YLIBCFileCheckKeyValue(szPath, "k", "secret", 0),
+                               SetValue(szPath, "k", "v"), YLIBCFileRemoveKey(szPath, "k")}) {
+                EXPECT_LT(result, 0);
+                EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_UNSAFE_FILE));
+            }
+        }
+        EXPECT_EQ(Names(kFolder), Set{"a.conf"});
+        // At the temporary file's name it is no hindrance.
+        SetUp();
+        set(kTemporary);
+        EXPECT_EQ(SetValue(kFile, "k", "v"), 0);
+        EXPECT_EQ(Content(kFile), "k=\"v\"\n");
+        EXPECT_EQ(Names(kFolder), (Set{"a.conf", ".a.conf.zelo-new"}));
+    }
+    EXPECT_EQ(Content(kVictim), "k=secret\n");
+    EXPECT_FALSE(fs::exists("/tmp/lured"));
+}
+
+TEST_F(KeyValueFile, ElsewhereLinksAreFollowedAndStay) {
+    fs::remove_all("/etc/a");
+    fs::create_directories("/etc/a/b");
+    Write("/etc/a/real.conf", "k=old\n");
+    fs::create_symlink("/etc/a/b/second", "/etc/a/first");
+    fs::create_symlink("../real.conf", "/etc/a/b/second");
+    fs::create_symlink("b/made.conf", "/etc/a/dangling");
+    fs::create_symlink("loop", "/etc/a/loop");
+    EXPECT_EQ(Value("/etc/a/first", "k"), "old");
+    EXPECT_EQ(SetValue("/etc/a/first", "k", "new"), 0);
+    EXPECT_EQ(Content("/etc/a/real.conf"), "k=\"new\"\n");
+    EXPECT_EQ(SetValue("/etc/a/dangling", "k", "v"), 0);
+    EXPECT_EQ(Content("/etc/a/b/made.conf"), "k=\"v\"\n");
+    EXPECT_LT(SetValue("/etc/a/loop", "k", "v"), 0);
+    for (const char *szLink : {"/etc/a/first", "/etc/a/b/second", "/etc/a/dangling"}) {
+        EXPECT_TRUE(S_ISLNK(Status(szLink).st_mode)) << szLink;
+    }
+}
+
+TEST_F(KeyValueFile, EightProcessesUnderTheLockLoseNoKey) {
+    EXPECT_TRUE(SetInProcesses(8, 1000, [](const auto &strKey) { return SetLocked(strKey, "v"); }));
+    EXPECT_EQ(Lines(kFile).size(), 8000U);
+    EXPECT_EQ(Names(kFolder), (Set{"a.conf", "a.lock"}));
+}
+
+TEST_F(KeyValueFile, WritersOfThePlatformsSettingsExcludeEachOther) {
+    Set names = Names("/etc");
+    const std::size_t linesBefore = Lines("/etc/zeloinfo.conf").size();
+    EXPECT_TRUE(SetInProcesses(
+        4, 10, [](const auto &strKey) { return YLIBCINFOSetKeyValue(strKey.c_str(), "v") == 0; }));
+    EXPECT_EQ(Lines("/etc/zeloinfo.conf").size(), linesBefore + 40);
+    names.insert(".zeloinfo.conf.lock");
+    EXPECT_EQ(Names("/etc"), names);
+}
+
+TEST_F(KeyValueFile, WritersWithoutALockLeaveWholeFiles) {
+    const std::string strRest = std::string(200000, '#') + "\nend=here\n";
+    Write(kFile, "k=0\n" + strRest);
+    const auto writeOn = [](const std::string &strKey) {
+        return SetValue(kFile, "k", strKey) == 0;
+    };
+    const pid_t pid = children::Start([&] { return SetInProcesses(3, 150, writeOn); });
+    int status = -1;
+    while (waitpid(pid, &status, WNOHANG) == 0) {
+        const std::string strContent = Content(kFile);
+        ASSERT_EQ(strContent.substr(strContent.find('\n') + 1), strRest);
+    }
+    EXPECT_EQ(status, 0);
+    EXPECT_NE(Value(kFile, "k"), "0");
+    EXPECT_EQ(Names(kFolder), Set{"a.conf"});
+}
+
+TEST_F(KeyValueFile, AKilledWriterLeavesTheOldFileOrTheNewOneAndNoLock) {
+    std::string strRest;
+    for (int i = 0; i < 10000; ++i) {
+        strRest += "line" + std::to_string(i) + "=\"some value\"\n";
+    }
+    Write(kFile, "k=0\n" + strRest);
+    std::mt19937 random(1);
+    const auto end = Clock::now() + std::chrono::seconds(2);
+    for (int round = 1; Clock::now() < end; ++round) {
+        const std::string strRound = std::to_string(round) + '.';
+        const children::Signal begun;
+        const pid_t pid = children::Start([&] {
+            bool blAll = SetLocked("k", strRound + '0') && begun.Give();
+            for (int i = 1; blAll; ++i) {
+                blAll = SetLocked("k", strRound + std::to_string(i));
+            }
+            return blAll;
+        });
+        ASSERT_TRUE(begun.Await());
+        const auto moment = Clock::now() + std::chrono::microseconds(random() % 4000);
+        while (Clock::now() < moment) {
+        }
+        children::Kill(pid);
+        int lock = -1;
+        ASSERT_EQ(YLIBCFileLockTimeByFile(kLock, 0, 0, &lock), 1);
+        EXPECT_EQ(YLIBCFileUnlockByFile(lock), 0);
+        const std::string strContent = Content(kFile);
+        EXPECT_EQ(strContent.rfind("k=\"" + strRound, 0), 0U);
+        ASSERT_EQ(strContent.substr(strContent.find('\n') + 1), strRest);
+        EXPECT_LE(Names(kFolder).size(), 3U);
+    }
+    EXPECT_TRUE(SetLocked("k", "last"));
+    EXPECT_EQ(Names(kFolder), (Set{"a.conf", "a.lock"}));
+}
+
+}  // namespace
