@@ -15,6 +15,8 @@ enum YLIBC_ERROR {
     YLIBC_ERR_NONE = 0x0000,
     YLIBC_ERR_OUT_OF_MEMORY = 0x0200,
     YLIBC_ERR_NOT_FOUND = 0x0300,      // the record, key or file asked for is not there
+    YLIBC_ERR_EXISTS = 0x0301,         // what was to be new, or nobody else's, is there already
+    YLIBC_ERR_LIMIT = 0x0302,          // no more of it may be added
     YLIBC_ERR_FILE = 0x0400,           // a file or directory could not be opened, read or written
     YLIBC_ERR_BUSY = 0x0401,           // a lock was held elsewhere for too long
     YLIBC_ERR_UNSAFE_FILE = 0x0402,    // a link, or somebody else's file, stands in a shared folder
