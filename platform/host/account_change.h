@@ -1,0 +1,49 @@
+// Changing the account files: what the operations of user_group.h do under the system's lock.
+//
+// Where a function can fail it returns false with the error set; the files are then as they were.
+
+#ifndef ZELO_HOST_ACCOUNT_CHANGE_H
+#define ZELO_HOST_ACCOUNT_CHANGE_H
+
+#include <string>
+#include <vector>
+
+#include "../user_group.h"
+#include "account_files.h"
+
+namespace host {
+
+// The files that say which users there are. To look something up needs no lock.
+struct UserFiles {
+    PasswdFile passwd;
+    ShadowFile shadow;
+
+    bool Read() { return passwd.Read() && shadow.Read(); }
+
+    // What the password field of a user holds: a hash, or a text that no password matches.
+    std::string StoredPassword(const std::string &strName) const;
+};
+
+// Whether somebody can sign in with what a password field holds. "!" in front of a hash locks it,
+// "*" stands for no hash; an empty field asks for no password.
+bool LetsIn(const std::string &strPassword);
+
+// How many users may be added to these.
+bool CountRemaining(const PasswdFile &passwd, int &remaining);
+
+// The path at which a user's preference directory stands. A name that would lead elsewhere has
+// none.
+bool PreferencePath(const std::string &strName, std::string &strPath);
+
+// Stores a user: a new one when szCurrentName is null.
+bool StoreUser(const char *szCurrentName, const ZELO_USER &user);
+
+// Deletes the users, all of them or none, with the directories that go with them.
+bool DeleteUsers(const std::vector<std::string> &names);
+
+// Makes the names of a list, which ends with a null, the members of a group.
+bool StoreMembers(const std::string &strGroup, char **ppszMembers);
+
+}  // namespace host
+
+#endif

@@ -1,0 +1,339 @@
+// Users and groups: what is stored, what stays as it was, and that the system's own checks agree.
+
+#include <crypt.h>
+#include <gtest/gtest.h>
+#include <sys/resource.h>
+
+#include <atomic>
+#include <filesystem>
+#include <fstream>
+#include <thread>
+
+#include "accounts.h"
+#include "children.h"
+#include "key_value_file.h"
+#include "last_error.h"
+
+namespace {
+
+namespace fs = std::filesystem;
+using namespace accounts;
+
+constexpr const char *kName = "ZelonixQRM";
+constexpr const char *kHome = "/var/services/homes/ZelonixQRM";
+constexpr const char *kConfig = "/etc/zeloinfo.conf";
+const std::string kPassword = std::string(100, 'p') + '1';
+
+User NewUser(const std::string &strName, uid_t uid, const std::string &strPassword = kPassword,
+             gid_t gid = 100, const char *szDescription = "This user is used for QRM") {
+    ZELO_USER *pUser = nullptr;
+    const std::string strHome = "/var/services/homes/" + strName;
+    EXPECT_EQ(ZELOUserAlloc(&pUser, strName.c_str(), strPassword.c_str(), uid, gid, szDescription,
+                            strHome.c_str(), "/sbin/nologin", -1, 1, nullptr),
+              0);
+    return {pUser, ZELOUserFree};
+}
+
+// Each test begins with the accounts and settings of a fresh box.
+class UserGroup : public testing::Test {
+  protected:
+    void SetUp() override {
+        static const Files fresh = ReadFiles();
+        m_before = fresh;
+        WriteFiles(fresh);
+        fs::remove_all("/var/services");
+        fs::remove_all("/usr/zelo/etc/preference");
+        EXPECT_EQ(YLIBCFileSetKeyValue(kConfig, "max_users", "100", 0), 0);
+        ASSERT_EQ(Findings(), "");
+    }
+    Files m_before;
+};
+
+TEST_F(UserGroup, AUserIsAddedRefreshedAndDeletedAndNothingElseChanges) {
+    chmod("/etc/shadow", 0640);
+    YLIBCM_RESULT *pResult = YLIBCMResultAlloc();
+    ASSERT_EQ(ZELOUserSetOne(nullptr, NewUser(kName, 50000).get(), &pResult), 0);
+    EXPECT_EQ(pResult->nDone, 1);
+    YLIBCMResultFree(pResult);
+    Files now = ReadFiles();
+    EXPECT_EQ(now["passwd"], m_before["passwd"] +
+                                 "ZelonixQRM:x:50000:100:This user is used for QRM:/var/services/"
+                                 "homes/ZelonixQRM:/sbin/nologin\n");
+    EXPECT_EQ(now["shadow"].compare(0, m_before["shadow"].size(), m_before["shadow"]), 0);
+    EXPECT_EQ(now["group"] + now["gshadow"], m_before["group"] + m_before["gshadow"]);
+    EXPECT_EQ(Mode("/etc/shadow"), 0640U);
+    EXPECT_EQ(Mode(kHome), 0700U);
+    EXPECT_EQ(Findings(), "");
+
+    const std::string strHash = PasswordIn("shadow", kName);
+    const User pUser = Get(kName);
+    EXPECT_STREQ(pUser->szName, kName);
+    EXPECT_STREQ(pUser->szPassword, "");
+    EXPECT_EQ(std::vector<long>({pUser->uid, pUser->gid, pUser->nExpireDay, pUser->blEnabled}),
+              std::vector<long>({50000, 100, -1, 1}));
+    EXPECT_STREQ(pUser->szHome, kHome);
+    EXPECT_EQ(Change(pUser), 0);
+    EXPECT_EQ(ReadFiles(), now);
+    pUser->nExpireDay = 25000;
+    EXPECT_EQ(std::string("new").copy(pUser->szPassword, 3), 3U);
+    EXPECT_EQ(Change(pUser), 0);
+    EXPECT_EQ(Get(kName)->nExpireDay, 25000);
+    EXPECT_EQ(ReadFiles()["passwd"], now["passwd"]);
+    EXPECT_NE(PasswordIn("shadow", kName), strHash);
+    EXPECT_EQ(SetMembers({"nobody", kName, "daemon"}), 0);
+    EXPECT_EQ(Findings(), "");
+
+    char szPath[64];
+    EXPECT_EQ(ZELOUserPreferenceDirGet(kName, szPath, sizeof(szPath)), 0);
+    std::ofstream(std::string(szPath) + "/usersettings") << "{}";
+    EXPECT_EQ(Delete({kName, "nosuchuser"}), 0);
+    EXPECT_EQ(Get(kName), nullptr);
+    EXPECT_EQ(Members(), Names({"nobody", "daemon"}));
+    EXPECT_EQ(Findings(), "");
+    EXPECT_EQ(SetMembers({}), 0);
+    EXPECT_EQ(ReadFiles(), m_before);
+    EXPECT_FALSE(fs::exists(kHome));
+    EXPECT_FALSE(fs::exists(szPath));
+}
+
+TEST_F(UserGroup, EveryCharacterOfThePasswordCounts) {
+    ASSERT_EQ(kPassword.size(), 101U);
+    ASSERT_EQ(Add(NewUser(kName, 50000)), 0);
+    const std::string strHash = PasswordIn("shadow", kName);
+    EXPECT_EQ(strHash.compare(0, 3, "$y$"), 0);
+    EXPECT_EQ(crypt(kPassword.c_str(), strHash.c_str()), strHash);
+    EXPECT_NE(crypt((std::string(100, 'p') + '2').c_str(), strHash.c_str()), strHash);
+
+    const User pUser = Get(kName);
+    for (const int blEnabled : {0, 0, 1, 1}) {
+        pUser->blEnabled = blEnabled;
+        EXPECT_EQ(Change(pUser), 0);
+        EXPECT_EQ(Get(kName)->blEnabled, blEnabled);
+        EXPECT_EQ(PasswordIn("shadow", kName), (blEnabled ? "" : "!") + strHash);
+    }
+    std::ofstream("/etc/shadow", std::ios::app) << "silent:left-behind:1::::::\n";
+    EXPECT_EQ(Add(NewUser("silent", 50001, "")), 0);
+    EXPECT_EQ(PasswordIn("shadow", "silent"), "!");
+}
+
+TEST_F(UserGroup, OnlyMembersAreAdministrators) {
+    uid_t uid = 50000;
+    for (const char *szName : {kName, "ZelonixQRM2", "zelonixqrm"}) {
+        EXPECT_EQ(Add(NewUser(szName, uid++)), 0);
+    }
+    EXPECT_EQ(Add(NewUser("first", 1500, "", 101)), 0);
+    const struct {
+        Names members;
+        int result;
+    } rows[] = {
+        {{}, 0},
+        {{"ZelonixQRM2"}, 0},
+        {{"zelonixqrm", "nobody"}, 0},
+        {{kName}, 1},
+        {{"ZelonixQRM2", kName, "nobody"}, 1},
+    };
+    for (const auto &row : rows) {
+        EXPECT_EQ(SetMembers(row.members), 0);
+        EXPECT_EQ(Members(), row.members);
+        EXPECT_EQ(YLIBGroupIsAdminGroupMem(kName, 0), row.result);
+        EXPECT_EQ(Findings(), "");
+    }
+    EXPECT_EQ(YLIBGroupIsAdminGroupMem("first", 0), 1);
+    EXPECT_EQ(SetMembers({"ghost"}), 0);
+    EXPECT_EQ(YLIBGroupIsAdminGroupMem("ghost", 0), 0);
+    for (const char *szBad : {"", "a,b", "a:b", "a\nb"}) {
+        EXPECT_LT(SetMembers({"nobody", szBad}), 0);
+        EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_INVALID_ARGUMENT));
+        EXPECT_EQ(Members(), Names({"ghost"}));
+    }
+}
+
+TEST_F(UserGroup, TenThousandMembersAreKeptInTheirOrder) {
+    Names members(10000, "member");
+    for (std::size_t i = 0; i < members.size(); ++i) {
+        members[i] += std::to_string(i * 7919 % members.size());
+    }
+    EXPECT_EQ(SetMembers(members), 0);
+    EXPECT_EQ(Add(NewUser(kName, 50000)), 0);
+    members = Members();
+    ASSERT_EQ(members.size(), 10000U);
+    EXPECT_EQ(members[1], "member7919");
+    members.emplace_back(kName);
+    EXPECT_EQ(SetMembers(members), 0);
+    EXPECT_EQ(Members(), members);
+    EXPECT_EQ(YLIBGroupIsAdminGroupMem(kName, 0), 1);
+    EXPECT_EQ(Delete({kName}), 0);
+    EXPECT_EQ(SetMembers({}), 0);
+    EXPECT_EQ(ReadFiles(), m_before);
+}
+
+TEST_F(UserGroup, WhatCannotBeStoredIsRefused) {
+    ASSERT_EQ(Add(NewUser("present", 1500)), 0);
+    const Files before = ReadFiles();
+    const struct {
+        const char *szCurrent;
+        User pUser;
+        unsigned error;
+    } rows[] = {
+        {nullptr, NewUser("present", 1501), YLIBC_ERR_EXISTS},
+        {nullptr, NewUser("twin", 1500), YLIBC_ERR_EXISTS},
+        {nullptr, NewUser("lost", 1501, "", 4711), YLIBC_ERR_NOT_FOUND},
+        {"absent", NewUser("absent", 1501), YLIBC_ERR_NOT_FOUND},
+        {"present", NewUser("renamed", 1500), YLIBC_ERR_INVALID_ARGUMENT},
+        {nullptr, NewUser("..", 1501), YLIBC_ERR_INVALID_ARGUMENT},
+        {nullptr, NewUser("a/b", 1501), YLIBC_ERR_INVALID_ARGUMENT},
+        {nullptr, NewUser("a\nb", 1501), YLIBC_ERR_INVALID_ARGUMENT},
+        {nullptr, NewUser("-a", 1501), YLIBC_ERR_INVALID_ARGUMENT},
+        {nullptr, NewUser("a", 1501, "", 100, "x:/:/bin/sh"), YLIBC_ERR_INVALID_ARGUMENT},
+        {nullptr, NewUser("a", 1501, "", 100, "x\nroot2::0:0::/:"), YLIBC_ERR_INVALID_ARGUMENT},
+        {nullptr, NewUser("a", static_cast<uid_t>(-1)), YLIBC_ERR_INVALID_ARGUMENT},
+        {nullptr, User(nullptr, ZELOUserFree), YLIBC_ERR_INVALID_ARGUMENT},
+    };
+    for (const auto &row : rows) {
+        EXPECT_LT(ZELOUserSetOne(row.szCurrent, row.pUser.get(), nullptr), 0);
+        EXPECT_EQ(YLIBCErrGet(), row.error) << (row.pUser == nullptr ? "" : row.pUser->szName);
+    }
+    EXPECT_EQ(Delete({"present", "root"}), -1);
+    EXPECT_EQ(Delete({"present", nullptr}), -1);
+    EXPECT_EQ(ReadFiles(), before);
+    ZELO_USER *pUser = nullptr;
+    const std::string strLong(sizeof(pUser->szPassword), 'x');
+    EXPECT_LT(ZELOUserAlloc(&pUser, "a", strLong.c_str(), 1, 1, "", "/", "", -1, 1, nullptr), 0);
+    EXPECT_EQ(pUser, nullptr);
+}
+
+TEST_F(UserGroup, TheNumberOfUsersIsLimited) {
+    EXPECT_EQ(YLIBUserNumRemained(), 100);
+    EXPECT_EQ(YLIBCFileSetKeyValue(kConfig, "max_users", "1", 0), 0);
+    EXPECT_EQ(Add(NewUser("system", 900)), 0);
+    EXPECT_EQ(YLIBUserNumRemained(), 1);
+    EXPECT_EQ(Add(NewUser(kName, 50000)), 0);
+    EXPECT_EQ(YLIBUserNumRemained(), 0);
+    EXPECT_LT(Add(NewUser("more", 50001)), 0);
+    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_LIMIT));
+    EXPECT_EQ(Change(NewUser(kName, 50000)), 0);
+    EXPECT_EQ(YLIBCFileSetKeyValue(kConfig, "max_users", "many", 0), 0);
+    EXPECT_LT(YLIBUserNumRemained(), 0);
+}
+
+TEST_F(UserGroup, LinesOfAnyFormStayByteForByte) {
+    const Files odd = {
+        {"passwd",
+         "# a comment\n\nroot:x:0:0:root:/root:/bin/sh\nno fields\n short:x:7\n"
+         "odd:x:0012:0100:\xff, text:/odd:\nroot:x:0:0:again:/root:/bin/sh\nend:*:9:9::/:"},
+        {"shadow", "root:*:19700::::::\n#\nodd:!!:0:00:99999:7:::\n+nis"},
+        {"group", "administrators:x:101:root,odd\r\n\nusers:!:100:odd,odd,\nx\n"},
+        {"gshadow", "users:!:odd:odd, odd\nadministrators:*::\n::\n"}};
+    WriteFiles(odd);
+    EXPECT_EQ(Add(NewUser(kName, 50000)), 0);
+    Files now = ReadFiles();
+    for (const char *szFile : {"passwd", "shadow"}) {
+        EXPECT_EQ(now[szFile].find(odd.at(szFile) + "\nZelonixQRM:"), 0U);
+    }
+    EXPECT_EQ(SetMembers({"root", kName}), 0);
+    now = ReadFiles();
+    EXPECT_EQ(now["group"], "administrators:x:101:root,ZelonixQRM\n\nusers:!:100:odd,odd,\nx\n");
+    EXPECT_EQ(now["gshadow"], "users:!:odd:odd, odd\nadministrators:*::root,ZelonixQRM\n::\n");
+    EXPECT_EQ(Delete({kName}), 0);
+    now = ReadFiles();
+    EXPECT_EQ(now["passwd"] + now["shadow"], odd.at("passwd") + '\n' + odd.at("shadow") + '\n');
+    EXPECT_EQ(now["group"], "administrators:x:101:root\n\nusers:!:100:odd,odd,\nx\n");
+}
+
+TEST_F(UserGroup, ShadowFilesMayBeMissingWhollyOrInPart) {
+    Files partly = m_before;
+    partly["passwd"] += "ZelonixQRM:x:50000:100::/:/bin/sh\n";
+    partly["gshadow"] = partly["gshadow"].substr(0, partly["gshadow"].find("administrators"));
+    partly["group"] = partly["group"].substr(0, partly["group"].find("nogroup"));
+    partly["passwd"].replace(partly["passwd"].find("65534:65534"), 11, "65534:100");
+    WriteFiles(partly);
+    EXPECT_NE(Findings(), "");
+    EXPECT_EQ(Change(NewUser(kName, 50000)), 0);
+    EXPECT_EQ(SetMembers({kName}), 0);
+    EXPECT_EQ(Findings(), "");
+
+    m_before.erase("shadow");
+    m_before.erase("gshadow");
+    WriteFiles(m_before);
+    EXPECT_EQ(Add(NewUser(kName, 50000)), 0);
+    const std::string strHash = PasswordIn("passwd", kName);
+    EXPECT_EQ(crypt(kPassword.c_str(), strHash.c_str()), strHash);
+    EXPECT_EQ(SetMembers({kName}), 0);
+    EXPECT_EQ(Findings(), "");
+    EXPECT_EQ(Delete({kName}), 0);
+    EXPECT_EQ(ReadFiles(), m_before);
+}
+
+TEST_F(UserGroup, AChangeThatFailsHalfWayIsTakenBack) {
+    m_before["passwd"] += '#' + std::string(4000, '-') + '\n';
+    WriteFiles(m_before);
+    EXPECT_TRUE(children::Ended(children::Start([] {
+        const struct rlimit limit = {2000, 2000};
+        signal(SIGXFSZ, SIG_IGN);
+        return setrlimit(RLIMIT_FSIZE, &limit) == 0 && Add(NewUser(kName, 50000)) < 0 &&
+               YLIBCErrGet() == YLIBC_ERR_FILE;
+    })));
+    EXPECT_EQ(ReadFiles(), m_before);
+}
+
+TEST_F(UserGroup, ProcessesAndThreadsChangeAccountsAtOnceAndLoseNothing) {
+    constexpr int kProcesses = 5;
+    constexpr int kUsers = 4;
+    alarm(500);
+    std::vector<pid_t> pids;
+    pids.reserve(kProcesses);
+    for (int i = 0; i < kProcesses; ++i) {
+        pids.push_back(children::Start([i] {
+            std::atomic<int> added = 0;
+            const auto add = [&](int first) {
+                for (int n = first; n < kUsers; n += 2) {
+                    const std::string strName = "p" + std::to_string(i) + "u" + std::to_string(n);
+                    added += Add(NewUser(strName, static_cast<uid_t>(2000 + 10 * i + n))) == 0;
+                }
+            };
+            std::thread other(add, 1);
+            add(0);
+            other.join();
+            Add(NewUser("wanted", static_cast<uid_t>(3000 + i)));
+            return added == kUsers && Delete({("p" + std::to_string(i) + "u0").c_str()}) == 0;
+        }));
+    }
+    for (const pid_t pid : pids) {
+        EXPECT_TRUE(children::Ended(pid));
+    }
+    EXPECT_EQ(Delete({"wanted0"}), 0);
+    EXPECT_GT(alarm(0), 0U);
+    EXPECT_EQ(YLIBUserNumRemained(), 100 - kProcesses * (kUsers - 1) - 1);
+    EXPECT_EQ(Findings(), "");
+}
+
+TEST_F(UserGroup, PreferencesStayInTheirFolder) {
+    char szPath[4096] = "before";
+    ASSERT_EQ(Add(NewUser(kName, 50000)), 0);
+    std::ofstream("/etc/passwd", std::ios::app)
+        << "..:x:1:1::/:\na/../../b:x:1:1::/:\n.:x:1:1::/:\n";
+    for (const char *szName : {"..", ".", "a/../../b", "", "nosuchuser", "/etc", "ZelonixQR"}) {
+        EXPECT_LT(ZELOUserPreferenceDirGet(szName, szPath, sizeof(szPath)), 0) << szName;
+    }
+    EXPECT_LT(ZELOUserPreferenceDirGet(kName, szPath, 20), 0);
+    EXPECT_STREQ(szPath, "before");
+    EXPECT_FALSE(fs::exists("/usr/zelo/etc/preference"));
+    for (int i = 0; i < 2; ++i) {
+        EXPECT_EQ(ZELOUserPreferenceDirGet(kName, szPath, sizeof(szPath)), 0);
+        EXPECT_STREQ(szPath, "/usr/zelo/etc/preference/ZelonixQRM");
+    }
+    EXPECT_EQ(Mode(szPath), 0700U);
+}
+
+TEST_F(UserGroup, ExtraAdministratorsAreKeptUntilCleared) {
+    char szValue[64];
+    EXPECT_EQ(YLIBGroupExtraAdminSet("QRM", 0, 0, 0, 0), 0);
+    EXPECT_EQ(YLIBCFileGetKeyValue(kConfig, "extra_admin_QRM", szValue, sizeof(szValue), 0), 0);
+    EXPECT_EQ(YLIBGroupExtraAdminSet("QRM", 1, -2, 0, 4), 0);
+    EXPECT_EQ(YLIBCFileCheckKeyValue(kConfig, "extra_admin_QRM", "1 -2 0 4", 0), 1);
+    EXPECT_EQ(YLIBGroupExtraAdminSet("QRM", 0, 0, 0, 0), 0);
+    EXPECT_EQ(YLIBCFileGetKeyValue(kConfig, "extra_admin_QRM", szValue, sizeof(szValue), 0), 0);
+    EXPECT_NE(YLIBGroupExtraAdminSet("a=b", 1, 0, 0, 0), 0);
+}
+
+}  // namespace
