@@ -49,6 +49,26 @@ bool ReadJsonFile(const char *szWhat, const std::string &strFile, Json::Value &v
     return true;
 }
 
+bool ReadParams(const std::string &strText, Json::Value &params, std::string &strError) {
+    std::string strReason;
+    if (strText.empty()) {
+        return true;
+    }
+    if (strText.front() == '@') {
+        if (!ReadJsonFile("parameters", strText.substr(1), params, strError)) {
+            return false;
+        }
+    } else if (!json_text::FromString(strText, params, &strReason)) {
+        strError = "cannot read the parameters '" + strText + "': " + strReason;
+        return false;
+    }
+    if (!params.isObject()) {
+        strError = "cannot use the parameters '" + strText + "': they have to be a JSON object";
+        return false;
+    }
+    return true;
+}
+
 bool ReadTokenFile(const std::string &strFile, std::string &strToken, std::string &strError) {
     std::string strText;
     if (!ReadAll("token file", strFile, strText, strError)) {

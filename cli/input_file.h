@@ -18,6 +18,9 @@ constexpr std::size_t kMaxStoredText = 1023;
 bool ReadJsonFile(const char *szWhat, const std::string &strFile, Json::Value &value,
                   std::string &strError);
 
+// The parameters of a call, an object: JSON text, or @FILE; null for an empty text.
+bool ReadParams(const std::string &strText, Json::Value &params, std::string &strError);
+
 // The access token: the one line of a file.
 bool ReadTokenFile(const std::string &strFile, std::string &strToken, std::string &strError);
 

@@ -36,6 +36,18 @@ int Run(int argc, char **argv) {
     qrmctl::AddTestConnection(app, action);
     qrmctl::AddJoin(app, action);
     qrmctl::AddCredential(app, action);
+    qrmctl::AddCall(app, action);
+    qrmctl::AddUpdate(app, action);
+    qrmctl::AddGetFile(app, action);
+    qrmctl::AddInfo(app, action);
+    qrmctl::AddNotify(app, action);
+    qrmctl::AddStatus(app, action);
+    qrmctl::AddLeave(app, action);
+    qrmctl::AddAccount(app, action);
+    qrmctl::AddWelcome(app, action);
+    qrmctl::AddPlugins(app, action);
+    qrmctl::AddLog(app, action);
+    qrmctl::AddIdle(app, action);
     bool blJson = false;
     bool blVerbose = false;
     AddCommonFlags(app, blJson, blVerbose);

@@ -1,5 +1,8 @@
 #include "report.h"
 
+#include <json/writer.h>
+
+#include <algorithm>
 #include <cstdio>
 #include <iostream>
 
@@ -30,6 +33,18 @@ void Report::Fact(const std::string &strName, const Json::Value &value) {
     }
 }
 
+void Report::Document(const std::string &strName, const Json::Value &value) {
+    m_result[strName] = value;
+    if (!m_blJson) {
+        Json::StreamWriterBuilder builder;
+        builder["indentation"] = "  ";
+        builder["emitUTF8"] = true;
+        std::string strText = Json::writeString(builder, value);
+        std::replace(strText.begin(), strText.end(), '\x7F', '?');
+        std::cout << strText << '\n';
+    }
+}
+
 void Report::Say(const std::string &strSentence) const {
     if (!m_blJson) {
         std::cout << Printable(strSentence) << '\n';
@@ -41,7 +56,7 @@ void Report::Warn(const std::string &strSentence) {
     std::cerr << "qrmctl: warning: " << Printable(strSentence) << '\n';
 }
 
-ExitCode Report::Done() {
+ExitCode Report::Done(ExitCode code) {
     m_result["success"] = true;
     PrintJson();
     std::cout.flush();
@@ -49,7 +64,7 @@ ExitCode Report::Done() {
         std::cerr << "qrmctl: cannot write to standard output\n";
         return kFailed;
     }
-    return kDone;
+    return code;
 }
 
 ExitCode Report::Fail(const std::string &strError) {

@@ -66,6 +66,13 @@ Reply Refuse(int code, const char *szReason = nullptr) {
     return JsonReply(200, envelope);
 }
 
+// Where a file is expected, a refusal is no body with status 200: it would be taken for the file.
+Reply RefuseFile(int code, const char *szReason) {
+    Reply reply = Refuse(code, szReason);
+    reply.status = code == kNoPermission ? 403 : 400;
+    return reply;
+}
+
 Reply AsTold(const NextAnswer &answer) {
     const int status = answer.status.value_or(200);
     if (answer.error_code && !answer.body) {
@@ -208,7 +215,7 @@ Reply DevServer::File(const Json::Value &params) {
     const char *szName = json_text::Text(Member(params, "name"));
     const Json::Value &size = Member(params, "size");
     if (szName == nullptr || !size.isInt64() || size.asInt64() < 0 || size.asInt64() > kMaxFile) {
-        return Refuse(kBadParameter, "a file has a \"name\" and a \"size\"");
+        return RefuseFile(kBadParameter, "a file has a \"name\" and a \"size\"");
     }
     Reply reply;
     reply.strType = kFileType;
@@ -219,7 +226,7 @@ Reply DevServer::File(const Json::Value &params) {
     }
     const std::string strMd5 = TextOrEmpty(Member(params, "md5"));
     if (strMd5.size() != kMd5Digits) {
-        return Refuse(kBadParameter, "\"md5\" has to be a text of 32 digits");
+        return RefuseFile(kBadParameter, "\"md5\" has to be a text of 32 digits");
     }
     if (strMd5 == reply.pFile->Md5()) {
         reply.pFile = nullptr;
@@ -298,9 +305,11 @@ Reply DevServer::CarryOut(const Call &call) {
             continue;
         }
         if (version == route.version && call.strMethod == route.szMethod) {
-            return route.blNeedsToken && call.strAuthorization != "Bearer " + m_options.token
-                       ? Refuse(kNoPermission)
-                       : (this->*route.Carry)(params);
+            if (!route.blNeedsToken || call.strAuthorization == "Bearer " + m_options.token) {
+                return (this->*route.Carry)(params);
+            }
+            return route.Carry == &DevServer::File ? RefuseFile(kNoPermission, "wrong access token")
+                                                   : Refuse(kNoPermission);
         }
         if (code != kUnknownMethod) {
             code = version == route.version ? kUnknownMethod : kUnknownVersion;
@@ -357,6 +366,11 @@ bool DevServer::Delay(int delay_ms) {
 void DevServer::AnswerNext(const std::string &strApi, const NextAnswer &answer) {
     const std::lock_guard<std::mutex> lock(m_mutex);
     m_answers.emplace_back(strApi, answer);
+}
+
+void DevServer::ForgetAnswers() {
+    const std::lock_guard<std::mutex> lock(m_mutex);
+    m_answers.clear();
 }
 
 Json::Value DevServer::Requests() const {

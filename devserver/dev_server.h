@@ -57,6 +57,7 @@ class DevServer {
     // Queues an answer for the API, known or not. A request takes the first one in the queue that
     // fits it.
     void AnswerNext(const std::string &strApi, const NextAnswer &answer);
+    void ForgetAnswers();
 
     // Every protocol request so far, the oldest first, as GET /dev/requests shows them.
     Json::Value Requests() const;

@@ -19,10 +19,15 @@
 #define ZELOQRMCLIENT_H
 
 #include <json/value.h>
+#include <plugin_sdk.h>
 
 #include <string>
 
 #define ZELOQRM_API __attribute__((visibility("default")))
+
+// The platform's text containers (text_containers.h).
+struct YLIBSZHASH;
+struct YLIBSZLIST;
 
 // ------------------------------------------------------------------------------------------------
 // Server credential: where the server is, and the token that authenticates the appliance there.
@@ -147,5 +152,304 @@ ZELOQRM_API bool ZELOQRMClientTestConnect(const Json::Value &serverConn, const s
 // "/etc.defaults/zeloinfo.conf" (upnpmodelname), "/etc.defaults/VERSION". Files written: the
 // platform's credential store.
 ZELOQRM_API int ZELOQRMClientSendCreateClient(const Json::Value &joinInfo);
+
+// Brings the joined server's entry for this appliance up to date: sends "update" of
+// "ZELO.QRM.RPC.ClientInfo" with serial number, host name, version and administration ports,
+// through ZELOQRMClientSendWebapi.
+//
+// info: an object; its "host" is sent as it is when there is one, everything else in it is ignored.
+//
+// Returns 0 when the server took the update, else -1. A serial number that cannot be read is logged
+// and goes as an empty text; the other facts are needed, and one that is missing ends the update
+// without a log line and without a request.
+//
+// Files read: "/etc/zeloinfo.conf" (admin_port, secure_admin_port), "/etc.defaults/VERSION";
+// besides them what ZELOQRMClientSendWebapi touches. Calls take turns with it.
+ZELOQRM_API int ZELOQRMClientSendSetClient(const Json::Value &info);
+
+// ------------------------------------------------------------------------------------------------
+// Requests to the joined server
+// ------------------------------------------------------------------------------------------------
+
+// Calls a Web API method on the joined server with the stored credential and session.
+//
+// resp: receives the whole reply, of whatever JSON type it is; left as it was on -1.
+// api, ver, method: the method, such as "ZELO.QRM.RPC.Log", 1, "push".
+// params: its parameters, an object or null.
+// useCache: true sends with the credential and session that an earlier call of this process loaded,
+// without a look at the store; false, and the first call of a process, loads them.
+//
+// Returns 0 when a reply arrived and is JSON, also when the server reports a failure: look at its
+// "success" and "error"."code". A reply that is no success is logged, with the tokens blanked out.
+// Returns -1 when there is no credential or session, no reply, or one that is not JSON.
+//
+// What else it does: the key "status" of the client info file becomes "success", "no_permission"
+// (codes 105, 106, 107), "error" or, for a reply that is not JSON, "no_connection"; a call without
+// a reply leaves it. On -1 the notification "QRMClientConnectFailed" goes out, unless one has gone
+// out within the last 7200 seconds and no call has been replied to since.
+//
+// Threads: the cached records belong to the process and have no lock. Calls of this function, of
+// ZELOQRMClientSendSetClient and of ZELOQRMClientLog within one process have to take turns. A load
+// that fails half-way leaves the cached records as far as it got: after a -1 call with useCache
+// false.
+//
+// Time: an exchange takes at most 300 s; a server that is silent is given up after 30 s, one that
+// cannot be connected to after 10 s.
+//
+// Files: the platform's credential store (read); "/tmp/qrm_client.info" with its lock;
+// "/tmp/qrmclientconnectfailed", whose time is that of the latest notification.
+ZELOQRM_API int ZELOQRMClientSendWebapi(Json::Value &resp, const std::string &api, int ver,
+                                        const std::string &method, const Json::Value &params,
+                                        bool useCache);
+
+// Fetches a file: calls a Web API method whose reply is a file, and writes it to the path as it
+// arrives.
+//
+// path: the destination. Its directory is created as needed (mode 0755); a path without one stands
+// in the current directory. Either "/" or "\" ends the directory.
+// api, ver, method: the method.
+// params: its parameters, an object or null. When there is a file at the path, its MD5 digest is
+// added as "md5", 32 digits, and stays there afterwards.
+//
+// Returns 0 when the file has been fetched, and also when the server answers that the caller's copy
+// is current: the file is then empty, as in the next case. Returns -1 otherwise. The file at the
+// path is emptied before the server is asked, so a failure leaves it empty or cut: fetch beside the
+// file that matters, and rename. Only a directory that cannot be created is logged.
+//
+// Calls may overlap, but not for one path. There is no limit on the size, nor on the time as long
+// as the transfer moves. Files: the path; the platform's credential store (read).
+ZELOQRM_API int ZELOQRMClientGetFile(const std::string &path, const std::string &api, int ver,
+                                     const std::string &method, Json::Value &params);
+
+// The MD5 digest of a file as text: 32 lower-case hexadecimal digits and a line feed, cut to
+// size - 1 characters and zero-terminated. A buffer of 33 bytes takes the digits alone.
+//
+// Returns 0 when the file could be read, else -1, with the buffer as it was.
+ZELOQRM_API int GetFileMd5String(const char *path, char *buffer, int size);
+
+// ------------------------------------------------------------------------------------------------
+// Client info file
+// ------------------------------------------------------------------------------------------------
+
+// How the latest dealings with the server went, as keys and values in "/tmp/qrm_client.info"; the
+// library itself writes the key "status" (see ZELOQRMClientSendWebapi). The file is shared by all
+// processes and empty after a restart of the appliance.
+
+// Reads a key. Returns true, with the text (cut to 1023 bytes, empty for a key that is not there)
+// in value; false, with value as it was, when there is no file yet or it cannot be read. Logs
+// nothing.
+ZELOQRM_API bool ZELOQRMClientGetInfo(const std::string &key, std::string &value);
+
+// Writes a key, holding "/tmp/qrm_client.info.lock". Returns true when it is written; false when
+// the lock cannot be had, the file cannot be written, or a key or value cannot stand in it (a line
+// feed in either, "=" in the key). Logs nothing.
+ZELOQRM_API bool ZELOQRMClientSetInfo(const std::string &key, const std::string &value);
+
+// ------------------------------------------------------------------------------------------------
+// Notifications
+// ------------------------------------------------------------------------------------------------
+
+// Tells the appliance's own users of an event, through the platform's notification service.
+//
+// szTag: the event, such as "QRMClientConnectFailed" or "QRMClientDetachSuccess".
+// ppHash: the address of the caller's variables, or null; a hash that it designates stays the
+// caller's. The variable "%QRM_SERVER%" is added to it when it is not there: the stored server's
+// host, "Unknown" without one.
+//
+// Whether the service took the notification is not reported. Logs when memory is short, and (by
+// ZELOQRMClientGetServerCredential) when no credential is stored.
+ZELOQRM_API void SendNotification(const char *szTag, YLIBSZHASH **ppHash);
+
+// ------------------------------------------------------------------------------------------------
+// Membership
+// ------------------------------------------------------------------------------------------------
+
+// Judges whether this appliance is joined. Six indicators are read in this order and compared with
+// the first: the join flag ("join_nvo_qrm" of "/etc/zeloinfo.conf"), the server's credential, the
+// notification center's credential, the cache daemon's status, the client web sessions
+// ("ZELO.QRM.Client" or "ZELO.QRM.Client.Machine", index 13), and the service account as an
+// administrator.
+//
+// Returns 1 when the flag is "yes" and all agree; 0 when it is anything else and all agree, or when
+// it cannot be read; -1 at the first one that disagrees, which is logged and ends the look. Nothing
+// is changed. The cache daemon's script "/usr/zelo/etc/rc.d/S99zelocache.sh" is run with "status".
+ZELOQRM_API int ZELOQRMClientStatus(void);
+
+// Leaves the server: takes away what joining left behind, also from a half-joined appliance. Does
+// nothing when ZELOQRMClientStatus answers 0. Otherwise, in this order: the plug-ins of
+// "qrm_client/disjoin" run with the action PRE; the cache daemon is stopped; both credentials, both
+// client web sessions and the service account are removed; "nvo_qrm_self_join" becomes "no" and the
+// join flag "no" (or "rejoin"); the notification "QRMClientDetachSuccess" goes out and the
+// extra-administrator setting for "QRM" is cleared (neither for a re-join); the plug-ins run with
+// the action POST and the result.
+//
+// blRejoin: the appliance leaves in order to join again.
+// strFrom: the application that asks; "ZELO.PKV.AdminCenter.Application" is told to the plug-ins.
+// blClearGluster: told to the plug-ins.
+//
+// Returns true when the appliance has left, or was not joined. Returns false when a step failed,
+// with one line or two that say which: what is done by then stays done, the steps after it are left
+// out, POST is told -1, and leaving again does the rest. Plug-ins that fail, and a notification
+// that cannot be built, are logged and change nothing.
+//
+// Leaving is local: the server is not told. One record of each application is removed; where
+// several are stored, leaving again removes the next.
+//
+// Threads: join, leave and status are not ordered against each other; callers see to that. Plug-ins
+// run in the caller's thread, each within the platform's time limit.
+ZELOQRM_API bool ZELOQRMClientDeleteServer(bool blRejoin, const std::string &strFrom,
+                                           bool blClearGluster);
+ZELOQRM_API bool ZELOQRMClientDeleteServer(bool blRejoin, const std::string &strFrom);
+ZELOQRM_API bool ZELOQRMClientDeleteServer(void);
+
+// ------------------------------------------------------------------------------------------------
+// Plug-in hooks
+// ------------------------------------------------------------------------------------------------
+
+// The server that a change of membership is about. Texts are zero-terminated.
+struct __tag_ZELO_QRM_SERVER_INFO__ {
+    long lPort;
+    char szHost[1024];
+    char szProtocol[1024];
+    char szSn[128];       // the serial number recorded with the server's credential
+    int iRejoin;          // 1: the appliance leaves in order to join again
+    int iFrom;            // 1: the admin center application asked for the change
+    bool blClearGluster;  // the caller's request, passed on
+};
+
+// A plug-in that is made ready. Its owner is the caller, for the length of one change.
+struct __tag_qrmclient_plugin_env__ {
+    int nResult;  // told to the plug-in as RESULT; the caller sets it before an action
+    const __tag_ZELO_QRM_SERVER_INFO__ *pServerInfo;  // not owned; valid until the release
+    YLIBPLUGIN *pHandle;
+};
+
+// Makes the plug-in szPlugin (such as "qrm_client/disjoin") of the family "qrm_client" ready:
+// nResult becomes 0. Returns 0 on success, -1 on failure (a null argument sets the platform's last
+// error to 0x0D00). Call ZELOQRMClientPluginExit in either case.
+ZELOQRM_API int ZELOQRMClientPluginInit(__tag_qrmclient_plugin_env__ *pstEnvVar,
+                                        const char *szPlugin,
+                                        const __tag_ZELO_QRM_SERVER_INFO__ *pServerInfo);
+
+// Runs an action in the caller's thread with the arguments RESULT, HOST, PROTOCOL, PORT, SN,
+// REJOIN, FROM and CLEAR_GLUSTER, each cut to 31 characters. Returns the platform's result,
+// negative when a plug-in failed; -1 when the action could not be prepared, without a log line
+// unless the server info is missing.
+ZELOQRM_API int ZELOQRMClientPlugin(_tag_sdk_plugin_action_ action,
+                                    __tag_qrmclient_plugin_env__ *pstEnvVar);
+
+// Releases the plug-in. Returns 0; -1 for a null argument.
+ZELOQRM_API int ZELOQRMClientPluginExit(__tag_qrmclient_plugin_env__ *pstEnvVar);
+
+// ------------------------------------------------------------------------------------------------
+// Service account
+// ------------------------------------------------------------------------------------------------
+
+// Creates the local administrator "ZelonixQRM" (uid 50000, gid 100), or gives the one that exists a
+// new password and its other fields again; adds it to "administrators", and then hides its welcome
+// pages, creates "/usr/zelo/etc/QRM/" (mode 0755) and reloads the service of type 8. When it is an
+// administrator already, the account alone is refreshed.
+//
+// Returns true on success, false with a log line otherwise; an account that was saved by then
+// stays.
+//
+// The password, 101 characters, comes from rand() and is kept nowhere. The generator is the
+// caller's to seed: call srand() with a number from the kernel's generator before. It is no
+// stronger than that seed, 32 bits. rand() is shared by the process's threads.
+ZELOQRM_API bool ZELOQRMClientCreateServerUser(void);
+
+// Deletes the account, holding "/tmp/userlock", then reloads the service of type 8 and removes
+// "/usr/zelo/etc/QRM/" with all that is in it. Returns true on success, and at once when there is
+// no such account (the directory is then left alone); false with a log line otherwise.
+ZELOQRM_API bool ZELOQRMClientDeleteServerUser(void);
+
+// Shows or hides a user's welcome pages: sets "welcome_nvo40_hide" and "welcome_nvo50_hide" of
+// "ZELO.PKV.App.WelcomeApp.Instance" in the file "usersettings" of the user's preference directory.
+// Everything else in that file stays; one that is no JSON object is replaced.
+//
+// Returns true when the file has been replaced, as a whole; false with a log line, and the file as
+// it was, otherwise. Two calls for one user at once: the later one wins.
+ZELOQRM_API bool ZELOQRMUserWelcomPage(const char *szUser, bool blShow);
+
+// ------------------------------------------------------------------------------------------------
+// Log
+// ------------------------------------------------------------------------------------------------
+
+struct QRMCLIENT_LOG_LEVEL {
+    int level;  // a syslog severity, 0 the most severe; negative only in the last entry
+    std::string name;
+};
+
+// The eight levels, "emerg" (0) to "debug" (7), and an entry with level -1 and an empty name that
+// ends a scan. Filled when the library is loaded, never changed; any thread may read it.
+extern ZELOQRM_API const QRMCLIENT_LOG_LEVEL gZELOQRMClientLogLevelTable[9];
+
+// The name of a level; "info" for any other number. The level of a name, compared exactly; 6 for
+// any other name. Neither fails or logs.
+ZELOQRM_API std::string ZELOQRMClientLogLevelIntToStr(int level);
+ZELOQRM_API int ZELOQRMClientLogLevelStrToInt(const std::string &name);
+
+// Pushes an entry to the server's log: "push" of "ZELO.QRM.RPC.Log", with the time, the level's
+// name, the host name (cut to 63 characters) and the message in every language of the interface.
+//
+// level: 0 to 7; any other is sent as "info".
+// szSection, szKey: the message in the interface strings files; without a section (null) szKey is
+// the message itself. szKey is required. pslParams, or up to three texts of which null ones are
+// left out: what fills the message's markers
+// "{0}", "{1}" and so on, see ConvertLog. Null for none. The list stays the caller's.
+// szExtraInfo: sent as "extra_info"; null for none.
+//
+// Returns 0 when the server has confirmed the entry ("success" is boolean true), else -1 with a log
+// line. Nothing is tried again or kept. Calls take turns with ZELOQRMClientSendWebapi and do what
+// it does. Files read: "/usr/zelo/zeloman/webman/texts/<language>/strings".
+ZELOQRM_API int ZELOQRMClientLog(int level, const char *szSection, const char *szKey,
+                                 YLIBSZLIST *pslParams, const char *szExtraInfo);
+ZELOQRM_API int ZELOQRMClientLog(int level, const char *szSection, const char *szKey,
+                                 const char *szParam1, const char *szParam2, const char *szParam3);
+
+// Renders a message in the twenty languages of the interface.
+//
+// out: null or an object; receives one text for each language code, "chs" to "trk". A language
+// whose strings file does not have the message gets the English one, parameters included.
+//
+// A parameter may name interface texts, as "{section:key}" or "_T(section,key)" (trimmed of blanks
+// and quotes); what names no text is replaced by its key. Texts are cut to 4095 bytes, values to
+// 1023, never inside a UTF-8 character. A marker that stands in a message twice is filled twice;
+// one without a parameter stays.
+//
+// Returns 0 on success; -1, with the languages done by then in out, when the message is in neither
+// file, szKey is null or memory is short. May be called in any number of threads.
+ZELOQRM_API int ConvertLog(const char *szSection, const char *szKey, YLIBSZLIST *pslParams,
+                           Json::Value &out);
+
+// Writes the text of the list at the index, its references expanded from the strings file, to
+// szOut, a buffer of cbOut bytes, cut to fit. At most 64 references of each form are expanded, so
+// that texts that name each other come to an end.
+ZELOQRM_API void ParamGet(YLIBSZLIST *pslParams, int index, const char *szStringsFile, char *szOut,
+                          int cbOut);
+
+// Finds the first reference of either form in a text. Returns 0, with its section and key (and for
+// the second form the whole token) in the buffers, each of limit bytes; -1 when the text from the
+// first "{" or "_T(" on is no reference that fits. A token that does not fit is logged.
+ZELOQRM_API int CheckSectionKey_tpl1(const char *szText, char *szSection, char *szKey, int limit);
+ZELOQRM_API int CheckSectionKey_tpl2(const char *szText, char *szSection, char *szKey,
+                                     char *szToken, int limit);
+
+// ------------------------------------------------------------------------------------------------
+// Disk idle time
+// ------------------------------------------------------------------------------------------------
+
+// Reads the disks' idle time in minutes for a process that is going to change it, and records it
+// under the process's id in "/tmp/qrm_idle_time". While a process that has recorded a time lives,
+// every later reader gets that time, not the one now in force. Records of processes that have ended
+// go when they are met; a process id that the system uses again cannot be told apart.
+//
+// Returns 0 on success, -1 with a log line otherwise. Holds "/tmp/qrm_idle_time.lock", waiting for
+// it at most 30 s.
+ZELOQRM_API int ZELOQRMIdleTimeGet(unsigned long &idleTime);
+
+// Sets the disks' idle time and drops the caller's record, in the same way. When the record cannot
+// be removed the idle time is not changed.
+ZELOQRM_API int ZELOQRMIdleTimeSet(unsigned long idleTime);
 
 #endif

@@ -6,6 +6,37 @@
 #include <cstdarg>
 #include <cstddef>
 #include <cstdio>
+#include <cstring>
+
+// Takes away a UTF-8 character of which only the beginning is left at the end of a text that was
+// cut.
+inline void DropPartialCharacter(char *szText) {
+    std::size_t cb = std::strlen(szText);
+    std::size_t begin = cb;
+    while (begin > 0 && cb - begin < 3 && (szText[begin - 1] & 0xC0) == 0x80) {
+        --begin;
+    }
+    if (begin == 0 || (szText[begin - 1] & 0x80) == 0) {
+        return;
+    }
+    const auto lead = static_cast<unsigned char>(szText[--begin]);
+    const std::size_t whole = lead >= 0xF0 ? 4 : lead >= 0xE0 ? 3 : lead >= 0xC0 ? 2 : 1;
+    if (cb - begin < whole) {
+        szText[begin] = '\0';
+    }
+}
+
+// Copies a text into a caller's buffer of cbOut bytes, cut to fit and never inside a UTF-8
+// character.
+inline void CopyToFit(char *szOut, int cbOut, const char *szText) {
+    if (cbOut <= 0) {
+        return;
+    }
+    const auto size = static_cast<std::size_t>(cbOut);
+    if (std::snprintf(szOut, size, "%s", szText) >= cbOut) {
+        DropPartialCharacter(szOut);
+    }
+}
 
 // A zeroed buffer of N bytes that holds zero-terminated text of at most N - 1 bytes.
 template <std::size_t N>

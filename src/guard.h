@@ -7,6 +7,8 @@
 
 #include <utility>
 
+#include "log.h"
+
 namespace guard {
 
 // Logs the exception that is being handled.

@@ -1,13 +1,21 @@
 #include "json_text.h"
 
+#include <fcntl.h>
 #include <json/reader.h>
 #include <json/writer.h>
+#include <sys/stat.h>
+#include <unistd.h>
 
 #include <algorithm>
+#include <cerrno>
 #include <cstring>
+
+#include "descriptor.h"
 
 namespace json_text {
 namespace {
+
+constexpr off_t kMaxFile = 64L * 1024 * 1024;
 
 // Counted as the reader counts: a plain value is a level too.
 bool IsTooDeep(const Json::Value &value, int depthLeft) {
@@ -106,6 +114,51 @@ bool FromString(const std::string &strText, Json::Value &value, std::string *pst
         SetError(pstrError, "nested too deeply");
     }
     return false;
+}
+
+bool FromFile(const char *szPath, Json::Value &value) {
+    // A pipe that somebody put there must not make the caller wait.
+    const Descriptor file(open(szPath, O_RDONLY | O_CLOEXEC | O_NONBLOCK));
+    struct stat status = {};
+    if (file.Get() < 0 || fstat(file.Get(), &status) != 0 || !S_ISREG(status.st_mode) ||
+        status.st_size > kMaxFile) {
+        return false;
+    }
+    std::string strText(static_cast<std::size_t>(status.st_size), '\0');
+    std::size_t cbRead = 0;
+    while (cbRead < strText.size()) {
+        const ssize_t cb = read(file.Get(), &strText[cbRead], strText.size() - cbRead);
+        if (cb < 0 && errno == EINTR) {
+            continue;
+        }
+        if (cb <= 0) {
+            return false;
+        }
+        cbRead += static_cast<std::size_t>(cb);
+    }
+    return FromString(strText, value);
+}
+
+bool ToFile(const Json::Value &value, const char *szPath) {
+    std::string strText;
+    if (!ToString(value, strText)) {
+        return false;
+    }
+    strText += '\n';
+    unlink(szPath);
+    const Descriptor file(open(szPath, O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0644));
+    std::size_t cbWritten = 0;
+    while (file.Get() >= 0 && cbWritten < strText.size()) {
+        const ssize_t cb = write(file.Get(), &strText[cbWritten], strText.size() - cbWritten);
+        if (cb < 0 && errno == EINTR) {
+            continue;
+        }
+        if (cb <= 0) {
+            return false;
+        }
+        cbWritten += static_cast<std::size_t>(cb);
+    }
+    return file.Get() >= 0 && fsync(file.Get()) == 0;
 }
 
 const Json::Value &Member(const Json::Value &object, const char *szKey) {

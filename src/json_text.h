@@ -32,6 +32,15 @@ std::string ToLogText(const Json::Value &value);
 // and, when pstrError is given, *pstrError says where and why in one line.
 bool FromString(const std::string &strText, Json::Value &value, std::string *pstrError = nullptr);
 
+// Reads and parses a file; returns whether it succeeded, with the value unchanged when not. Only a
+// regular file of at most 64 MiB is read.
+bool FromFile(const char *szPath, Json::Value &value);
+
+// Writes the value's JSON text and a line feed to a new file (mode 0644), durably; returns whether
+// it succeeded. A file that stands there already is removed first, and nothing is written through a
+// link.
+bool ToFile(const Json::Value &value, const char *szPath);
+
 // The member of an object; null (the shared null value) when there is none or the value is no
 // object. The result lives as long as the value.
 const Json::Value &Member(const Json::Value &object, const char *szKey);

@@ -59,4 +59,9 @@ std::string SafeText(const std::string &strText, const std::vector<std::string> 
 
 #define ZELO_LOG(...) ::qrm_log::Write(ZELO_SOURCE_STEM, __LINE__, __VA_ARGS__)
 
+// A required pointer is null: szCondition is the text of the condition that failed.
+#define ZELO_LOG_NULL_ARGUMENT(szCondition)                    \
+    (ZELO_LOG("Invaild Argument (%s)=[%d]\n", szCondition, 0), \
+     YLIBCErrSetEx(YLIBC_ERR_INVALID_ARGUMENT, ZELO_SOURCE_STEM, __LINE__))
+
 #endif

@@ -6,6 +6,9 @@
 #include <memory>
 
 #include "credential_store.h"
+#include "file_lock.h"
+#include "text_containers.h"
+#include "web_api_request.h"
 
 namespace platform_handles_detail {
 
@@ -29,5 +32,51 @@ using CredSessHandle =
 
 // A list of credentials; get() is its first record.
 using CredListHandle = std::unique_ptr<ZELO_CRED, platform_handles_detail::ReleaseList>;
+
+using RequestHandle = std::unique_ptr<ZELO::CredRequest>;
+
+// Owner of a record that moves when something is put into it: such operations take the address of
+// the owner's own pointer.
+template <typename Record, void (*pfnFree)(Record *)>
+class MovingHandle {
+  public:
+    MovingHandle() = default;
+    explicit MovingHandle(Record *pRecord) : m_pRecord(pRecord) {}
+    ~MovingHandle() { pfnFree(m_pRecord); }
+    MovingHandle(const MovingHandle &) = delete;
+    MovingHandle &operator=(const MovingHandle &) = delete;
+
+    void Reset(Record *pRecord) {
+        pfnFree(m_pRecord);
+        m_pRecord = pRecord;
+    }
+    Record *Get() const { return m_pRecord; }
+    Record **Address() { return &m_pRecord; }
+
+  private:
+    Record *m_pRecord = nullptr;
+};
+
+using HashHandle = MovingHandle<YLIBSZHASH, YLIBCSzHashFree>;
+using ListHandle = MovingHandle<YLIBSZLIST, YLIBCSzListFree>;
+
+// A lock between processes, released at the end of its scope when it was taken.
+class FileLock {
+  public:
+    FileLock() = default;
+    ~FileLock() {
+        if (m_handle >= 0) {
+            YLIBCFileUnlockByFile(m_handle);
+        }
+    }
+    FileLock(const FileLock &) = delete;
+    FileLock &operator=(const FileLock &) = delete;
+
+    // For the operation that takes the lock.
+    int *Address() { return &m_handle; }
+
+  private:
+    int m_handle = -1;
+};
 
 #endif

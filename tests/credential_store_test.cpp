@@ -58,6 +58,12 @@ TEST(CredentialStore, LooksAreNotWrites) {
     stored::AddCredential("ZELO.QRM", "a");
     EXPECT_EQ(Mode(stored::kFolder), 0700);
     EXPECT_EQ(Mode(stored::kDatabase), 0600);
+    // As a copy that was put back may stand there.
+    chmod(stored::kFolder, 0755);
+    chmod(stored::kDatabase, 0644);
+    stored::AddCredential("Other", "h");
+    EXPECT_EQ(Mode(stored::kFolder), 0700);
+    EXPECT_EQ(Mode(stored::kDatabase), 0600);
 }
 
 TEST(CredentialStore, IdsAreNeverUsedAgain) {

@@ -2,17 +2,24 @@
 
 #include <gtest/gtest.h>
 #include <syslog.h>
+#include <unistd.h>
 
 #include <cstdarg>
 #include <cstddef>
+#include <cstdio>
 #include <ctime>
 #include <map>
 #include <new>
 #include <type_traits>
 
 #include "credential_store.h"
+#include "file_lock.h"
+#include "file_system.h"
 #include "key_value_file.h"
+#include "notification.h"
+#include "process.h"
 #include "serial_number.h"
+#include "text_containers.h"
 #include "web_api_request.h"
 
 namespace seam {
@@ -27,11 +34,12 @@ struct Observation {
 thread_local Observation *t_pObservation = nullptr;
 
 // Whether this call is the one that the fault names.
-bool Enter(const char *szName) {
+bool Enter(const char *szName, const std::string &strArguments) {
     if (t_pObservation == nullptr) {
         return false;
     }
     t_pObservation->outcome.calls.emplace_back(szName);
+    t_pObservation->outcome.details.push_back(szName + strArguments);
     const int nth = ++t_pObservation->counts[szName];
     return t_pObservation->fault.strOperation == szName && t_pObservation->fault.nth == nth;
 }
@@ -87,17 +95,17 @@ Outcome Observe(const Fault &fault, const std::function<void()> &body) {
 
 }  // namespace seam
 
-#define SEAM(symbol, name, Result, parameters, arguments, failure, gained) \
-    Result Real_##name parameters asm("__real_" symbol);                   \
-    Result Wrap_##name parameters asm("__wrap_" symbol);                   \
-    Result Wrap_##name parameters {                                        \
-        const bool blHit = seam::Enter(#name);                             \
-        if (blHit && !seam::IsForced()) {                                  \
-            return failure;                                                \
-        }                                                                  \
-        Result result = Real_##name arguments;                             \
-        seam::AddRecords(gained);                                          \
-        return blHit ? seam::Force<Result>(result) : result;               \
+#define SEAM(symbol, name, Result, parameters, arguments, failure, gained)    \
+    Result Real_##name parameters asm("__real_" symbol);                      \
+    Result Wrap_##name parameters asm("__wrap_" symbol);                      \
+    Result Wrap_##name parameters {                                           \
+        const bool blHit = seam::Enter(#name, seam::ArgumentTexts arguments); \
+        if (blHit && !seam::IsForced()) {                                     \
+            return failure;                                                   \
+        }                                                                     \
+        Result result = Real_##name arguments;                                \
+        seam::AddRecords(gained);                                             \
+        return blHit ? seam::Force<Result>(result) : result;                  \
     }
 
 #define SEAM_RELEASE(symbol, name, parameters, arguments, lost) \

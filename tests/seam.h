@@ -7,6 +7,7 @@
 
 #include <functional>
 #include <string>
+#include <type_traits>
 #include <vector>
 
 namespace seam {
@@ -18,7 +19,8 @@ struct LogLine {
 };
 
 struct Outcome {
-    std::vector<std::string> calls;  // names of all calls but releases and log lines
+    std::vector<std::string> calls;    // names of all calls but releases and log lines
+    std::vector<std::string> details;  // the same with their arguments, "ZELOCredLoad(-1, *)"
     std::vector<LogLine> logs;
     int recordsLeft = 0;  // records allocated and not released
 };
@@ -29,6 +31,35 @@ struct Fault {
     bool blForceResult = false;  // false: the call is not made and gives its failure value
     long result = 0;             // true: the call is made, and this takes the place of its result
 };
+
+// An argument as it stands in the details: numbers and texts as they are, "buf" for a buffer to
+// fill, "null" or "*" for any other pointer.
+inline std::string ArgumentText(const char *sz) {
+    return sz == nullptr ? "null" : '\'' + std::string(sz) + '\'';
+}
+inline std::string ArgumentText(const std::string &strText) {
+    return '\'' + strText + '\'';
+}
+inline std::string ArgumentText(char *sz) {
+    return sz == nullptr ? "null" : "buf";
+}
+template <typename T>
+std::string ArgumentText(const T &argument) {
+    if constexpr (std::is_pointer_v<T>) {
+        return argument == nullptr ? "null" : "*";
+    } else if constexpr (std::is_arithmetic_v<T> || std::is_enum_v<T>) {
+        return std::to_string(static_cast<long>(argument));
+    } else {
+        return "*";
+    }
+}
+
+template <typename... T>
+std::string ArgumentTexts(const T &...arguments) {
+    std::string strAll;
+    ((strAll += (strAll.empty() ? "" : ", ") + ArgumentText(arguments)), ...);
+    return '(' + strAll + ')';
+}
 
 // Runs the body on this thread and reports what the library did.
 Outcome Observe(const std::function<void()> &body);

@@ -26,12 +26,13 @@ inline void Clear() {
 
 // Adds a credential without a session; returns its id.
 inline long AddCredential(const char *szApplication, const char *szHost,
-                          const char *szExtraInfo = nullptr) {
+                          const char *szExtraInfo = nullptr, const char *szProtocol = "https",
+                          int port = 443) {
     const std::unique_ptr<ZELO_CRED, void (*)(ZELO_CRED *)> pCred(ZELOCredAlloc(), ZELOCredFree);
     ZELOCredItemSetApplication(pCred.get(), szApplication);
     ZELOCredItemSetHost(pCred.get(), szHost);
-    ZELOCredItemSetProtocol(pCred.get(), "https");
-    ZELOCredItemSetPort(pCred.get(), 443);
+    ZELOCredItemSetProtocol(pCred.get(), szProtocol);
+    ZELOCredItemSetPort(pCred.get(), port);
     if (szExtraInfo != nullptr) {
         ZELOCredItemSetExtraInfo(pCred.get(), szExtraInfo);
     }

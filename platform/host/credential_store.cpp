@@ -225,7 +225,7 @@ long ZELOCredIDGetByApplication(const char *szApplication) {
 }
 
 int ZELOCredRemoveByID(long id) {
-    return ToInt(database::RemoveCredential(id));
+    return NoThrow([&] { return ToInt(database::RemoveCredential(id)); });
 }
 
 ZELO_CRED_SESS *ZELOCredSessAlloc() {
@@ -283,5 +283,5 @@ int ZELOCredSessLoad(long id, ZELO_CRED_SESS *pSess) {
 }
 
 int ZELOCredSessRemoveByID(long id) {
-    return ToInt(database::RemoveSession(id));
+    return NoThrow([&] { return ToInt(database::RemoveSession(id)); });
 }

@@ -138,6 +138,18 @@ Result Database::CreateFile() const {
     return Result::kDone;
 }
 
+// A store that was copied back, or made by hand, may be readable for others: what is written into
+// it is not to be.
+Result Database::TightenModes(mode_t fileMode) const {
+    struct stat folder = {};
+    if (stat(m_store.szFolder, &folder) != 0 ||
+        ((folder.st_mode & 0077) != 0 && chmod(m_store.szFolder, 0700) != 0) ||
+        ((fileMode & 0177) != 0 && chmod(m_store.szPath, 0600) != 0)) {
+        return FailErrno(__LINE__);
+    }
+    return Result::kDone;
+}
+
 // Is it ours? kAbsent: nothing is in it yet, as a process leaves it that dies while creating it.
 // That is asked of SQLite, not of the file's size: its journal may still have to undo something.
 Result Database::CheckFormat() {
@@ -201,7 +213,7 @@ Result Database::CreateSchema() {
 // fails. kAbsent: there is no file, or nothing in it.
 Result Database::Connect(bool blWrite) {
     struct stat status = {};
-    if (stat(m_store.szPath, &status) != 0) {
+    if (lstat(m_store.szPath, &status) != 0) {
         if (errno != ENOENT) {
             return FailErrno(__LINE__);
         }
@@ -212,9 +224,16 @@ Result Database::Connect(bool blWrite) {
         if (CreateFile() != Result::kDone) {
             return Result::kFailed;
         }
-        if (stat(m_store.szPath, &status) != 0) {
+        if (lstat(m_store.szPath, &status) != 0) {
             return FailErrno(__LINE__);
         }
+    }
+    if (!S_ISREG(status.st_mode)) {
+        m_pConnection.reset();
+        return Fail(SQLITE_CANTOPEN, "it is no regular file", __LINE__);
+    }
+    if (blWrite && TightenModes(status.st_mode) != Result::kDone) {
+        return Result::kFailed;
     }
     Result result = Result::kDone;
     if (m_pConnection == nullptr || m_pConnection->device != status.st_dev ||

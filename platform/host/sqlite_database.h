@@ -59,6 +59,7 @@ class Database {
     Result Connect(bool blWrite);
     Result Open(dev_t device, ino_t inode);
     Result CreateFile() const;
+    Result TightenModes(mode_t fileMode) const;
     Result CheckFormat();
     Result CreateSchema();
     Result Fail(int sqliteError, const char *szWhat, int line) const;

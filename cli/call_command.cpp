@@ -1,0 +1,85 @@
+// qrmctl call and update: requests to the joined server.
+
+#include <memory>
+
+#include "commands.h"
+#include "input_file.h"
+#include "json_text.h"
+#include "zeloqrmclient.h"
+
+namespace qrmctl {
+namespace {
+
+struct Options {
+    std::string strApi;
+    std::string strMethod;
+    int version = 1;
+    std::string strParams;
+    bool blCached = false;
+    std::string strHost;
+};
+
+ExitCode Call(const Options &options, Report &report) {
+    Json::Value params;
+    std::string strError;
+    if (!ReadParams(options.strParams, params, strError)) {
+        return report.Fail(strError);
+    }
+    Json::Value reply;
+    if (ZELOQRMClientSendWebapi(reply, options.strApi, options.version, options.strMethod, params,
+                                options.blCached) != 0) {
+        return report.Fail(
+            "no usable reply from the server: is this appliance joined, and can it "
+            "reach the server? -v shows the reason");
+    }
+    report.Document("reply", reply);
+    if (!json_text::IsTrue(json_text::Member(reply, "success"))) {
+        return report.Fail("the server refused the call with error code " +
+                           std::to_string(json_text::ErrorCode(reply)));
+    }
+    return report.Done();
+}
+
+ExitCode Update(const Options &options, Report &report) {
+    Json::Value info(Json::objectValue);
+    if (!options.strHost.empty()) {
+        info["host"] = options.strHost;
+    }
+    if (ZELOQRMClientSendSetClient(info) != 0) {
+        return report.Fail(
+            "the server did not take the update, or a fact of this appliance is "
+            "missing; -v shows the reason");
+    }
+    report.Say("The server's entry for this appliance is up to date.");
+    return report.Done();
+}
+
+}  // namespace
+
+void AddCall(CLI::App &app, Action &action) {
+    auto *const pCommand = app.add_subcommand("call", "Call a Web API of the joined server");
+    const auto pOptions = std::make_shared<Options>();
+    pCommand->add_option("API", pOptions->strApi, "Web API, such as ZELO.QRM.RPC")->required();
+    pCommand->add_option("METHOD", pOptions->strMethod, "Its method")->required();
+    pCommand->add_option("--version", pOptions->version, "Version of the API (default: 1)");
+    pCommand->add_option("--params", pOptions->strParams,
+                         "Parameters: a JSON object, or @FILE with one (@- for standard input)");
+    pCommand->add_flag("--cached", pOptions->blCached,
+                       "Use the records that this process has loaded before");
+    pCommand->callback([pOptions, &action] {
+        action = [pOptions](Report &report) { return Call(*pOptions, report); };
+    });
+}
+
+void AddUpdate(CLI::App &app, Action &action) {
+    auto *const pCommand =
+        app.add_subcommand("update", "Bring the server's entry for this appliance up to date");
+    const auto pOptions = std::make_shared<Options>();
+    pCommand->add_option("--host", pOptions->strHost,
+                         "The address at which the server reaches this appliance");
+    pCommand->callback([pOptions, &action] {
+        action = [pOptions](Report &report) { return Update(*pOptions, report); };
+    });
+}
+
+}  // namespace qrmctl

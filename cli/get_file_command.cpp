@@ -1,0 +1,228 @@
+// qrmctl get-file: fetches a file beside its destination and puts it there when it is whole.
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <csignal>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <filesystem>
+#include <memory>
+
+#include "commands.h"
+#include "file_system.h"
+#include "input_file.h"
+#include "last_error.h"
+#include "progress.h"
+#include "web_api_request.h"
+#include "zeloqrmclient.h"
+
+namespace qrmctl {
+namespace {
+
+namespace fs = std::filesystem;
+
+struct Options {
+    std::string strPath;
+    std::string strApi;
+    std::string strMethod;
+    int version = 1;
+    std::string strParams;
+    bool blInPlace = false;
+};
+
+// --- The transfer -------------------------------------------------------------------------------
+
+volatile std::sig_atomic_t g_interrupted = 0;
+
+void Interrupt(int signal) {
+    g_interrupted = signal;
+}
+
+// While it lives, a signal that would end the program ends the transfer.
+class InterruptGuard {
+  public:
+    InterruptGuard() {
+        struct sigaction action = {};
+        action.sa_handler = Interrupt;
+        for (std::size_t i = 0; i < std::size(kSignals); ++i) {
+            sigaction(kSignals[i], &action, &m_before[i]);
+        }
+    }
+    ~InterruptGuard() {
+        for (std::size_t i = 0; i < std::size(kSignals); ++i) {
+            sigaction(kSignals[i], &m_before[i], nullptr);
+        }
+    }
+    InterruptGuard(const InterruptGuard &) = delete;
+    InterruptGuard &operator=(const InterruptGuard &) = delete;
+
+  private:
+    static constexpr int kSignals[] = {SIGINT, SIGTERM, SIGHUP};
+    struct sigaction m_before[std::size(kSignals)] = {};
+};
+
+bool Observe(void *pContext, long long cbWritten, long long cbExpected) {
+    static_cast<Progress *>(pContext)->Update(cbWritten, cbExpected);
+    return g_interrupted == 0;
+}
+
+enum class Outcome { kFetched, kUnchanged, kFailed };
+
+Outcome Fetch(const std::string &strPath, const Options &options, Json::Value &params,
+              Progress &progress) {
+    ZELO::CredRequestUtil::SetProgressObserver(Observe, &progress);
+    YLIBCErrSetEx(YLIBC_ERR_NONE, "", 0);
+    const int result =
+        ZELOQRMClientGetFile(strPath, options.strApi, options.version, options.strMethod, params);
+    ZELO::CredRequestUtil::SetProgressObserver(nullptr, nullptr);
+    if (result != 0) {
+        return Outcome::kFailed;
+    }
+    return YLIBCErrGet() == YLIBC_ERR_UNCHANGED ? Outcome::kUnchanged : Outcome::kFetched;
+}
+
+ExitCode Tell(Outcome outcome, const std::string &strPath, const Progress &progress,
+              Report &report) {
+    if (outcome == Outcome::kFailed) {
+        return report.Fail(
+            g_interrupted != 0
+                ? "interrupted"
+                : "the file could not be fetched: is this appliance joined, and does the server "
+                  "have the file? -v shows the reason");
+    }
+    report.Fact("path", strPath);
+    report.Fact("unchanged", outcome == Outcome::kUnchanged);
+    report.Fact("bytes", static_cast<Json::Int64>(progress.Bytes()));
+    return report.Done();
+}
+
+// --- Beside the destination ---------------------------------------------------------------------
+
+// A folder of our own beside the destination, removed with what is left in it.
+class Workplace {
+  public:
+    explicit Workplace(const fs::path &destination)
+        : m_strFolder(destination.parent_path() /
+                      ('.' + destination.filename().string() + ".XXXXXX")) {
+        if (mkdtemp(m_strFolder.data()) == nullptr) {
+            m_error = errno;
+            m_strFolder.clear();
+        }
+    }
+    ~Workplace() {
+        std::error_code ignored;
+        if (!m_strFolder.empty()) {
+            fs::remove_all(m_strFolder, ignored);
+        }
+    }
+    Workplace(const Workplace &) = delete;
+    Workplace &operator=(const Workplace &) = delete;
+
+    bool IsUsable() const { return !m_strFolder.empty(); }
+    int Error() const { return m_error; }
+    std::string File() const { return m_strFolder + "/file"; }
+
+  private:
+    std::string m_strFolder;
+    int m_error = 0;
+};
+
+// Through links to the file itself, so that a link stays one; absolute, so that it has a folder.
+bool ResolveDestination(const std::string &strPath, fs::path &destination, std::string &strError) {
+    std::error_code error;
+    destination = fs::weakly_canonical(fs::absolute(strPath, error), error);
+    if (!error && (fs::is_directory(destination, error) || !destination.has_filename())) {
+        strError = "'" + strPath + "' is a directory: name the file in it";
+        return false;
+    }
+    const std::string strFolder = destination.parent_path();
+    constexpr int kOwner = 1024;
+    constexpr int kGroup = 100;
+    if (strPath.empty() || ZELOFSMkdirP(strFolder.c_str(), 0, 1, kOwner, kGroup, 0755) < 0) {
+        strError =
+            "cannot create the directory of '" + strPath + "': name a path that can be written";
+        return false;
+    }
+    return true;
+}
+
+// Gives the new file the mode and owner of the old one, as far as that is allowed, and puts it in
+// the old one's place.
+bool PutInPlace(const std::string &strFile, const fs::path &destination) {
+    const int fd = open(strFile.c_str(), O_RDONLY | O_CLOEXEC | O_NOFOLLOW);
+    if (fd < 0) {
+        return false;
+    }
+    struct stat old = {};
+    if (stat(destination.c_str(), &old) == 0) {
+        static_cast<void>(fchown(fd, old.st_uid, old.st_gid) == 0);
+        static_cast<void>(fchmod(fd, old.st_mode & 07777) == 0);
+    }
+    const bool blDurable = fsync(fd) == 0;
+    close(fd);
+    return blDurable && std::rename(strFile.c_str(), destination.c_str()) == 0;
+}
+
+ExitCode GetBeside(const Options &options, Json::Value &params, Report &report) {
+    fs::path destination;
+    std::string strError;
+    if (!ResolveDestination(options.strPath, destination, strError)) {
+        return report.Fail(strError);
+    }
+    const InterruptGuard guard;
+    const Workplace workplace(destination);
+    if (!workplace.IsUsable()) {
+        return report.Fail("cannot write beside '" + options.strPath +
+                           "': " + std::strerror(workplace.Error()));
+    }
+    char szMd5[33] = {};
+    if (GetFileMd5String(destination.c_str(), szMd5, sizeof(szMd5)) == 0) {
+        params["md5"] = szMd5;
+    }
+    Progress progress(!report.IsJson());
+    const Outcome outcome = Fetch(workplace.File(), options, params, progress);
+    if (outcome == Outcome::kFetched && !PutInPlace(workplace.File(), destination)) {
+        return report.Fail("cannot replace '" + options.strPath + "': " + std::strerror(errno) +
+                           "; it is as it was");
+    }
+    return Tell(outcome, options.strPath, progress, report);
+}
+
+ExitCode GetFile(const Options &options, Report &report) {
+    Json::Value params;
+    std::string strError;
+    if (!ReadParams(options.strParams, params, strError)) {
+        return report.Fail(strError);
+    }
+    if (!options.blInPlace) {
+        return GetBeside(options, params, report);
+    }
+    Progress progress(!report.IsJson());
+    const InterruptGuard guard;
+    return Tell(Fetch(options.strPath, options, params, progress), options.strPath, progress,
+                report);
+}
+
+}  // namespace
+
+void AddGetFile(CLI::App &app, Action &action) {
+    auto *const pCommand = app.add_subcommand("get-file", "Fetch a file from the joined server");
+    const auto pOptions = std::make_shared<Options>();
+    pCommand->add_option("PATH", pOptions->strPath, "Where to put the file")->required();
+    pCommand->add_option("API", pOptions->strApi, "Web API that sends it")->required();
+    pCommand->add_option("METHOD", pOptions->strMethod, "Its method")->required();
+    pCommand->add_option("--version", pOptions->version, "Version of the API (default: 1)");
+    pCommand->add_option("--params", pOptions->strParams,
+                         "Parameters: a JSON object, or @FILE with one (@- for standard input)");
+    pCommand->add_flag("--in-place", pOptions->blInPlace,
+                       "Write to PATH itself, which is emptied first");
+    pCommand->callback([pOptions, &action] {
+        action = [pOptions](Report &report) { return GetFile(*pOptions, report); };
+    });
+}
+
+}  // namespace qrmctl

@@ -1,0 +1,43 @@
+// qrmctl idle: the disks' idle time.
+
+#include <memory>
+
+#include "commands.h"
+#include "zeloqrmclient.h"
+
+namespace qrmctl {
+namespace {
+
+ExitCode Get(Report &report) {
+    unsigned long idleTime = 0;
+    if (ZELOQRMIdleTimeGet(idleTime) != 0) {
+        return report.Fail("the disks' idle time cannot be read; -v shows the reason");
+    }
+    report.Fact("idle_minutes", static_cast<Json::UInt64>(idleTime));
+    return report.Done();
+}
+
+ExitCode Set(unsigned long idleTime, Report &report) {
+    if (ZELOQRMIdleTimeSet(idleTime) != 0) {
+        return report.Fail("the disks' idle time cannot be set; -v shows the reason");
+    }
+    report.Fact("idle_minutes", static_cast<Json::UInt64>(idleTime));
+    return report.Done();
+}
+
+}  // namespace
+
+void AddIdle(CLI::App &app, Action &action) {
+    auto *const pIdle = app.add_subcommand("idle", "Read or set the disks' idle time");
+    pIdle->require_subcommand(1);
+    pIdle->add_subcommand("get", "Show the idle time in force, in minutes; 0: never")
+        ->callback([&action] { action = Get; });
+    auto *const pSet = pIdle->add_subcommand("set", "Set the idle time");
+    const auto pTime = std::make_shared<unsigned long>(0);
+    pSet->add_option("MINUTES", *pTime, "Minutes without use before the disks sleep; 0: never")
+        ->required();
+    pSet->callback(
+        [pTime, &action] { action = [pTime](Report &report) { return Set(*pTime, report); }; });
+}
+
+}  // namespace qrmctl

@@ -1,0 +1,141 @@
+#include "indicators.h"
+
+#include "credential_store.h"
+#include "fixed_text.h"
+#include "key_value_file.h"
+#include "membership.h"
+#include "platform_handles.h"
+#include "process.h"
+#include "user_group.h"
+#include "web_session.h"
+
+namespace qrmctl {
+namespace {
+
+constexpr const char *kLeave = "qrmctl leave";
+constexpr const char *kJoinAgain = "qrmctl leave, then qrmctl join";
+constexpr const char *kStartDaemon = "/usr/zelo/etc/rc.d/S99zelocache.sh start";
+constexpr const char *kCreateAccount = "qrmctl account create";
+
+// What the flag says: nothing disagrees with a flag that cannot be judged.
+struct Flag {
+    bool blYes;
+    bool blNo;
+};
+
+void Break(Indicator &indicator, int rule, const char *szRule, const char *szRemedy) {
+    indicator.rule = rule;
+    indicator.strRule = szRule;
+    indicator.strRemedy = szRemedy;
+}
+
+Indicator ReadFlag(Flag &flag) {
+    const int result = YLIBCFileCheckKeyValue(kConfigFile, kJoinFlag, "yes", 0);
+    flag = {result == 1, result == 0};
+    FixedText<1024> value;
+    const int cb =
+        YLIBCFileGetKeyValue(kConfigFile, kJoinFlag, value.Buffer(), FixedText<1024>::Size(), 0);
+    Indicator indicator;
+    indicator.strName = "join flag";
+    indicator.strHolds = cb > 0 ? std::string("\"") + value.sz() + '"' : "not set";
+    if (!flag.blYes && !flag.blNo) {
+        indicator.strHolds = std::string(kConfigFile) + " cannot be read";
+    }
+    return indicator;
+}
+
+Indicator ReadCredential(const Flag &flag, const char *szName, const char *szApplication,
+                         int rule) {
+    Indicator indicator;
+    indicator.strName = szName;
+    const long id = ZELOCredIDGetByApplication(szApplication);
+    const CredHandle pCred(ZELOCredAlloc());
+    FixedText<1024> host;
+    if (id < 0) {
+        indicator.strHolds = "not stored";
+    } else if (pCred != nullptr && ZELOCredLoad(id, pCred.get()) >= 0 &&
+               ZELOCredItemGetHost(host.Buffer(), FixedText<1024>::Size(), pCred.get()) == 0) {
+        indicator.strHolds = std::string("stored, for ") + host.sz();
+    } else {
+        indicator.strHolds = "stored";
+    }
+    if (flag.blNo && id >= 0) {
+        Break(indicator, rule, "FALSE == blJoined && 0 <= CredId", kLeave);
+    } else if (flag.blYes && id < 0) {
+        Break(indicator, rule + 1, "TRUE == blJoined && 0 > CredId", kJoinAgain);
+    }
+    return indicator;
+}
+
+Indicator ReadDaemon(const Flag &flag) {
+    Indicator indicator;
+    indicator.strName = "cache daemon";
+    const int status = YLIBCExec(kCacheDaemon, "status", nullptr, nullptr, nullptr);
+    indicator.strHolds = status == 0   ? "running"
+                         : status == 1 ? "stopped"
+                         : status < 0  ? "its script cannot be run"
+                                       : "status " + std::to_string(status);
+    if (flag.blNo && status == 0) {
+        Break(indicator, 5, "FALSE == blJoined && 0 == runRet", kLeave);
+    } else if (flag.blYes && status == 1) {
+        Break(indicator, 6, "TRUE == blJoined && 1 == runRet", kStartDaemon);
+    }
+    return indicator;
+}
+
+Indicator ReadSessions(const Flag &flag) {
+    ZELO_CGI_CONTEXT context = {};
+    const bool blReady = ZeloCgiInit("", &context) != 0;
+    bool blExists = false;
+    std::string strSessions;
+    for (const char *szSession : kClientSessions) {
+        if (blReady && ZeloCgiSessionExistByIndex(&context, kSessionIndex, szSession) != 0) {
+            blExists = true;
+            strSessions += (strSessions.empty() ? "" : ", ") + std::string(szSession);
+        }
+    }
+    ZeloCgiFree(&context);
+
+    Indicator indicator;
+    indicator.strName = "web sessions";
+    indicator.strHolds = !blReady ? "cannot be read" : blExists ? strSessions : "none";
+    if (flag.blNo && blExists) {
+        Break(indicator, 7, "FALSE == blJoined && true == blSessionExist", kLeave);
+    } else if (flag.blYes && !blExists) {
+        Break(indicator, 8, "TRUE == blJoined && false == blSessionExist", kJoinAgain);
+    }
+    return indicator;
+}
+
+Indicator ReadAccount(const Flag &flag) {
+    MovingHandle<ZELO_USER, ZELOUserFree> user;
+    const bool blExists = ZELOUserGet(kServiceAccount, user.Address()) == 0;
+    const bool blAdmin = blExists && YLIBGroupIsAdminGroupMem(user.Get()->szName, 0) == 1;
+
+    Indicator indicator;
+    indicator.strName = "service account";
+    indicator.strHolds = blAdmin    ? "exists, an administrator"
+                         : blExists ? "exists, no administrator"
+                                    : "does not exist";
+    if (flag.blYes && !blAdmin) {
+        Break(indicator, blExists ? 10 : 9, "TRUE == blJoined", kCreateAccount);
+    }
+    return indicator;
+}
+
+}  // namespace
+
+std::vector<Indicator> ReadIndicators() {
+    Flag flag = {};
+    std::vector<Indicator> indicators;
+    indicators.push_back(ReadFlag(flag));
+    indicators.push_back(ReadCredential(flag, "server credential", kServerApplication, 1));
+    indicators.push_back(
+        ReadCredential(flag, "notification-center credential", kNotificationCenter, 3));
+    indicators.push_back(ReadDaemon(flag));
+    indicators.push_back(ReadSessions(flag));
+    indicators.push_back(ReadAccount(flag));
+    return indicators;
+}
+
+}  // namespace qrmctl

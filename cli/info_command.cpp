@@ -1,0 +1,96 @@
+// qrmctl info and notify: what the library tells other programs and the appliance's users.
+
+#include <memory>
+#include <vector>
+
+#include "commands.h"
+#include "platform_handles.h"
+#include "zeloqrmclient.h"
+
+namespace qrmctl {
+namespace {
+
+ExitCode Get(const std::string &strKey, Report &report) {
+    std::string strValue;
+    if (!ZELOQRMClientGetInfo(strKey, strValue)) {
+        return report.Fail(
+            "the client info file cannot be read: no call to the server has had a "
+            "reply since this appliance was started, or it is damaged");
+    }
+    report.Fact(strKey, strValue);
+    return report.Done();
+}
+
+ExitCode Set(const std::string &strKey, const std::string &strValue, Report &report) {
+    if (!ZELOQRMClientSetInfo(strKey, strValue)) {
+        return report.Fail("cannot set '" + strKey +
+                           "': neither key nor value may hold a line feed, the key no '=', and "
+                           "/tmp/qrm_client.info has to be writable");
+    }
+    report.Say("'" + strKey + "' is set.");
+    return report.Done();
+}
+
+// "NAME=VALUE" sets the variable %NAME%.
+bool SetVariable(const std::string &strText, YLIBSZHASH **ppHash) {
+    const std::size_t equals = strText.find('=');
+    if (equals == std::string::npos || equals == 0) {
+        return false;
+    }
+    std::string strName = strText.substr(0, equals);
+    if (strName.front() != '%') {
+        strName = '%' + strName + '%';
+    }
+    return YLIBCSzHashSetValue(ppHash, strName.c_str(), strText.substr(equals + 1).c_str()) >= 0;
+}
+
+ExitCode Notify(const std::string &strTag, const std::vector<std::string> &variables,
+                Report &report) {
+    constexpr int kHashSize = 512;
+    HashHandle hash(YLIBCSzHashAlloc(kHashSize));
+    for (const std::string &strVariable : variables) {
+        if (!SetVariable(strVariable, hash.Address())) {
+            return report.Fail("cannot use variable '" + strVariable +
+                               "': write it as NAME=VALUE, such as QRM_SERVER=qrm.example");
+        }
+    }
+    SendNotification(strTag.c_str(), hash.Address());
+    report.Say("The notification '" + strTag + "' is handed to the notification service.");
+    return report.Done();
+}
+
+}  // namespace
+
+void AddInfo(CLI::App &app, Action &action) {
+    auto *const pInfo =
+        app.add_subcommand("info", "Read or write the client info file, such as its key 'status'");
+    pInfo->require_subcommand(1);
+    const auto pKey = std::make_shared<std::string>();
+    const auto pValue = std::make_shared<std::string>();
+
+    auto *const pGet = pInfo->add_subcommand("get", "Show the value of a key");
+    pGet->add_option("KEY", *pKey, "The key")->required();
+    pGet->callback(
+        [pKey, &action] { action = [pKey](Report &report) { return Get(*pKey, report); }; });
+
+    auto *const pSet = pInfo->add_subcommand("set", "Set the value of a key");
+    pSet->add_option("KEY", *pKey, "The key")->required();
+    pSet->add_option("VALUE", *pValue, "Its value")->required();
+    pSet->callback([pKey, pValue, &action] {
+        action = [pKey, pValue](Report &report) { return Set(*pKey, *pValue, report); };
+    });
+}
+
+void AddNotify(CLI::App &app, Action &action) {
+    auto *const pCommand =
+        app.add_subcommand("notify", "Send a notification to this appliance's users");
+    const auto pTag = std::make_shared<std::string>();
+    const auto pVariables = std::make_shared<std::vector<std::string>>();
+    pCommand->add_option("TAG", *pTag, "The event, such as QRMClientConnectFailed")->required();
+    pCommand->add_option("VARIABLE", *pVariables, "NAME=VALUE, set in place of %NAME%");
+    pCommand->callback([pTag, pVariables, &action] {
+        action = [pTag, pVariables](Report &report) { return Notify(*pTag, *pVariables, report); };
+    });
+}
+
+}  // namespace qrmctl

@@ -1,0 +1,101 @@
+// qrmctl log: pushes a log entry to the joined server, or shows what it would say.
+
+#include <memory>
+#include <vector>
+
+#include "commands.h"
+#include "json_text.h"
+#include "platform_handles.h"
+#include "zeloqrmclient.h"
+
+namespace qrmctl {
+namespace {
+
+struct Options {
+    std::string strLevel;
+    std::string strSection;
+    std::string strKey;
+    std::vector<std::string> params;
+    std::string strExtraInfo;
+    bool blExtraInfo = false;
+    bool blRender = false;
+};
+
+bool ReadLevel(const std::string &strLevel, int &level) {
+    for (const QRMCLIENT_LOG_LEVEL *pEntry = gZELOQRMClientLogLevelTable; pEntry->level >= 0;
+         ++pEntry) {
+        if (strLevel == pEntry->name || strLevel == std::to_string(pEntry->level)) {
+            level = pEntry->level;
+            return true;
+        }
+    }
+    return false;
+}
+
+ExitCode Render(const Options &options, YLIBSZLIST *pslParams, Report &report) {
+    const char *szSection = options.strSection == "-" ? nullptr : options.strSection.c_str();
+    Json::Value texts;
+    if (ConvertLog(szSection, options.strKey.c_str(), pslParams, texts) != 0) {
+        return report.Fail("no strings file has the key '" + options.strKey + "' in the section '" +
+                           options.strSection + "'");
+    }
+    if (report.IsJson()) {
+        report.Fact("log", texts);
+    } else {
+        for (const std::string &strLanguage : texts.getMemberNames()) {
+            report.Fact(strLanguage, texts[strLanguage]);
+        }
+    }
+    return report.Done();
+}
+
+ExitCode Push(const Options &options, Report &report) {
+    int level = 0;
+    if (!ReadLevel(options.strLevel, level)) {
+        return report.Fail("there is no level '" + options.strLevel +
+                           "': give 0 to 7, or emerg, alert, crit, err, warning, notice, info or "
+                           "debug");
+    }
+    constexpr int kListSize = 1024;
+    ListHandle params(YLIBCSzListAlloc(kListSize));
+    for (const std::string &strParam : options.params) {
+        if (YLIBCSzListPush(params.Address(), strParam.c_str()) < 0) {
+            return report.Fail("out of memory");
+        }
+    }
+    if (options.blRender) {
+        return Render(options, params.Get(), report);
+    }
+    const char *szSection = options.strSection == "-" ? nullptr : options.strSection.c_str();
+    if (ZELOQRMClientLog(level, szSection, options.strKey.c_str(), params.Get(),
+                         options.blExtraInfo ? options.strExtraInfo.c_str() : nullptr) != 0) {
+        return report.Fail("the server has not confirmed the log entry; -v shows the reason");
+    }
+    report.Say("The server has the log entry.");
+    return report.Done();
+}
+
+}  // namespace
+
+void AddLog(CLI::App &app, Action &action) {
+    auto *const pCommand = app.add_subcommand("log", "Push a log entry to the joined server");
+    const auto pOptions = std::make_shared<Options>();
+    pCommand->add_option("LEVEL", pOptions->strLevel, "0 to 7, or a name such as warning")
+        ->required();
+    pCommand
+        ->add_option("SECTION", pOptions->strSection,
+                     "Section of the strings files; - when KEY is the message itself")
+        ->required();
+    pCommand->add_option("KEY", pOptions->strKey, "The message")->required();
+    pCommand->add_option("PARAM", pOptions->params, "What fills its markers {0}, {1}, ...");
+    auto *const pExtraInfo = pCommand->add_option("--extra-info", pOptions->strExtraInfo,
+                                                  "Text sent beside the message");
+    pCommand->add_flag("--render", pOptions->blRender,
+                       "Show the message in every language and send nothing");
+    pCommand->callback([pOptions, pExtraInfo, &action] {
+        pOptions->blExtraInfo = pExtraInfo->count() > 0;
+        action = [pOptions](Report &report) { return Push(*pOptions, report); };
+    });
+}
+
+}  // namespace qrmctl

@@ -1,0 +1,127 @@
+#include "membership.h"
+
+#include <sys/random.h>
+
+#include <cstdlib>
+#include <ctime>
+#include <filesystem>
+
+#include "credential_store.h"
+#include "fixed_text.h"
+#include "key_value_file.h"
+#include "platform_handles.h"
+#include "process.h"
+#include "user_group.h"
+#include "web_session.h"
+#include "zeloqrmclient.h"
+
+namespace qrmctl {
+namespace {
+
+constexpr int kOwner = 1024;
+constexpr const char *kAccountFolder = "/usr/zelo/etc/QRM";
+
+// More credentials of one application than this are no accident.
+constexpr int kMaxLeaves = 100;
+
+bool StoreSession(long id, const std::string &strToken) {
+    const CredSessHandle pSess(ZELOCredSessAlloc());
+    return id >= 0 && pSess != nullptr && ZELOCredSessItemSetID(pSess.get(), id) >= 0 &&
+           ZELOCredSessItemSetAccessToken(pSess.get(), strToken.c_str()) >= 0 &&
+           ZELOCredSessSave(pSess.get()) >= 0;
+}
+
+// Copies protocol, host and port.
+bool CopyServer(const ZELO_CRED *pFrom, ZELO_CRED *pTo) {
+    FixedText<1024> protocol;
+    FixedText<1024> host;
+    long port = 0;
+    return ZELOCredItemGetProtocol(protocol.Buffer(), FixedText<1024>::Size(), pFrom) == 0 &&
+           ZELOCredItemGetHost(host.Buffer(), FixedText<1024>::Size(), pFrom) == 0 &&
+           ZELOCredItemGetPort(&port, pFrom) == 0 &&
+           ZELOCredItemSetProtocol(pTo, protocol.sz()) >= 0 &&
+           ZELOCredItemSetHost(pTo, host.sz()) >= 0 &&
+           ZELOCredItemSetPort(pTo, static_cast<int>(port)) >= 0;
+}
+
+// The generator is the C library's and takes a seed of 32 bits; it comes from the kernel.
+bool SeedGenerator() {
+    unsigned int seed = 0;
+    if (getrandom(&seed, sizeof(seed), 0) != static_cast<ssize_t>(sizeof(seed))) {
+        return false;
+    }
+    std::srand(seed);
+    return true;
+}
+
+// What join status does not look at: the account of a killed leave, its folder, its rights, and a
+// flag that still announces a join.
+bool RemoveRemains(bool blRejoin) {
+    std::error_code error;
+    if (!ZELOQRMClientDeleteServerUser()) {
+        return false;
+    }
+    std::filesystem::remove_all(kAccountFolder, error);
+    if (error || YLIBGroupExtraAdminSet("QRM", 0, 0, 0, 0) != 0) {
+        return false;
+    }
+    if (!blRejoin && YLIBCFileCheckKeyValue(kConfigFile, kJoinFlag, "rejoin", 0) == 1) {
+        return SetJoinFlag("no");
+    }
+    return true;
+}
+
+}  // namespace
+
+bool StoreServerSession(const std::string &strToken) {
+    return StoreSession(ZELOCredIDGetByApplication(kServerApplication), strToken);
+}
+
+bool StoreNotificationCenter(const std::string &strToken) {
+    const CredHandle pServer(ZELOCredAlloc());
+    const CredHandle pCred(ZELOCredAlloc());
+    const long serverId = ZELOCredIDGetByApplication(kServerApplication);
+    const long now_s = std::time(nullptr);
+    long id = -1;
+    return pServer != nullptr && pCred != nullptr && serverId >= 0 &&
+           ZELOCredLoad(serverId, pServer.get()) >= 0 && CopyServer(pServer.get(), pCred.get()) &&
+           ZELOCredItemSetApplication(pCred.get(), kNotificationCenter) >= 0 &&
+           ZELOCredItemSetOwner(pCred.get(), kOwner) >= 0 &&
+           ZELOCredItemSetCreateTime(pCred.get(), now_s) >= 0 &&
+           ZELOCredItemSetModifyTime(pCred.get(), now_s) >= 0 && ZELOCredSave(pCred.get()) >= 0 &&
+           ZELOCredItemGetID(&id, pCred.get()) >= 0 && StoreSession(id, strToken);
+}
+
+bool StartCacheDaemon() {
+    return YLIBCExec(kCacheDaemon, "start", nullptr, nullptr, nullptr) == 0 &&
+           YLIBCExec(kCacheDaemon, "status", nullptr, nullptr, nullptr) == 0;
+}
+
+bool AddClientSessions() {
+    ZELO_CGI_CONTEXT context = {};
+    bool blAdded = ZeloCgiInit("", &context) != 0;
+    for (const char *szSession : kClientSessions) {
+        blAdded = blAdded && ZeloCgiAddSessionByIndex(&context, kSessionIndex, szSession) != 0;
+    }
+    ZeloCgiFree(&context);
+    return blAdded;
+}
+
+bool CreateServiceAccount() {
+    return SeedGenerator() && ZELOQRMClientCreateServerUser();
+}
+
+bool SetJoinFlag(const char *szValue) {
+    return YLIBCINFOSetKeyValue(kJoinFlag, szValue) >= 0;
+}
+
+bool LeaveWholly(const LeaveRequest &request) {
+    for (int i = 0; i < kMaxLeaves && ZELOQRMClientStatus() != 0; ++i) {
+        if (!ZELOQRMClientDeleteServer(request.blRejoin, request.strFrom, request.blClearGluster)) {
+            return false;
+        }
+    }
+    return ZELOQRMClientStatus() == 0 && RemoveRemains(request.blRejoin);
+}
+
+}  // namespace qrmctl

@@ -1,0 +1,49 @@
+// Membership as the enrolling program sees it: what the library leaves to its caller when joining,
+// and what is left to do after the library's leave.
+
+#ifndef QRMCTL_MEMBERSHIP_H
+#define QRMCTL_MEMBERSHIP_H
+
+#include <string>
+
+namespace qrmctl {
+
+constexpr const char *kConfigFile = "/etc/zeloinfo.conf";
+constexpr const char *kJoinFlag = "join_nvo_qrm";
+constexpr const char *kServerApplication = "ZELO.QRM";
+constexpr const char *kNotificationCenter = "ZELO.NotificationCenter";
+constexpr const char *kCacheDaemon = "/usr/zelo/etc/rc.d/S99zelocache.sh";
+constexpr const char *kServiceAccount = "ZelonixQRM";
+constexpr const char *kClientSessions[] = {"ZELO.QRM.Client", "ZELO.QRM.Client.Machine"};
+constexpr int kSessionIndex = 13;
+
+// The steps of a join behind the library's own, each of which returns whether it succeeded. They
+// are taken in this order, the join flag last: "yes" is only ever written over a complete state.
+
+// Stores the session with the access token under the id of the credential that is in force.
+bool StoreServerSession(const std::string &strToken);
+
+// Stores the notification center's credential, for the same server and with a session of its own.
+bool StoreNotificationCenter(const std::string &strToken);
+
+bool StartCacheDaemon();
+bool AddClientSessions();
+
+// Seeds the generator that the account's password comes from, and creates the account.
+bool CreateServiceAccount();
+
+bool SetJoinFlag(const char *szValue);
+
+struct LeaveRequest {
+    bool blRejoin = false;
+    std::string strFrom;
+    bool blClearGluster = false;
+};
+
+// Leaves until nothing is left, from any half-way state: the library's leave as often as it takes,
+// then what it does not look for. Returns false when a step failed.
+bool LeaveWholly(const LeaveRequest &request);
+
+}  // namespace qrmctl
+
+#endif

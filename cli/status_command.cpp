@@ -1,0 +1,95 @@
+// qrmctl status and leave.
+
+#include <algorithm>
+#include <memory>
+
+#include "commands.h"
+#include "indicators.h"
+#include "membership.h"
+#include "zeloqrmclient.h"
+
+namespace qrmctl {
+namespace {
+
+const char *VerdictName(int status) {
+    return status == 1 ? "joined" : status == 0 ? "not joined" : "inconsistent";
+}
+
+std::string Padded(const std::string &strText, std::size_t width) {
+    return strText + std::string(width - std::min(width, strText.size()), ' ');
+}
+
+void Explain(Report &report) {
+    constexpr std::size_t kNameWidth = 32;
+    constexpr std::size_t kHoldsWidth = 36;
+    Json::Value indicators(Json::arrayValue);
+    for (const Indicator &indicator : ReadIndicators()) {
+        Json::Value entry;
+        entry["name"] = indicator.strName;
+        entry["holds"] = indicator.strHolds;
+        entry["rule"] = indicator.rule == 0 ? Json::Value() : Json::Value(indicator.rule);
+        std::string strLine =
+            Padded(indicator.strName, kNameWidth) + Padded(indicator.strHolds, kHoldsWidth);
+        if (indicator.rule != 0) {
+            entry["rule_text"] = indicator.strRule;
+            entry["remedy"] = indicator.strRemedy;
+            strLine += "breaks rule " + std::to_string(indicator.rule) +
+                       "; to mend: " + indicator.strRemedy;
+        } else {
+            strLine += "agrees";
+        }
+        indicators.append(entry);
+        report.Say(strLine);
+    }
+    report.Member("indicators", indicators);
+}
+
+ExitCode Status(bool blExplain, Report &report) {
+    const int status = ZELOQRMClientStatus();
+    report.Fact("status", VerdictName(status));
+    if (blExplain) {
+        Explain(report);
+    } else if (status < 0) {
+        report.Say("The indicators of membership disagree: 'qrmctl status --explain' shows them.");
+    }
+    return report.Done(status == 1 ? kDone : status == 0 ? kNotJoined : kInconsistent);
+}
+
+ExitCode Leave(const LeaveRequest &request, Report &report) {
+    const bool blJoined = ZELOQRMClientStatus() != 0;
+    if (!LeaveWholly(request)) {
+        return report.Fail(
+            "a step of leaving failed, what came before it is done: -v shows which; "
+            "run 'qrmctl leave' again when its cause is mended");
+    }
+    report.Fact("was_joined", blJoined);
+    report.Say(blJoined ? "This appliance has left the server."
+                        : "This appliance was not joined; nothing of a join is left.");
+    return report.Done();
+}
+
+}  // namespace
+
+void AddStatus(CLI::App &app, Action &action) {
+    auto *const pCommand = app.add_subcommand(
+        "status", "Judge whether this appliance is joined (exit 0), not (3), or half (4)");
+    const auto pExplain = std::make_shared<bool>(false);
+    pCommand->add_flag("--explain", *pExplain, "Show what the judgement rests on");
+    pCommand->callback([pExplain, &action] {
+        action = [pExplain](Report &report) { return Status(*pExplain, report); };
+    });
+}
+
+void AddLeave(CLI::App &app, Action &action) {
+    auto *const pCommand =
+        app.add_subcommand("leave", "Leave the server, from any half-way state too");
+    const auto pRequest = std::make_shared<LeaveRequest>();
+    pCommand->add_flag("--rejoin", pRequest->blRejoin, "Leave in order to join again");
+    pCommand->add_option("--from", pRequest->strFrom, "The application that asks for it");
+    pCommand->add_flag("--clear-gluster", pRequest->blClearGluster, "Told to the plug-ins");
+    pCommand->callback([pRequest, &action] {
+        action = [pRequest](Report &report) { return Leave(*pRequest, report); };
+    });
+}
+
+}  // namespace qrmctl

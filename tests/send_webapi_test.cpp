@@ -1,0 +1,655 @@
+// Requests to the joined server: the Web API call with its status, marker and notification, the
+// client info update, and the download, over real HTTPS.
+
+#include <fcntl.h>
+#include <openssl/evp.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <chrono>
+
+#include "joined.h"
+#include "json_text.h"
+#include "last_error.h"
+#include "text_containers.h"
+#include "torture.h"
+#include "zeloqrmclient.h"
+
+devserver::DevServer *joined::Joined::s_pServer = nullptr;
+
+namespace {
+
+using joined::FileText;
+using joined::kMarker;
+using joined::Messages;
+using torture::Expected;
+
+constexpr const char *kFile = "qrm_send_webapi";
+constexpr const char *kApi = "ZELO.QRM.RPC";
+constexpr const char *kFileApi = "ZELO.QRM.RPC.File";
+constexpr const char *kDownload = "/tmp/got/deep/file";
+
+class SendWebapi : public joined::Joined {
+  protected:
+    static std::string Call(bool blUseCache = false, const char *szMethod = "info") {
+        Json::Value resp = "untouched";
+        const int result =
+            ZELOQRMClientSendWebapi(resp, kApi, 1, szMethod, Json::Value(), blUseCache);
+        EXPECT_EQ(result == -1, resp == Json::Value("untouched"));
+        return std::to_string(result);
+    }
+    static void Answer(const std::string &strBody, int status = 200) {
+        devserver::NextAnswer answer;
+        answer.method = "info";
+        answer.status = status;
+        answer.body = strBody;
+        s_pServer->AnswerNext(kApi, answer);
+    }
+};
+
+TEST_F(SendWebapi, SurvivesEveryFailingCallOfTheFirstCallOfAProcess) {
+    const std::string strFailed = "status= marker=yes notified=1";
+    const auto fails = [&](const char *szLog, int kept) {
+        return Expected{"-1", szLog, strFailed, kept};
+    };
+    const Expected done{"0", "", "status=success marker=no notified=0", 2};
+    const Expected noStatus{"0", "", "status= marker=no notified=0", 2};
+    torture::Run(
+        {"call",
+         kFile,
+         [] { Reset(); },
+         [] { return Call(); },
+         State,
+         "ZELOCredIDGetByApplication('ZELO.QRM')\n"
+         "ZELOCredAlloc()\n"
+         "ZELOCredLoad(-1, *)\n"
+         "ZELOCredLoad(1, *)\n"
+         "ZELOCredSessAlloc()\n"
+         "ZELOCredSessLoad(-1, *)\n"
+         "ZELOCredSessLoad(1, *)\n"
+         "CreateWebAPIRequest(*, *, 'ZELO.QRM.RPC', 1, 'info', *)\n"
+         "GetURL(*)\n"
+         "Process(*, 1, 0)\n"
+         "GetResponse(*)\n"
+         "YLIBCFileLockByFile('/tmp/qrm_client.info.lock', 0, *)\n"
+         "YLIBCFileSetKeyValue('/tmp/qrm_client.info', 'status', 'success', 0)\n"
+         "unlink('/tmp/qrmclientconnectfailed')",
+         done,
+         {{"ZELOCredIDGetByApplication", fails("QRM credential is not found. [E]", 0)},
+          {"ZELOCredAlloc", fails("Failed to alloc ZELO_CRED. [E]", 0)},
+          {"ZELOCredLoad#1", fails("Failed to load default ZELO_CRED. [E]", 1)},
+          {"ZELOCredLoad#2", fails("CredId [1] is invalid. [E]", 1)},
+          {"ZELOCredSessAlloc", fails("Failed to alloc ZELO_CRED_SESS. [E]", 1)},
+          {"ZELOCredSessLoad#1", fails("Failed to load default ZELO_CRED_SESS. [E]", 2)},
+          {"ZELOCredSessLoad#2", fails("CredId [1] is invalid. [E]", 2)},
+          {"CreateWebAPIRequest",
+           fails("Create CredRequest fail. api=ZELO.QRM.RPC, ver=1, method=info", 2)},
+          // An URL that cannot be read is no https URL: the parameters are to be protected.
+          {"GetURL", done},
+          {"Process", fails("Process webapi fail. api=ZELO.QRM.RPC, ver=1, method=info", 2)},
+          {"GetResponse",
+           {"-1", "API:ZELO.QRM.RPC, method:info, Response invalid: ",
+            "status=no_connection marker=yes notified=1", 2}},
+          {"YLIBCFileLockByFile", noStatus},
+          {"YLIBCFileSetKeyValue", noStatus},
+          {"unlink", done}},
+         true});
+}
+
+TEST_F(SendWebapi, TheFailurePathNotifiesHoweverItsOwnCallsFail) {
+    const Expected told{"-1", "QRM credential is not found. [E]", "status= marker=yes notified=1"};
+    Expected untold = told;
+    untold.strStored = "status= marker=yes notified=0";
+    Expected unmarked = told;
+    unmarked.strStored = "status= marker=no notified=1";
+    const auto noStore = [] {
+        Reset();
+        ZELOQRMClientDeleteServerCredential();
+    };
+    // Without a credential the notification's own look-up logs too: one line is expected here, so
+    // the credential is there and only its look-up for the request fails.
+    std::vector<std::string> messages;
+    for (const auto &[szFailing, expected] :
+         std::vector<std::pair<const char *, Expected>>{{"YLIBCFileStat", told},
+                                                        {"YLIBCExec", unmarked},
+                                                        {"YLIBCSzHashAlloc", untold},
+                                                        {"YLIBCSzHashGetValue", told},
+                                                        {"YLIBCSzHashSetValue", told},
+                                                        {"ZELOSysNotifySendNotifiction", untold},
+                                                        {"none", told}}) {
+        SCOPED_TRACE(szFailing);
+        noStore();
+        std::string strResult;
+        const seam::Outcome outcome = seam::Observe({szFailing, 1}, [&] { strResult = Call(); });
+        EXPECT_EQ(strResult, "-1");
+        EXPECT_EQ(State(), expected.strStored);
+        EXPECT_EQ(outcome.recordsLeft, 0);
+        EXPECT_EQ(torture::WithoutErrorTail(outcome.logs.at(0).strMessage), expected.strLog);
+    }
+    noStore();
+    const seam::Outcome outcome = seam::Observe([] { Call(); });
+    EXPECT_EQ(torture::Joined(outcome.details, "\n"),
+              "ZELOCredIDGetByApplication('ZELO.QRM')\n"
+              "YLIBCFileStat('/tmp/qrmclientconnectfailed', 1, *)\n"
+              "YLIBCExec('/bin/touch', '/tmp/qrmclientconnectfailed', null, null, null)\n"
+              "YLIBCSzHashAlloc(512)\n"
+              "ZELOCredListGet(*, *, 'ZELO.QRM')\n"
+              "YLIBCSzHashGetValue(*, '%QRM_SERVER%')\n"
+              "YLIBCSzHashSetValue(*, '%QRM_SERVER%', 'Unknown')\n"
+              "ZELOSysNotifySendNotifiction('QRMClientConnectFailed', *)");
+    EXPECT_EQ(torture::WithoutErrorTail(Messages(outcome)),
+              "QRM credential is not found. [E]\ncannot find qrm server info");
+}
+
+TEST_F(SendWebapi, TheReplyDecidesTheStatus) {
+    const struct {
+        std::string strBody;
+        int result;
+        const char *szStatus;
+    } rows[] = {
+        {R"({"success":true,"data":1})", 0, "success"},
+        {R"({"success":1})", 0, "success"},
+        {R"({"success":false,"error":{"code":104}})", 0, "error"},
+        {R"({"success":false,"error":{"code":105}})", 0, "no_permission"},
+        {R"({"success":false,"error":{"code":106}})", 0, "no_permission"},
+        {R"({"success":false,"error":{"code":107}})", 0, "no_permission"},
+        {R"({"success":false,"error":{"code":108}})", 0, "error"},
+        {R"({"success":false,"error":{"code":"105"}})", 0, "error"},
+        {R"({"success":false,"error":{"code":99999999999999}})", 0, "error"},
+        {R"({"success":false,"error":[105]})", 0, "error"},
+        {R"({"success":"true"})", 0, "error"},
+        {"{}", 0, "error"},
+        {"[1]", 0, "error"},
+        {"null", 0, "error"},
+        {"7", 0, "error"},
+        {R"("text")", 0, "error"},
+        {"", -1, "no_connection"},
+        {"<html>", -1, "no_connection"},
+        {R"({"success":tr)", -1, "no_connection"},
+        {std::string(2000, '['), -1, "no_connection"},
+    };
+    EXPECT_EQ(Call(), "0") << "and the process keeps its records";
+    for (const auto &row : rows) {
+        SCOPED_TRACE(row.strBody.substr(0, 60));
+        std::ofstream(kMarker) << "";
+        Answer(row.strBody);
+        Json::Value resp;
+        int result = 1;
+        const seam::Outcome outcome = seam::Observe(
+            [&] { result = ZELOQRMClientSendWebapi(resp, kApi, 1, "info", Json::Value(), false); });
+        EXPECT_EQ(result, row.result);
+        Json::Value body;
+        json_text::FromString(row.strBody, body);
+        EXPECT_EQ(resp, row.result == 0 ? body : Json::Value());
+        EXPECT_EQ(State(), std::string("status=") + row.szStatus +
+                               (row.result == 0 ? " marker=no" : " marker=yes") + " notified=0");
+        const bool blSuccess = std::string(row.szStatus) == "success";
+        EXPECT_EQ(Messages(outcome),
+                  blSuccess ? std::string()
+                            : "API:ZELO.QRM.RPC, method:info, Response invalid: " + row.strBody);
+        EXPECT_EQ(outcome.recordsLeft, 0);
+    }
+}
+
+TEST_F(SendWebapi, EchoedTokensStayOutOfTheLog) {
+    Answer(std::string("{\"t\":\"") + joined::kToken + "\",\"c\":\"csrf-9876543210\"}");
+    const seam::Outcome outcome = seam::Observe([] { EXPECT_EQ(Call(), "0"); });
+    EXPECT_EQ(Messages(outcome),
+              R"(API:ZELO.QRM.RPC, method:info, Response invalid: {"t":"***","c":"***"})");
+}
+
+TEST_F(SendWebapi, UsersAreToldAgainAfterTwoHoursAndAtOnceAfterAReply) {
+    constexpr long kNow = 2'000'000'000;
+    const struct {
+        long age;
+        bool blTold;
+    } rows[] = {{0, false}, {7200, false}, {7201, true}, {-7200, false}, {-7201, true}};
+    for (const auto &row : rows) {
+        SCOPED_TRACE(row.age);
+        Reset();
+        ZELOQRMClientDeleteServerCredential();
+        std::ofstream(kMarker) << "";
+        const timespec times[] = {{kNow - row.age, 0}, {kNow - row.age, 0}};
+        utimensat(AT_FDCWD, kMarker, times, 0);
+        seam::Observe({"time", 1, true, kNow}, [] { EXPECT_EQ(Call(), "-1"); });
+        EXPECT_EQ(State(),
+                  row.blTold ? "status= marker=yes notified=1" : "status= marker=yes notified=0");
+        struct stat status = {};
+        stat(kMarker, &status);
+        EXPECT_EQ(status.st_mtime == kNow - row.age, !row.blTold) << "the marker's time";
+    }
+    // A link is not followed: the file that it leads to keeps its time.
+    Reset();
+    ZELOQRMClientDeleteServerCredential();
+    const std::string strTarget = "/tmp/target";
+    std::ofstream(strTarget.c_str()) << "x";
+    const timespec old[] = {{1, 0}, {1, 0}};
+    utimensat(AT_FDCWD, strTarget.c_str(), old, 0);
+    ASSERT_EQ(symlink(strTarget.c_str(), kMarker), 0);
+    EXPECT_EQ(Call(), "-1");
+    struct stat status = {};
+    stat(strTarget.c_str(), &status);
+    EXPECT_EQ(status.st_mtime, 1);
+    EXPECT_EQ(State(), "status= marker=yes notified=1");
+}
+
+TEST_F(SendWebapi, TheCacheIsUsedOnlyWhenAskedFor) {
+    torture::Separately(true, [] {
+        EXPECT_EQ(Call(true), "0") << "the first call of a process loads";
+        ZELOQRMClientDeleteServerCredential();
+        const seam::Outcome cached = seam::Observe([] { EXPECT_EQ(Call(true), "0"); });
+        EXPECT_EQ(cached.calls.at(0), "CreateWebAPIRequest") << "without a look at the store";
+        EXPECT_EQ(Call(false), "-1");
+    });
+}
+
+TEST_F(SendWebapi, PlainHttpAsksForProtectedParameters) {
+    Reset("http");
+    const seam::Outcome outcome = seam::Observe([] { EXPECT_EQ(Call(), "0"); });
+    EXPECT_NE(torture::Joined(outcome.details, "\n")
+                  .find("GetURL(*)\nSetEncryptMode(*, 2)\nProcess(*, 1, 0)"),
+              std::string::npos);
+    const seam::Outcome refused =
+        seam::Observe({"SetEncryptMode", 1}, [] { EXPECT_EQ(Call(), "-1"); });
+    EXPECT_EQ(Messages(refused), "Failed to set encrypt mode for https.");
+    EXPECT_EQ(refused.recordsLeft, 0);
+}
+
+TEST_F(SendWebapi, TheTokensGoToTheServerAloneAndAsHeaders) {
+    EXPECT_EQ(Call(), "0");
+    devserver::DevServer other{devserver::Options()};
+    std::string strReason;
+    ASSERT_TRUE(other.Start(strReason)) << strReason;
+    devserver::NextAnswer redirect;
+    redirect.method = "info";
+    redirect.status = 307;
+    redirect.headers["Location"] =
+        "http://localhost:" + std::to_string(other.HttpPort()) + "/qrm/rpc";
+    s_pServer->AnswerNext(kApi, redirect);
+    EXPECT_EQ(Call(), "-1");
+    EXPECT_EQ(other.Requests().size(), 0U);
+
+    const Json::Value requests = s_pServer->Requests();
+    const Json::Value &call = requests[requests.size() - 1U];
+    EXPECT_EQ(call["headers"]["Authorization"], std::string("Bearer ") + joined::kToken);
+    EXPECT_EQ(call["headers"]["X-QRM-CSRF-Token"], "csrf-9876543210");
+    EXPECT_EQ(call["body"].asString().find(joined::kToken), std::string::npos);
+
+    for (const char *szToken : {"a\r\nX-Evil: 1", "a b", "a\x7F"}) {
+        stored::AddSession(1, szToken);
+        s_pServer->ForgetRequests();
+        EXPECT_EQ(Call(), "-1");
+        EXPECT_EQ(s_pServer->Requests().size(), 0U);
+    }
+}
+
+// A server that is silent, that sends a byte a second for ever, that never ends, that cuts: each
+// call ends within its bound. They wait at the same time, each in a process of its own.
+TEST_F(SendWebapi, NoServerKeepsACallForEver) {
+    devserver::NextAnswer silent;
+    silent.delay_ms = 120'000;
+    devserver::NextAnswer slow;
+    slow.bytes_per_s = 1;
+    slow.endless = true;
+    devserver::NextAnswer endless;
+    endless.endless = true;
+    devserver::NextAnswer cut;
+    cut.cut_after = 5;
+    std::vector<pid_t> children;
+    const char *const methods[] = {"silent", "slow", "endless", "cut"};
+    devserver::NextAnswer answers[] = {silent, slow, endless, cut};
+    for (std::size_t i = 0; i < std::size(methods); ++i) {
+        answers[i].method = methods[i];
+        answers[i].status = 200;
+        s_pServer->AnswerNext(kApi, answers[i]);
+    }
+    for (const char *szMethod : methods) {
+        std::fflush(nullptr);
+        const pid_t pid = fork();
+        ASSERT_GE(pid, 0);
+        if (pid == 0) {
+            const auto start = std::chrono::steady_clock::now();
+            const bool blFailed = Call(false, szMethod) == "-1";
+            const auto taken = std::chrono::steady_clock::now() - start;
+            _exit(blFailed && taken < std::chrono::seconds(45) ? 0 : 1);
+        }
+        children.push_back(pid);
+    }
+    for (pid_t pid : children) {
+        int status = -1;
+        waitpid(pid, &status, 0);
+        EXPECT_EQ(status, 0);
+    }
+}
+
+// --- Client info update -------------------------------------------------------------------------
+
+TEST_F(SendWebapi, TheUpdateSurvivesEveryFailingCall) {
+    const std::string strUpdated = R"({"build_number":123,"host":["h"],"http_port":5000,)"
+                                   R"("https_port":5001,"name":"zelobox",)"
+                                   R"("nvo_version":"NVO 6.2-123 Update 4","sn":"SN"})";
+    std::ofstream("/etc/zeloinfo.conf") << "admin_port=5000\nsecure_admin_port=5001\nrunHTTPS=no\n";
+    std::ofstream("/etc.defaults/VERSION")
+        << "majorversion=6\nminorversion=2\nbuildnumber=123\nsmallfixnumber=4\n";
+    std::ofstream("/etc.defaults/serial_number") << "SN\n";
+    const auto sent = [] {
+        const Json::Value requests = s_pServer->Requests();
+        Json::Value call;
+        for (const Json::Value &request : requests) {
+            json_text::FromString(request["body"].asString(), call);
+        }
+        return json_text::ToLogText(call["params"]);
+    };
+    const Expected silent{"-1", "", "null"};
+    Expected noSerial{"0", "Failed to get serial number from flash. [E]", strUpdated};
+    noSerial.strStored.replace(noSerial.strStored.find("\"SN\""), 4, "\"\"");
+    const auto replaced = [&](const std::string &strFrom, const std::string &strTo) {
+        std::string strText = strUpdated;
+        return Expected{"0", "", strText.replace(strText.find(strFrom), strFrom.size(), strTo)};
+    };
+    constexpr const char *kUpdateApi = "ZELO.QRM.RPC.ClientInfo";
+    const std::string strConfig = "YLIBCFileGetKeyValue('/etc/zeloinfo.conf', ";
+    const std::string strVersion = "YLIBCFileGetKeyValue('/etc.defaults/VERSION', ";
+    Json::Value info;
+    info["host"].append("h");
+    info["http_port"] = 1;
+    torture::Case test{
+        "update",
+        "qrm_send_setclient",
+        [&] {
+            s_pServer->ForgetRequests();
+            devserver::NextAnswer answer;
+            answer.method = "update";
+            answer.body = R"({"success":true})";
+            s_pServer->AnswerNext(kUpdateApi, answer);
+        },
+        [&] { return std::to_string(ZELOQRMClientSendSetClient(info)); },
+        sent,
+        "YLIBGetCustomSerialNumber(buf, 31)\n"
+        "YLIBGetSerialNumber(buf, 36)\n"
+        "gethostname(buf, 1024)\n" +
+            strVersion + "'majorversion', buf, 16, 0)\n" + strVersion +
+            "'minorversion', buf, 16, 0)\n" + strVersion + "'smallfixnumber', buf, 16, 0)\n" +
+            strVersion + "'buildnumber', buf, 16, 0)\n" + strConfig +
+            "'admin_port', buf, 1024, 0)\n" + strConfig + "'secure_admin_port', buf, 1024, 0)",
+        {"0", "", strUpdated},
+        {{"YLIBGetCustomSerialNumber", {"0", "", strUpdated}},
+         {"YLIBGetSerialNumber", noSerial},
+         {"gethostname", silent},
+         {"YLIBCFileGetKeyValue", silent},
+         {"YLIBCFileGetKeyValue#3", replaced(" Update 4", "")}}};
+    // The calls of the Web API call have a table of their own: what counts here comes before them.
+    test.countedCalls = 9;
+    torture::Run(test);
+}
+
+TEST_F(SendWebapi, TheUpdateReportsWhatTheServerSays) {
+    const struct {
+        const char *szBody;
+        const char *szLog;  // "": taken
+    } rows[] = {
+        {R"({"success":true})", ""},
+        {R"({"success":false,"error":{"code":105}})", "Send create client failed. (105)"},
+        {R"({"success":false})", "Send create client failed. (0)"},
+        {"[]", "Send create client failed. (0)"},
+        {"no json", "Send create client failed. (500)"},
+    };
+    for (const auto &row : rows) {
+        devserver::NextAnswer answer;
+        answer.method = "update";
+        answer.body = row.szBody;
+        s_pServer->AnswerNext("ZELO.QRM.RPC.ClientInfo", answer);
+        int result = 1;
+        const seam::Outcome outcome =
+            seam::Observe([&] { result = ZELOQRMClientSendSetClient(Json::Value("text")); });
+        EXPECT_EQ(result, row.szLog[0] == '\0' ? 0 : -1);
+        EXPECT_EQ(outcome.logs.empty() ? "" : outcome.logs.back().strMessage, row.szLog);
+    }
+}
+
+// --- Download -----------------------------------------------------------------------------------
+
+Json::Value FileParams(int size, const char *szName = "f") {
+    Json::Value params;
+    params["name"] = szName;
+    params["size"] = size;
+    return params;
+}
+
+std::string Download(const char *szPath = kDownload) {
+    Json::Value params = FileParams(100'000);
+    return std::to_string(ZELOQRMClientGetFile(szPath, kFileApi, 1, "get", params));
+}
+
+std::string DownloadState() {
+    struct stat status = {};
+    return stat(kDownload, &status) != 0 ? "none" : std::to_string(status.st_size);
+}
+
+TEST_F(SendWebapi, TheDownloadSurvivesEveryFailingCall) {
+    const Expected empty{"-1", "", "0"};
+    const Expected untouched{"-1", "", "3"};
+    torture::Run({"download",
+                  kFile,
+                  [] {
+                      Reset();
+                      std::filesystem::create_directories("/tmp/got/deep");
+                      std::ofstream(kDownload) << "old";
+                  },
+                  [] { return Download(); },
+                  DownloadState,
+                  "ZELOFSMkdirP('/tmp/got/deep', 0, 1, 1024, 100, 493)\n"
+                  "fopen64('/tmp/got/deep/file', 'w')\n"
+                  "ZELOCredIDGetByApplication('ZELO.QRM')\n"
+                  "CreateWebAPIRequestById(1, 'ZELO.QRM.RPC.File', 1, 'get', *)\n"
+                  "GetURL(*)\n"
+                  "SetRespStream(*, *, null)\n"
+                  "Process(*, 1, 0)\n"
+                  "fclose(*)",
+                  {"0", "", "100000"},
+                  {{"ZELOFSMkdirP", {"-1", "Failed to prepare path [/tmp/got/deep] [E]", "3"}},
+                   {"fopen64", untouched},
+                   {"ZELOCredIDGetByApplication", empty},
+                   {"CreateWebAPIRequestById", empty},
+                   {"GetURL", {"0", "", "100000"}},
+                   {"SetRespStream", empty},
+                   {"Process", empty},
+                   {"fclose", {"0", "", "100000", 1}}}});
+}
+
+TEST_F(SendWebapi, ADownloadTellsTheCopyThatItHas) {
+    std::filesystem::remove_all("/tmp/got");
+    Json::Value params = FileParams(100'000);
+    EXPECT_EQ(ZELOQRMClientGetFile(kDownload, kFileApi, 1, "get", params), 0);
+    EXPECT_FALSE(params.isMember("md5")) << "there was no copy";
+    EXPECT_EQ(DownloadState(), "100000");
+    const std::string strContent = FileText(kDownload);
+
+    params = FileParams(100'001);
+    EXPECT_EQ(ZELOQRMClientGetFile(kDownload, kFileApi, 1, "get", params), 0);
+    EXPECT_EQ(params["md5"].asString().size(), 32U);
+    EXPECT_EQ(DownloadState(), "100001");
+
+    // The server answers that the copy is current: a result of 0, and the file emptied before.
+    params = FileParams(100'001);
+    YLIBCErrSetEx(YLIBC_ERR_NONE, "", 0);
+    EXPECT_EQ(ZELOQRMClientGetFile(kDownload, kFileApi, 1, "get", params), 0);
+    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_UNCHANGED));
+    EXPECT_EQ(DownloadState(), "0");
+
+    for (const char *szPath :
+         {"/tmp/got/a\\b", "file-in-the-current-directory", "/tmp/got/deep/file"}) {
+        std::filesystem::current_path("/tmp/got");
+        EXPECT_EQ(Download(szPath), "0") << szPath;
+        EXPECT_EQ(FileText(szPath), strContent) << szPath;
+        std::filesystem::current_path("/");
+    }
+    EXPECT_TRUE(std::filesystem::is_directory("/tmp/got/a"));
+}
+
+TEST_F(SendWebapi, AnErrorPageIsNoFile) {
+    const auto answer = [](const devserver::NextAnswer &next) {
+        s_pServer->AnswerNext(kFileApi, next);
+    };
+    devserver::NextAnswer error;
+    error.method = "get";
+    error.status = 500;
+    error.body = "<html>";
+    devserver::NextAnswer redirect = error;
+    redirect.status = 302;
+    devserver::NextAnswer cut;
+    cut.method = "get";
+    cut.cut_after = 1000;
+    const struct {
+        devserver::NextAnswer answer;
+        const char *szSize;
+    } rows[] = {{error, "0"}, {redirect, "0"}, {cut, "1000"}};
+    for (const auto &row : rows) {
+        answer(row.answer);
+        EXPECT_EQ(Download(), "-1");
+        EXPECT_EQ(DownloadState(), row.szSize);
+    }
+    EXPECT_EQ(Download("/dev/full"), "-1") << "a full disk is an error";
+    Json::Value array(Json::arrayValue);
+    EXPECT_EQ(Download(), "0");
+    EXPECT_EQ(ZELOQRMClientGetFile(kDownload, kFileApi, 1, "get", array), -1);
+    EXPECT_EQ(DownloadState(), "100000") << "nothing is emptied for parameters of a wrong type";
+}
+
+TEST_F(SendWebapi, DigestsReadAsOneLine) {
+    std::filesystem::current_path("/tmp");
+    const std::string strPath = "digest $(touch evil)'\"";
+    std::ofstream(strPath.c_str()) << "The quick brown fox jumps over the lazy dog";
+    std::ofstream("/tmp/empty").flush();
+    const std::string strDigits = "9e107d9d372bb6826bd81d3542a419d6";
+    const struct {
+        const char *szPath;
+        int size;
+        int result;
+        std::string strText;
+    } rows[] = {
+        {strPath.c_str(), 64, 0, strDigits + "\n"},
+        {strPath.c_str(), 34, 0, strDigits + "\n"},
+        {strPath.c_str(), 33, 0, strDigits},
+        {strPath.c_str(), 32, 0, strDigits.substr(0, 31)},
+        {strPath.c_str(), 2, 0, "9"},
+        {strPath.c_str(), 0, -1, "before"},
+        {"/tmp/empty", 64, 0, "d41d8cd98f00b204e9800998ecf8427e\n"},
+        {"/dev/zero", 64, -1, "before"},
+        {"/tmp", 64, -1, "before"},
+        {"/tmp/absent", 64, -1, "before"},
+        {"", 64, -1, "before"},
+        {nullptr, 64, -1, "before"},
+    };
+    for (const auto &row : rows) {
+        char sz[64] = "before";
+        EXPECT_EQ(GetFileMd5String(row.szPath, sz, row.size), row.result);
+        EXPECT_EQ(sz, row.strText);
+    }
+    EXPECT_FALSE(std::filesystem::exists("/tmp/evil"));
+    EXPECT_EQ(GetFileMd5String("/tmp/empty", nullptr, 64), -1);
+}
+
+// --- Client info file and notifications ---------------------------------------------------------
+
+TEST_F(SendWebapi, KeysOfTheInfoFileAreReadAsTheyWereWritten) {
+    std::string strValue = "before";
+    EXPECT_FALSE(ZELOQRMClientGetInfo("key", strValue)) << "there is no file";
+    EXPECT_EQ(strValue, "before");
+    EXPECT_TRUE(ZELOQRMClientSetInfo("key", "a \"b\" \\ c"));
+    EXPECT_TRUE(ZELOQRMClientGetInfo("key", strValue));
+    EXPECT_EQ(strValue, "a \"b\" \\ c");
+    EXPECT_TRUE(ZELOQRMClientGetInfo("other", strValue));
+    EXPECT_EQ(strValue, "");
+    EXPECT_TRUE(ZELOQRMClientSetInfo("long", std::string(3000, 'x')));
+    EXPECT_TRUE(ZELOQRMClientGetInfo("long", strValue));
+    EXPECT_EQ(strValue, std::string(1023, 'x'));
+
+    const std::string strBefore = FileText(joined::kInfoFile);
+    for (const auto &[strKey, strText] :
+         std::vector<std::pair<std::string, std::string>>{{"a=b", "c"},
+                                                          {"a\nb", "c"},
+                                                          {"a", "c\nb=d"},
+                                                          {{"a\0b", 3}, "c"},
+                                                          {"a", {"c\0d", 3}}}) {
+        EXPECT_FALSE(ZELOQRMClientSetInfo(strKey, strText));
+    }
+    for (long result : {0L, -1L}) {
+        bool blSet = true;
+        const seam::Outcome outcome =
+            seam::Observe({"YLIBCFileLockByFile", 1, result == 0, result},
+                          [&] { blSet = ZELOQRMClientSetInfo("key", "new"); });
+        EXPECT_FALSE(blSet);
+        EXPECT_EQ(outcome.calls.size(), 1U) << "nothing is written without the lock";
+        EXPECT_EQ(outcome.recordsLeft, 0);
+    }
+    EXPECT_EQ(FileText(joined::kInfoFile), strBefore);
+}
+
+TEST_F(SendWebapi, WritersOfTheInfoFileLoseNothingOfEachOther) {
+    constexpr int kProcesses = 8;
+    constexpr int kKeys = 1000;
+    std::vector<pid_t> children;
+    for (int i = 0; i < kProcesses; ++i) {
+        const pid_t pid = fork();
+        ASSERT_GE(pid, 0);
+        if (pid == 0) {
+            bool blAll = true;
+            for (int key = 0; key < kKeys; ++key) {
+                blAll = ZELOQRMClientSetInfo(std::to_string(i * kKeys + key), "v") && blAll;
+            }
+            _exit(blAll ? 0 : 1);
+        }
+        children.push_back(pid);
+    }
+    for (pid_t pid : children) {
+        int status = -1;
+        waitpid(pid, &status, 0);
+        EXPECT_EQ(status, 0);
+    }
+    EXPECT_EQ(joined::CountLines(joined::kInfoFile), kProcesses * kKeys);
+}
+
+TEST_F(SendWebapi, NotificationsNameTheServer) {
+    const auto last = [] {
+        std::string strJournal = FileText(joined::kJournal);
+        strJournal.pop_back();
+        Json::Value line;
+        json_text::FromString(strJournal.substr(strJournal.rfind('\n') + 1), line);
+        return line["variables"];
+    };
+    YLIBSZHASH *pNull = nullptr;
+    for (YLIBSZHASH **ppHash : {static_cast<YLIBSZHASH **>(nullptr), &pNull}) {
+        const seam::Outcome outcome =
+            seam::Observe([&] { SendNotification("QRMClientDetachSuccess", ppHash); });
+        EXPECT_EQ(outcome.recordsLeft, 0);
+        EXPECT_TRUE(outcome.logs.empty());
+        EXPECT_EQ(json_text::ToLogText(last()), R"({"%QRM_SERVER%":"localhost"})");
+    }
+    EXPECT_EQ(pNull, nullptr);
+
+    YLIBSZHASH *pHash = YLIBCSzHashAlloc(16);
+    YLIBCSzHashSetValue(&pHash, "%OTHER%", "o");
+    SendNotification("QRMClientDetachSuccess", &pHash);
+    EXPECT_STREQ(YLIBCSzHashGetValue(pHash, "%QRM_SERVER%"), "localhost");
+    EXPECT_EQ(last()["%OTHER%"], "o");
+    YLIBCSzHashSetValue(&pHash, "%QRM_SERVER%", "");
+    SendNotification("QRMClientDetachSuccess", &pHash);
+    EXPECT_EQ(last()["%QRM_SERVER%"], "") << "an empty value is a value";
+    YLIBCSzHashFree(pHash);
+
+    for (const auto &[szFailing, szLog] : std::vector<std::pair<const char *, const char *>>{
+             {"YLIBCSzHashAlloc", "Failed to YLIBCSzHashAlloc[E]"},
+             {"YLIBCSzHashSetValue", "Failed to YLIBCSzHashSetValue[E]"}}) {
+        const int before = joined::CountLines(joined::kJournal);
+        const seam::Outcome outcome = seam::Observe(
+            {szFailing, 1}, [] { SendNotification("QRMClientDetachSuccess", nullptr); });
+        EXPECT_EQ(torture::WithoutErrorTail(Messages(outcome)), szLog);
+        EXPECT_EQ(outcome.logs.at(0).strFile, "qrm_send_notificatioin");
+        EXPECT_EQ(outcome.recordsLeft, 0);
+        const bool blSent = std::string(szFailing) == "YLIBCSzHashSetValue";
+        EXPECT_EQ(joined::CountLines(joined::kJournal), before + (blSent ? 1 : 0));
+    }
+}
+
+}  // namespace
