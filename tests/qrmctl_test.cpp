@@ -1,0 +1,299 @@
+// qrmctl as its user runs it, against the development server and the box's own store.
+
+#include <gtest/gtest.h>
+
+#include <filesystem>
+#include <fstream>
+
+#include "dev_server.h"
+#include "json_text.h"
+#include "run_program.h"
+#include "stored.h"
+
+namespace {
+
+using run_program::Outcome;
+using Arguments = std::vector<std::string>;
+
+constexpr const char *kToken = "s3cret-0123456789";
+constexpr const char *kApi = "ZELO.QRM.RPC";
+constexpr const char *kBefore = "https://before:443 {\"sn\":7,\"x\":1} token=t csrf=c";
+
+void Write(const std::string &strFile, const std::string &strText) {
+    std::ofstream(strFile) << strText;
+}
+
+bool Holds(const std::string &strText, const std::string &strPart) {
+    return strText.find(strPart) != std::string::npos;
+}
+
+Arguments operator+(Arguments left, const Arguments &right) {
+    left.insert(left.end(), right.begin(), right.end());
+    return left;
+}
+
+class Qrmctl : public testing::Test {
+  protected:
+    static void SetUpTestSuite() {
+        devserver::Options options;
+        options.token = kToken;
+        s_pServer = new devserver::DevServer(options);
+        std::string strReason;
+        ASSERT_TRUE(s_pServer->Start(strReason)) << strReason;
+        s_strHttp = std::to_string(s_pServer->HttpPort());
+        s_strHttps = std::to_string(s_pServer->HttpsPort());
+        Write("/usr/zelo/etc/ssl/ca.d/server.pem", s_pServer->CaPem());
+        std::filesystem::current_path("/tmp");
+        Write("token", std::string(kToken) + '\n');
+        Write("wrong", std::string(kToken) + 'x');
+        Write("plain", List(s_strHttp, "0"));
+    }
+    static void TearDownTestSuite() {
+        delete s_pServer;
+        s_pServer = nullptr;
+    }
+    void SetUp() override {
+        stored::Clear();
+        s_pServer->ForgetRequests();
+    }
+
+    // Whatever it says, the token is not in it.
+    static Outcome Run(const Arguments &arguments, const std::string &strInput = {}) {
+        Outcome outcome = run_program::Run(Arguments{QRMCTL} + arguments, strInput);
+        EXPECT_FALSE(Holds(outcome.strOut + outcome.strErr, kToken));
+        return outcome;
+    }
+    // For a program: standard output is one line with one JSON object.
+    static Json::Value RunForJson(const Arguments &arguments, int status,
+                                  const std::string &strInput = {}) {
+        const Outcome outcome = Run(arguments + Arguments{"--json"}, strInput);
+        EXPECT_EQ(outcome.status, status) << outcome.strErr;
+        EXPECT_EQ(outcome.strOut.find('\n') + 1, outcome.strOut.size()) << outcome.strOut;
+        Json::Value result;
+        EXPECT_TRUE(json_text::FromString(outcome.strOut, result));
+        EXPECT_EQ(json_text::Member(result, "success"), status == 0) << outcome.strOut;
+        return result;
+    }
+    static void StoreBefore() {
+        stored::AddSession(stored::AddCredential("ZELO.QRM", "before", R"({"sn":7,"x":1})"), "t",
+                           "c");
+    }
+    // A candidate list whose second entry cannot be used.
+    static std::string List(const std::string &strHttpPort, const std::string &strHttpsPort) {
+        return R"([{"host":"localhost","http_port":)" + strHttpPort + R"(,"https_port":)" +
+               strHttpsPort + "}, {\"host\":5}]";
+    }
+    static Arguments Join(const std::string &strHttpPort, const std::string &strHttpsPort,
+                          const std::string &strTokenFile = "token") {
+        return {"join",         "--server",   "localhost",    "--http-port", strHttpPort,
+                "--https-port", strHttpsPort, "--token-file", strTokenFile};
+    }
+    // All requests so far, such as "https:discover https:join ". The connection is tested once for
+    // the user and once by the library's join; that counts as one.
+    static std::string Requests() {
+        std::string strAll;
+        for (const Json::Value &request : s_pServer->Requests()) {
+            const std::string strOne =
+                request["scheme"].asString() + ':' + request["api_method"].asString() + ' ';
+            strAll += Holds(strAll, strOne) ? "" : strOne;
+        }
+        return strAll;
+    }
+
+    static devserver::DevServer *s_pServer;
+    static std::string s_strHttp;
+    static std::string s_strHttps;
+};
+
+devserver::DevServer *Qrmctl::s_pServer = nullptr;
+std::string Qrmctl::s_strHttp;
+std::string Qrmctl::s_strHttps;
+
+TEST_F(Qrmctl, WrongUsageIsToldOnStandardErrorAlone) {
+    const struct {
+        Arguments arguments;
+        const char *szNamed;
+    } rows[] = {{{}, "subcommand"},
+                {{"jion"}, "jion"},
+                {{"credential", "shwo"}, "shwo"},
+                {{"credential", "show", "surplus"}, "surplus"},
+                {{"credential", "create"}, "FILE"},
+                {{"test-connection", "c.json"}, "--api"},
+                {{"join", "--sever", "h"}, "--sever"},
+                {Join("65536", "1"), "65536"},
+                {Join("0", "https"), "https"},
+                {{"join", "--server", "", "--http-port", "0"}, "--server"}};
+    for (const auto &row : rows) {
+        const Outcome outcome = Run(row.arguments + Arguments{"--json"});
+        EXPECT_EQ(outcome.status, 2);
+        EXPECT_EQ(outcome.strOut, "");
+        EXPECT_EQ(outcome.strErr.rfind("qrmctl: ", 0), 0U) << outcome.strErr;
+        EXPECT_TRUE(Holds(outcome.strErr, row.szNamed)) << outcome.strErr;
+    }
+}
+
+TEST_F(Qrmctl, UnusableInputFailsBeforeAnythingIsSentOrStored) {
+    StoreBefore();
+    const std::string strCred =
+        R"({"protocol":"https","host":"h","application":"ZELO.QRM","access_token":")";
+    const Arguments join = Join("0", s_strHttps, "in");
+    const Arguments candidates = Join("0", s_strHttps) + Arguments{"--candidates", "in"};
+    const Arguments test = {"test-connection", "--api", kApi, "in"};
+    const Arguments create = {"credential", "create", "in"};
+    const Arguments update = {"credential", "update", "in"};
+    const struct {
+        Arguments arguments;
+        std::string strFile;  // what the file "in" holds; "-" when there is none
+        const char *szSaid;
+    } rows[] = {
+        {join, "-", "'in': No such file or directory; name a file"},
+        {join, "\n", "'in': it is empty; write the access token into it"},
+        {join, "one\ntwo\n", "on one line"},
+        {join, std::string(1024, 'a'), "at most 1023 bytes"},
+        {Join("0", s_strHttps, "."), "", "'.': Is a directory; name a file"},
+        {test, "-", "name a file"},
+        {test, "[{\"host\":\n]", "'in': Line 2"},
+        {test, "{}", "an array"},
+        {test, std::string(5000, '['), "nested too deeply"},
+        {candidates, "-", "name a file"},
+        {candidates, "[]", "an array"},
+        {create, "", "'in': Line 1"},
+        {create, "[]", "an object"},
+        {create, strCred + R"(t","port":"443"})", "\"port\" has to be an integer"},
+        {create, strCred + std::string(1024, 'a') + R"(","port":443})", "at most 1023 bytes"},
+        {update, "{}", "\"application\" has to be a text"},
+        {update, R"({"application":"Other","host":"h"})", "'Other'"},
+        {update, R"({"application":"ZELO.QRM","host":[]})", "\"host\" has to be a text"},
+    };
+    for (const auto &row : rows) {
+        std::filesystem::remove("in");
+        if (row.strFile != "-") {
+            Write("in", row.strFile);
+        }
+        const Outcome outcome = Run(row.arguments);
+        EXPECT_EQ(outcome.status, 1);
+        EXPECT_EQ(outcome.strOut, "");
+        EXPECT_TRUE(Holds(outcome.strErr, row.szSaid)) << outcome.strErr;
+        const std::string strError = RunForJson(row.arguments, 1)["error"].asString();
+        EXPECT_EQ(outcome.strErr, "qrmctl: " + strError + '\n');
+    }
+    EXPECT_EQ(Requests(), "");
+    EXPECT_EQ(stored::Describe(), kBefore);
+}
+
+TEST_F(Qrmctl, ConnectionTestNamesTheConnectionAndWhatItPassedOver) {
+    const std::string strList = List(s_strHttp, s_strHttps);
+    const Outcome outcome = Run({"test-connection", "--api", kApi, "-"}, strList);
+    EXPECT_EQ(outcome.status, 0);
+    EXPECT_EQ(outcome.strOut, "protocol: https\nhost: localhost\nport: " + s_strHttps + '\n');
+    EXPECT_TRUE(Holds(outcome.strErr, "candidate 2 of '-'")) << outcome.strErr;
+    EXPECT_TRUE(RunForJson({"test-connection", "--api", kApi, "-"}, 0, strList)["warnings"].size());
+
+    const Arguments unknown = {"test-connection", "--api", "ZELO.Unknown", "-"};
+    const char *szReason = "does not serve the Web API";
+    EXPECT_FALSE(Holds(Run(unknown, strList).strErr, szReason));
+    const Outcome verbose = Run(unknown + Arguments{"-v"}, strList);
+    EXPECT_EQ(verbose.status, 1);
+    EXPECT_TRUE(Holds(verbose.strErr, szReason)) << verbose.strErr;
+}
+
+TEST_F(Qrmctl, AJoinIsStoredWholeOrNotAtAll) {
+    const std::string strSecure = "https://localhost:" + s_strHttps + " ? token=" + kToken;
+    const std::string strPlain = "http://localhost:" + s_strHttp + " ? token=" + kToken;
+    const char *szSecure = "https:discover https:join ";
+    const char *szPlain = "http:discover http:join ";
+    const Arguments plainFirst = {"--candidates", "plain"};
+    const Arguments allow = {"--allow-http"};
+    const struct {
+        Arguments arguments;
+        const char *szSaid;     // when it fails
+        std::string strStored;  // when it succeeds; without the csrf token
+        const char *szRequests;
+    } rows[] = {
+        {Join(s_strHttp, s_strHttps), "", strSecure, szSecure},
+        {Join("0", s_strHttps, "wrong"), "check token", "", szSecure},
+        {Join("0", "1"), "nothing was changed", "", ""},
+        {Join(s_strHttp, "0"), "--allow-http", "", ""},
+        {Join(s_strHttp, s_strHttp), "check address", "", ""},
+        {Join("0", s_strHttps) + plainFirst, "", strSecure, szSecure},
+        {Join(s_strHttp, "0") + allow, "", strPlain, szPlain},
+        {Join("0", s_strHttps) + plainFirst + allow, "", strPlain, szPlain},
+    };
+    for (const auto &row : rows) {
+        for (const bool blBefore : {false, true}) {
+            SCOPED_TRACE(testing::PrintToString(row.arguments) + (blBefore ? " joined" : ""));
+            SetUp();
+            if (blBefore) {
+                StoreBefore();
+            }
+            const bool blJoins = !row.strStored.empty();
+            const Outcome outcome = Run(row.arguments + Arguments{"-v", "--sn", "SN1"});
+            EXPECT_EQ(outcome.status, blJoins ? 0 : 1);
+            EXPECT_TRUE(Holds(outcome.strErr, row.szSaid)) << outcome.strErr;
+            EXPECT_EQ(Holds(outcome.strOut, "\nsn: SN1\nJoined."), blJoins) << outcome.strOut;
+            const std::string strBefore = blBefore ? kBefore : "";
+            EXPECT_EQ(stored::Describe(), blJoins ? row.strStored + " csrf=?" : strBefore);
+            EXPECT_EQ(Requests(), row.szRequests);
+        }
+    }
+}
+
+TEST_F(Qrmctl, JoinTellsTheServerWhoTheApplianceIs) {
+    std::string strSerial;
+    std::getline(std::ifstream("/etc.defaults/serial_number"), strSerial);
+    ASSERT_FALSE(strSerial.empty());
+    for (const auto &[strId, id] : {std::pair<std::string, Json::Value>("7", 7), {"007", "007"}}) {
+        const Arguments join = Join("0", s_strHttps, "-") + Arguments{"--id", strId};
+        EXPECT_EQ(RunForJson(join, 0, kToken)["sn"], strSerial);
+        const Json::Value clients = s_pServer->Clients();
+        const Json::Value &description = clients[clients.size() - 1]["description"];
+        EXPECT_EQ(description["sn"], strSerial);
+        EXPECT_EQ(description["id"], id);
+    }
+}
+
+TEST_F(Qrmctl, AKilledJoinLeavesTheStoredCredentialInForce) {
+    StoreBefore();
+    devserver::NextAnswer late;
+    late.method = "join";
+    late.delay_ms = 600'000;
+    s_pServer->AnswerNext(kApi, late);
+    run_program::Program program(Arguments{QRMCTL} + Join("0", s_strHttps));
+    ASSERT_TRUE(run_program::Until([] { return Holds(Requests(), "join"); }));
+    program.Signal(SIGTERM);
+    EXPECT_EQ(program.Wait().status, -SIGTERM);
+    EXPECT_EQ(stored::Describe(), kBefore);
+
+    RunForJson(Join("0", s_strHttps), 0);
+    EXPECT_FALSE(RunForJson({"credential", "delete"}, 0).isMember("warnings"))
+        << "the next join leaves one credential";
+}
+
+TEST_F(Qrmctl, CredentialCommandsSayWhatIsInForce) {
+    const Arguments show = {"credential", "show"};
+    const Arguments withToken = {"credential", "show", "--with-token"};
+    const Arguments create = {"credential", "create", "-"};
+    const std::string strRest =
+        R"(","protocol":"https","port":443,"application":"ZELO.QRM","access_token":"t0"})";
+    EXPECT_TRUE(Holds(RunForJson(show, 1)["error"].asString(), "join first"));
+
+    EXPECT_EQ(Run(create, R"({"host":"one\u001b)" + strRest).status, 0);
+    EXPECT_EQ(Run(show).strOut, "protocol: https\nhost: one\\x1B\nport: 443\n");
+    EXPECT_EQ(Run({"--json", "credential", "show"}).strOut, Run(show + Arguments{"--json"}).strOut);
+    EXPECT_FALSE(RunForJson(show, 0).isMember("access_token"));
+    EXPECT_TRUE(Holds(Run(withToken).strOut, "access_token: t0\n"));
+    EXPECT_EQ(RunForJson(withToken, 0)["access_token"], "t0");
+
+    EXPECT_TRUE(RunForJson(create, 0, R"({"host":"two)" + strRest).isMember("warnings"));
+    EXPECT_EQ(Run({"credential", "update", "-"}, R"({"application":"ZELO.QRM","port":8443,"sn":9})")
+                  .status,
+              0);
+    EXPECT_EQ(stored::Describe(), "https://one\x1b:8443 {\"sn\":9} token=t0 csrf=?");
+
+    EXPECT_TRUE(RunForJson({"credential", "delete"}, 0).isMember("warnings"));
+    EXPECT_EQ(RunForJson(show, 0)["host"], "two");
+    EXPECT_EQ(Run({"credential", "delete"}).strOut, "No server credential is stored any more.\n");
+    EXPECT_EQ(Run(show).status, 1);
+}
+
+}  // namespace
