@@ -39,6 +39,7 @@ void Report::Document(const std::string &strName, const Json::Value &value) {
         Json::StreamWriterBuilder builder;
         builder["indentation"] = "  ";
         builder["emitUTF8"] = true;
+        builder["enableYAMLCompatibility"] = true;  // no blank before a colon
         std::string strText = Json::writeString(builder, value);
         std::replace(strText.begin(), strText.end(), '\x7F', '?');
         std::cout << strText << '\n';
