@@ -173,15 +173,15 @@ ExitCode GetBeside(const Options &options, Json::Value &params, Report &report) 
     if (!ResolveDestination(options.strPath, destination, strError)) {
         return report.Fail(strError);
     }
+    char szMd5[33] = {};
+    if (GetFileMd5String(destination.c_str(), szMd5, sizeof(szMd5)) == 0) {
+        params["md5"] = szMd5;
+    }
     const InterruptGuard guard;
     const Workplace workplace(destination);
     if (!workplace.IsUsable()) {
         return report.Fail("cannot write beside '" + options.strPath +
                            "': " + std::strerror(workplace.Error()));
-    }
-    char szMd5[33] = {};
-    if (GetFileMd5String(destination.c_str(), szMd5, sizeof(szMd5)) == 0) {
-        params["md5"] = szMd5;
     }
     Progress progress(!report.IsJson());
     const Outcome outcome = Fetch(workplace.File(), options, params, progress);
@@ -203,8 +203,11 @@ ExitCode GetFile(const Options &options, Report &report) {
     }
     Progress progress(!report.IsJson());
     const InterruptGuard guard;
-    return Tell(Fetch(options.strPath, options, params, progress), options.strPath, progress,
-                report);
+    const Outcome outcome = Fetch(options.strPath, options, params, progress);
+    if (outcome == Outcome::kUnchanged) {
+        report.Warn("the copy at '" + options.strPath + "' was current, and is empty now");
+    }
+    return Tell(outcome, options.strPath, progress, report);
 }
 
 }  // namespace

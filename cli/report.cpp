@@ -14,7 +14,9 @@ std::string Printable(const std::string &strText) {
     std::string strSafe;
     for (char c : strText) {
         const auto byte = static_cast<unsigned char>(c);
-        if (byte >= 0x20 && byte != 0x7F) {
+        const bool blC1 =
+            byte >= 0x80 && byte <= 0x9F && !strSafe.empty() && strSafe.back() == '\xC2';
+        if (byte >= 0x20 && byte != 0x7F && !blC1) {
             strSafe += c;
             continue;
         }
@@ -33,6 +35,26 @@ void Report::Fact(const std::string &strName, const Json::Value &value) {
     }
 }
 
+// JSON text for a terminal: control characters beyond ASCII's first page, which JSON leaves as they
+// are, as \u00XX.
+static std::string WithoutControls(const std::string &strText) {
+    std::string strSafe;
+    for (std::size_t i = 0; i < strText.size(); ++i) {
+        const auto byte = static_cast<unsigned char>(strText[i]);
+        const auto next = static_cast<unsigned char>(i + 1 < strText.size() ? strText[i + 1] : 0);
+        const bool blC1 = byte == 0xC2 && next >= 0x80 && next <= 0x9F;
+        if (!blC1 && byte != 0x7F) {
+            strSafe += strText[i];
+            continue;
+        }
+        constexpr char kHex[] = "0123456789abcdef";
+        const unsigned int code = blC1 ? next : byte;
+        strSafe += {'\\', 'u', '0', '0', kHex[code >> 4U], kHex[code & 15U]};
+        i += blC1 ? 1 : 0;
+    }
+    return strSafe;
+}
+
 void Report::Document(const std::string &strName, const Json::Value &value) {
     m_result[strName] = value;
     if (!m_blJson) {
@@ -41,8 +63,7 @@ void Report::Document(const std::string &strName, const Json::Value &value) {
         builder["emitUTF8"] = true;
         builder["enableYAMLCompatibility"] = true;  // no blank before a colon
         std::string strText = Json::writeString(builder, value);
-        std::replace(strText.begin(), strText.end(), '\x7F', '?');
-        std::cout << strText << '\n';
+        std::cout << WithoutControls(strText) << '\n';
     }
 }
 

@@ -193,8 +193,9 @@ ZELOQRM_API int ZELOQRMClientSendSetClient(const Json::Value &info);
 // that fails half-way leaves the cached records as far as it got: after a -1 call with useCache
 // false.
 //
-// Time: an exchange takes at most 300 s; a server that is silent is given up after 30 s, one that
-// cannot be connected to after 10 s.
+// Time: an exchange takes at most 300 s, and the first call of a process may need two; a server
+// that is silent is given up after 30 s, one that cannot be connected to after 10 s. A failed call
+// may run the notification's hooks, 10 s each.
 //
 // Files: the platform's credential store (read); "/tmp/qrm_client.info" with its lock;
 // "/tmp/qrmclientconnectfailed", whose time is that of the latest notification.
@@ -217,14 +218,16 @@ ZELOQRM_API int ZELOQRMClientSendWebapi(Json::Value &resp, const std::string &ap
 // file that matters, and rename. Only a directory that cannot be created is logged.
 //
 // Calls may overlap, but not for one path. There is no limit on the size, nor on the time as long
-// as the transfer moves. Files: the path; the platform's credential store (read).
+// as the transfer moves: a server that never ends fills the disk, which is a failure. Files: the
+// path; the platform's credential store (read).
 ZELOQRM_API int ZELOQRMClientGetFile(const std::string &path, const std::string &api, int ver,
                                      const std::string &method, Json::Value &params);
 
 // The MD5 digest of a file as text: 32 lower-case hexadecimal digits and a line feed, cut to
 // size - 1 characters and zero-terminated. A buffer of 33 bytes takes the digits alone.
 //
-// Returns 0 when the file could be read, else -1, with the buffer as it was.
+// Returns 0 when the file could be read, else -1, with the buffer as it was. Only a regular file
+// has a digest: a pipe or a device may never end.
 ZELOQRM_API int GetFileMd5String(const char *path, char *buffer, int size);
 
 // ------------------------------------------------------------------------------------------------
@@ -332,7 +335,8 @@ ZELOQRM_API int ZELOQRMClientPluginInit(__tag_qrmclient_plugin_env__ *pstEnvVar,
                                         const __tag_ZELO_QRM_SERVER_INFO__ *pServerInfo);
 
 // Runs an action in the caller's thread with the arguments RESULT, HOST, PROTOCOL, PORT, SN,
-// REJOIN, FROM and CLEAR_GLUSTER, each cut to 31 characters. Returns the platform's result,
+// REJOIN, FROM and CLEAR_GLUSTER, each cut to 31 bytes, never
+// inside a UTF-8 character. Returns the platform's result,
 // negative when a plug-in failed; -1 when the action could not be prepared, without a log line
 // unless the server info is missing.
 ZELOQRM_API int ZELOQRMClientPlugin(_tag_sdk_plugin_action_ action,
@@ -365,7 +369,8 @@ ZELOQRM_API bool ZELOQRMClientDeleteServerUser(void);
 
 // Shows or hides a user's welcome pages: sets "welcome_nvo40_hide" and "welcome_nvo50_hide" of
 // "ZELO.PKV.App.WelcomeApp.Instance" in the file "usersettings" of the user's preference directory.
-// Everything else in that file stays; one that is no JSON object is replaced.
+// Everything else in that file stays. One that is no JSON object is replaced, and so is one beyond
+// what is read: 64 MiB, 1000 levels, two million values, numbers that a double holds.
 //
 // Returns true when the file has been replaced, as a whole; false with a log line, and the file as
 // it was, otherwise. Two calls for one user at once: the later one wins.

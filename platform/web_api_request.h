@@ -10,8 +10,9 @@
 // What holds for every operation
 //   - Only http and https are ever spoken, a redirect is never followed, and a token goes only to
 //     the host and port of the record.
-//   - Every exchange ends by itself: connecting is limited, a stalled transfer is ended, and the
-//     body of a reply has a largest size.
+//   - Every exchange ends by itself: connecting is limited, a stalled transfer is ended, and a body
+//     in memory has a largest size. One that goes to a stream may be of any size and takes as long
+//     as it moves; a full disk ends it, or the observer.
 //   - No operation throws, except that one which returns a std::string may throw std::bad_alloc.
 //   - Connections stay open between requests of one process and are used again. A child process
 //     after fork makes its own. Requests may be used in several threads at once, each request by
@@ -51,7 +52,8 @@ enum CRED_REQ_ERROR {
     CRED_REQ_ERR_STOPPED = 6,   // the progress observer ended the transfer
     CRED_REQ_ERR_MEMORY = 7,
     // A response stream was set, and the server answers that the copy whose digest the request
-    // carries is current (HTTP status 304): nothing was written, and nothing is wrong.
+    // carries as the parameter "md5" is current (HTTP status 304): nothing was written, and nothing
+    // is wrong.
     CRED_REQ_ERR_UNCHANGED = 21
 };
 
@@ -70,9 +72,9 @@ ZELO_PLATFORM_API std::string GetWebAPIPath(const ZELO_CRED *pCred, const std::s
 ZELO_PLATFORM_API bool SetWebAPIURL(const ZELO_CRED *pCred, const std::string &api, int ver,
                                     const std::string &method, CredRequest *pRequest);
 
-// Called now and then while a request of the same thread writes its reply to a response stream:
-// with the bytes written so far and, when the server has said so, the number of bytes to expect,
-// else -1. Returning false ends the transfer. It must not throw.
+// Called now and then during every exchange of the same thread: with the bytes written to a
+// response stream so far and, when the server has said so, the number of bytes to expect, else -1.
+// Returning false ends the exchange. It must not throw.
 typedef bool (*ProgressObserver)(void *pContext, long long cbWritten, long long cbExpected);
 
 // Sets the observer of the calling thread's requests; null for none, as at the start of a thread.

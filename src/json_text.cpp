@@ -49,6 +49,18 @@ std::string OneLine(const std::string &strReport) {
     return strLine;
 }
 
+// The last character of the comment that begins at the place; the place itself when none does.
+std::size_t EndOfComment(const std::string &strText, std::size_t at) {
+    std::size_t end = at;
+    if (strText.compare(at, 2, "/*") == 0) {
+        end = strText.find("*/", at + 2);
+        end = end == std::string::npos ? end : end + 1;
+    } else if (strText.compare(at, 2, "//") == 0) {
+        end = strText.find_first_of("\r\n", at);
+    }
+    return std::min(end, strText.size());
+}
+
 // An upper bound for the number of values in the text: every value but the first comes after one of
 // these characters.
 bool HasTooManyValues(const std::string &strText) {
@@ -60,6 +72,8 @@ bool HasTooManyValues(const std::string &strText) {
             blInText = !blInText;
         } else if (c == '\\' && blInText) {
             ++i;
+        } else if (!blInText && c == '/') {
+            i = EndOfComment(strText, i);
         } else if (!blInText && (c == ',' || c == '[' || c == '{') && ++count > kMaxValues) {
             return true;
         }

@@ -36,9 +36,9 @@ bool FromString(const std::string &strText, Json::Value &value, std::string *pst
 // regular file of at most 64 MiB is read.
 bool FromFile(const char *szPath, Json::Value &value);
 
-// Writes the value's JSON text and a line feed to a new file (mode 0644), durably; returns whether
-// it succeeded. A file that stands there already is removed first, and nothing is written through a
-// link.
+// Writes the value's JSON text and a line feed to a new file (mode 0644 less the umask), durably;
+// returns whether it succeeded. A file that stands there already is removed first, and nothing is
+// written through a link.
 bool ToFile(const Json::Value &value, const char *szPath);
 
 // The member of an object; null (the shared null value) when there is none or the value is no

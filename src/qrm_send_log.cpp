@@ -65,6 +65,10 @@ TextCopy Copy(const char *szText) {
 
 // "{section:key}": everything between the marks counts, blanks too.
 int FindPlaceholder(const char *szText, char *szSection, char *szKey, int limit) {
+    if (szSection == nullptr || szKey == nullptr) {
+        ZELO_LOG_NULL_ARGUMENT(szSection == nullptr ? "__null != szSection" : "__null != szKey");
+        return -1;
+    }
     const TextCopy copy = Copy(szText);
     char *szOpen = copy == nullptr ? nullptr : std::strchr(copy.get(), '{');
     char *szColon = szOpen == nullptr ? nullptr : std::strchr(szOpen, ':');
@@ -83,6 +87,12 @@ int FindPlaceholder(const char *szText, char *szSection, char *szKey, int limit)
 int FindToken(const char *szText, char *szSection, char *szKey, char *szToken, int limit) {
     constexpr const char *kOpen = "_T(";
     constexpr const char *kTrimmed = " \t\r\n\"'";
+    if (szSection == nullptr || szKey == nullptr || szToken == nullptr) {
+        ZELO_LOG_NULL_ARGUMENT(szSection == nullptr ? "__null != szSection"
+                               : szKey == nullptr   ? "__null != szKey"
+                                                    : "__null != szToken");
+        return -1;
+    }
     const TextCopy copy = Copy(szText);
     char *szOpen = copy == nullptr ? nullptr : std::strstr(copy.get(), kOpen);
     char *szClose = szOpen == nullptr ? nullptr : std::strchr(szOpen, ')');

@@ -100,7 +100,7 @@ bool IsNotifiedLately() {
     if (YLIBCFileStat(kMarker, 1, &status) != 0) {
         return false;
     }
-    if (!S_ISREG(status.st_mode)) {
+    if (S_ISLNK(status.st_mode)) {
         // Somebody else's link: touching it would touch the file that it leads to.
         unlink(kMarker);
         return false;
@@ -212,7 +212,10 @@ std::string FolderOf(const std::string &path) {
     if (end == std::string::npos) {
         return ".";
     }
-    return end == 0 && path[0] == '/' ? "/" : path.substr(0, end);
+    if (end == 0) {
+        return path[0] == '/' ? "/" : ".";
+    }
+    return path.substr(0, end);
 }
 
 FileHandle OpenDestination(const std::string &path) {

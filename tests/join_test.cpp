@@ -401,7 +401,8 @@ TEST_F(Join, RepliesMadeToBeExpensiveAreCheap) {
     };
     for (const std::string &strBody :
          {"{\"success\":0" + repeat("/**/", 4U << 20U) + "}", "[0" + repeat(",0", 15U << 20U) + "]",
-          repeat(kToken, 15U << 20U)}) {
+          repeat(kToken, 15U << 20U), "/*\"*/[0" + repeat(",0", 15U << 20U) + "]",
+          "//\"\n[0" + repeat(",0", 15U << 20U) + "]"}) {
         devserver::NextAnswer answer;
         answer.method = "join";
         answer.body = strBody;

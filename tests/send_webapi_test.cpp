@@ -137,8 +137,10 @@ TEST_F(SendWebapi, TheFailurePathNotifiesHoweverItsOwnCallsFail) {
               "YLIBCSzHashGetValue(*, '%QRM_SERVER%')\n"
               "YLIBCSzHashSetValue(*, '%QRM_SERVER%', 'Unknown')\n"
               "ZELOSysNotifySendNotifiction('QRMClientConnectFailed', *)");
-    EXPECT_EQ(torture::WithoutErrorTail(Messages(outcome)),
-              "QRM credential is not found. [E]\ncannot find qrm server info");
+    ASSERT_EQ(outcome.logs.size(), 2U);
+    EXPECT_EQ(torture::WithoutErrorTail(outcome.logs[0].strMessage),
+              "QRM credential is not found. [E]");
+    EXPECT_EQ(outcome.logs[1].strMessage, "cannot find qrm server info");
 }
 
 TEST_F(SendWebapi, TheReplyDecidesTheStatus) {
@@ -218,6 +220,12 @@ TEST_F(SendWebapi, UsersAreToldAgainAfterTwoHoursAndAtOnceAfterAReply) {
         stat(kMarker, &status);
         EXPECT_EQ(status.st_mtime == kNow - row.age, !row.blTold) << "the marker's time";
     }
+    // A folder that somebody put there counts by its time too: users are not told at each call.
+    Reset();
+    ZELOQRMClientDeleteServerCredential();
+    std::filesystem::create_directory(kMarker);
+    EXPECT_EQ(Call(), "-1");
+    EXPECT_EQ(State(), "status= marker=yes notified=0");
     // A link is not followed: the file that it leads to keeps its time.
     Reset();
     ZELOQRMClientDeleteServerCredential();
@@ -241,6 +249,17 @@ TEST_F(SendWebapi, TheCacheIsUsedOnlyWhenAskedFor) {
         EXPECT_EQ(cached.calls.at(0), "CreateWebAPIRequest") << "without a look at the store";
         EXPECT_EQ(Call(false), "-1");
     });
+}
+
+TEST_F(SendWebapi, AServerThatIsNotTrustedGetsNoToken) {
+    const std::string strCa = FileText(joined::kCaFile);
+    std::filesystem::remove(joined::kCaFile);
+    EXPECT_EQ(Call(), "-1");
+    EXPECT_EQ(State(), "status= marker=yes notified=1");
+    Json::Value params;
+    EXPECT_EQ(ZELOQRMClientGetFile("/tmp/untrusted", kFileApi, 1, "get", params), -1);
+    EXPECT_EQ(s_pServer->Requests().size(), 0U);
+    std::ofstream(joined::kCaFile) << strCa;
 }
 
 TEST_F(SendWebapi, PlainHttpAsksForProtectedParameters) {
@@ -296,8 +315,8 @@ TEST_F(SendWebapi, NoServerKeepsACallForEver) {
     devserver::NextAnswer cut;
     cut.cut_after = 5;
     std::vector<pid_t> children;
-    const char *const methods[] = {"silent", "slow", "endless", "cut"};
-    devserver::NextAnswer answers[] = {silent, slow, endless, cut};
+    const char *const methods[] = {"silent", "slow", "endless", "cut", "silent-file", "slow-file"};
+    devserver::NextAnswer answers[] = {silent, slow, endless, cut, silent, slow};
     for (std::size_t i = 0; i < std::size(methods); ++i) {
         answers[i].method = methods[i];
         answers[i].status = 200;
@@ -309,7 +328,14 @@ TEST_F(SendWebapi, NoServerKeepsACallForEver) {
         ASSERT_GE(pid, 0);
         if (pid == 0) {
             const auto start = std::chrono::steady_clock::now();
-            const bool blFailed = Call(false, szMethod) == "-1";
+            // A file may be endless; silent and slow are no better than in a call.
+            const std::string strMethod = szMethod;
+            const bool blFile = strMethod == "silent-file" || strMethod == "slow-file";
+            Json::Value params;
+            const int result =
+                blFile ? ZELOQRMClientGetFile("/tmp/" + strMethod, kApi, 1, strMethod, params)
+                       : std::stoi(Call(false, szMethod));
+            const bool blFailed = result == -1;
             const auto taken = std::chrono::steady_clock::now() - start;
             _exit(blFailed && taken < std::chrono::seconds(45) ? 0 : 1);
         }
@@ -477,8 +503,15 @@ TEST_F(SendWebapi, ADownloadTellsTheCopyThatItHas) {
     EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_UNCHANGED));
     EXPECT_EQ(DownloadState(), "0");
 
+    std::filesystem::remove(kDownload);
+    devserver::NextAnswer unchanged;
+    unchanged.method = "get";
+    unchanged.status = 304;
+    s_pServer->AnswerNext(kFileApi, unchanged);
+    EXPECT_EQ(Download(), "-1") << "there is no copy that could be current";
+
     for (const char *szPath :
-         {"/tmp/got/a\\b", "file-in-the-current-directory", "/tmp/got/deep/file"}) {
+         {"/tmp/got/a\\b", "\\c", "file-in-the-current-directory", "/tmp/got/deep/file"}) {
         std::filesystem::current_path("/tmp/got");
         EXPECT_EQ(Download(szPath), "0") << szPath;
         EXPECT_EQ(FileText(szPath), strContent) << szPath;

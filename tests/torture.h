@@ -12,7 +12,6 @@
 #include <cstdio>
 #include <functional>
 #include <map>
-#include <regex>
 #include <set>
 #include <sstream>
 #include <string>
@@ -48,8 +47,18 @@ struct Case {
 
 // The tail with the platform's last error, whose lines come and go, as "[E]".
 inline std::string WithoutErrorTail(const std::string &strMessage) {
-    static const std::regex tail(R"(\[0x[0-9A-F]{4} [a-z_]*:[0-9]+\])");
-    return std::regex_replace(strMessage, tail, "[E]");
+    const std::size_t at = strMessage.rfind("[0x");
+    unsigned int code = 0;
+    int cbCode = 0;
+    int line = 0;
+    char end = '\0';
+    if (at == std::string::npos ||
+        std::sscanf(strMessage.c_str() + at, "[0x%4X %n", &code, &cbCode) != 1 || cbCode != 8 ||
+        std::sscanf(strMessage.c_str() + strMessage.rfind(':'), ":%d%c", &line, &end) != 2 ||
+        end != ']') {
+        return strMessage;
+    }
+    return strMessage.substr(0, at) + "[E]";
 }
 
 // Runs the body, in a child process where that is asked for; what the body expects counts as the

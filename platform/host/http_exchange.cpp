@@ -354,18 +354,19 @@ int Fail(int error, const HttpRequest &request, const char *szReason, int line) 
 }
 
 int Transact(const HttpRequest &request, CURL *pEasy, HttpReply &reply) {
-    Transfer transfer{request, pEasy, ReplySink(request.pStream, request.pfnWrite)};
+    Transfer transfer{request, pEasy,
+                      ReplySink(request.pStream, request.pfnWrite, request.blHasCopy)};
     std::array<char, CURL_ERROR_SIZE> reason = {};
     curl_easy_setopt(pEasy, CURLOPT_WRITEFUNCTION, TakeBody);
     curl_easy_setopt(pEasy, CURLOPT_WRITEDATA, &transfer);
     curl_easy_setopt(pEasy, CURLOPT_ERRORBUFFER, reason.data());
     if (request.pStream != nullptr) {
         curl_easy_setopt(pEasy, CURLOPT_BUFFERSIZE, kStreamBuffer);
-        if (request.pfnObserver != nullptr) {
-            curl_easy_setopt(pEasy, CURLOPT_NOPROGRESS, 0L);
-            curl_easy_setopt(pEasy, CURLOPT_XFERINFOFUNCTION, ShowProgress);
-            curl_easy_setopt(pEasy, CURLOPT_XFERINFODATA, &transfer);
-        }
+    }
+    if (request.pfnObserver != nullptr) {
+        curl_easy_setopt(pEasy, CURLOPT_NOPROGRESS, 0L);
+        curl_easy_setopt(pEasy, CURLOPT_XFERINFOFUNCTION, ShowProgress);
+        curl_easy_setopt(pEasy, CURLOPT_XFERINFODATA, &transfer);
     }
     const CURLcode result = curl_easy_perform(pEasy);
     curl_easy_getinfo(pEasy, CURLINFO_RESPONSE_CODE, &reply.status);

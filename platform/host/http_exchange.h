@@ -24,9 +24,12 @@ struct HttpRequest {
     std::string strBody;
     std::vector<std::string> headers;  // "Name: value"
 
-    // Where the body goes instead of HttpReply, and who watches it going there.
+    // Where the body goes instead of HttpReply.
     std::FILE *pStream = nullptr;
     ZELO::CredRequest::RespWriteCallback pfnWrite = nullptr;
+    bool blHasCopy = false;  // the request tells of a copy that may turn out to be current
+
+    // Who watches the exchange.
     ZELO::CredRequestUtil::ProgressObserver pfnObserver = nullptr;
     void *pObserverContext = nullptr;
 };

@@ -61,7 +61,7 @@ bool ReplySink::Finish(long status) noexcept {
     if (m_pStream == nullptr) {
         return true;
     }
-    if (status == kStatusUnchanged) {
+    if (status == kStatusUnchanged && m_blHasCopy) {
         return Fail(ZELO::CRED_REQ_ERR_UNCHANGED, "the copy is current");
     }
     if (!IsSuccess(status)) {

@@ -13,9 +13,9 @@ namespace host {
 class ReplySink {
   public:
     // With a stream, the body goes there (through pfnWrite when it is not null); without one into
-    // memory.
-    ReplySink(std::FILE *pStream, ZELO::CredRequest::RespWriteCallback pfnWrite)
-        : m_pStream(pStream), m_pfnWrite(pfnWrite) {}
+    // memory. Only a request that told of a copy can be answered that the copy is current.
+    ReplySink(std::FILE *pStream, ZELO::CredRequest::RespWriteCallback pfnWrite, bool blHasCopy)
+        : m_pStream(pStream), m_pfnWrite(pfnWrite), m_blHasCopy(blHasCopy) {}
 
     // Takes the next piece of the body of a reply with this status. Returns false to end the
     // transfer; Error then says why. Never throws: libcurl calls it.
@@ -38,6 +38,7 @@ class ReplySink {
 
     std::FILE *m_pStream;
     ZELO::CredRequest::RespWriteCallback m_pfnWrite;
+    bool m_blHasCopy;
     std::string m_strBody;
     std::string m_strReason;
     std::size_t m_cbPassedOver = 0;

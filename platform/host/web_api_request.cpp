@@ -20,6 +20,7 @@ namespace ZELO {
 namespace {
 
 constexpr const char *kFile = "web_api_request";
+constexpr const char *kDigest = "md5";
 constexpr const char *kDiscoveryPath = "/qrm/discover";
 constexpr long kStatusOk = 200;
 constexpr long kStatusNotFound = 404;
@@ -146,6 +147,8 @@ std::string Discover(const Server &server, const std::string &api) {
     request.strUrl =
         host::BuildUrl(server.strScheme, server.strHost, server.port, kDiscoveryPath, "api=" + api);
     request.blRelay = server.blRelay;
+    request.pfnObserver = t_observer.pfn;
+    request.pObserverContext = t_observer.pContext;
     host::HttpReply reply;
     if (request.strUrl.empty()) {
         syslog(LOG_WARNING, "%s:%d a host or port that cannot stand in an URL", kFile, __LINE__);
@@ -252,6 +255,7 @@ struct CredRequest::Impl {
         request.timeout_s = timeout_s;
         request.pStream = pStream;
         request.pfnWrite = pfnWrite;
+        request.blHasCopy = params.isMember(kDigest);
         request.pfnObserver = t_observer.pfn;
         request.pObserverContext = t_observer.pContext;
         AddHeaders(request.headers);

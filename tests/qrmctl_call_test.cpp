@@ -1,0 +1,138 @@
+// qrmctl's requests to the joined server as its user makes them: calls, updates, files.
+
+#include <sys/stat.h>
+
+#include "joined.h"
+#include "json_text.h"
+#include "run_program.h"
+
+devserver::DevServer *joined::Joined::s_pServer = nullptr;
+
+namespace {
+
+using joined::FileText;
+using Arguments = std::vector<std::string>;
+namespace fs = std::filesystem;
+
+constexpr const char *kFileApi = "ZELO.QRM.RPC.File";
+constexpr const char *kPath = "/tmp/files/file";
+
+class QrmctlCall : public joined::Joined {
+  protected:
+    void SetUp() override {
+        Joined::SetUp();
+        fs::remove_all("/tmp/files");
+        fs::create_directory("/tmp/files");
+    }
+    static Json::Value Run(Arguments arguments, int status) {
+        arguments.insert(arguments.begin(), QRMCTL);
+        arguments.emplace_back("--json");
+        const run_program::Outcome outcome = run_program::Run(arguments);
+        EXPECT_EQ(outcome.status, status) << outcome.strErr;
+        EXPECT_EQ((outcome.strOut + outcome.strErr).find(joined::kToken), std::string::npos);
+        Json::Value result;
+        EXPECT_TRUE(json_text::FromString(outcome.strOut, result)) << outcome.strOut;
+        return result;
+    }
+    static Arguments GetFile(const std::string &strParams = R"({"name":"f","size":300000})") {
+        return {"get-file", kPath, kFileApi, "get", "--params", strParams};
+    }
+    // Nothing but the file itself is left beside it.
+    static void ExpectAlone() {
+        EXPECT_EQ(std::distance(fs::directory_iterator("/tmp/files"), fs::directory_iterator()), 1);
+    }
+};
+
+TEST_F(QrmctlCall, ACallPrintsTheReplyAndSaysWhetherItSucceeded) {
+    EXPECT_EQ(Run({"call", "ZELO.QRM.RPC", "info"}, 0)["reply"]["data"]["name"], "qrm-devserver");
+    EXPECT_EQ(Run({"info", "get", "status"}, 0)["status"], "success");
+    EXPECT_EQ(Run({"call", "ZELO.QRM.RPC", "info", "--version", "2"}, 1)["reply"]["error"]["code"],
+              104);
+    std::ofstream("/tmp/files/params") << R"({"sn":"S","x":1})";
+    EXPECT_EQ(Run({"call", "ZELO.QRM.RPC.ClientInfo", "update", "--params", "@/tmp/files/params"},
+                  1)["reply"]["error"]["code"],
+              120);
+    for (const char *szParams : {"[1]", "{", "@/tmp/absent", "7"}) {
+        const std::string strError =
+            Run({"call", "ZELO.QRM.RPC", "info", "--params", szParams}, 1)["error"].asString();
+        EXPECT_NE(strError.find("arameters"), std::string::npos) << strError;
+    }
+    Run({"update"}, 1);
+    EXPECT_EQ(Run({"info", "get", "status"}, 0)["status"], "error");
+    Run({"info", "set", "key", "value"}, 0);
+    EXPECT_EQ(Run({"info", "get", "key"}, 0)["key"], "value");
+    Run({"info", "set", "a=b", "value"}, 1);
+    Run({"notify", "QRMClientDetachSuccess", "QRM_SERVER=other"}, 0);
+    EXPECT_NE(FileText(joined::kJournal).find("other"), std::string::npos);
+    Run({"notify", "QRMClientDetachSuccess", "novalue"}, 1);
+}
+
+TEST_F(QrmctlCall, AFileIsReplacedOnlyByAWholeOne) {
+    EXPECT_EQ(Run(GetFile(), 0)["bytes"], 300000);
+    EXPECT_EQ(fs::file_size(kPath), 300000U);
+    chmod(kPath, 0640);
+    EXPECT_EQ(Run(GetFile(), 0)["unchanged"], true);
+    EXPECT_EQ(fs::file_size(kPath), 300000U);
+    EXPECT_EQ(Run(GetFile(R"({"name":"f","size":300001})"), 0)["unchanged"], false);
+    struct stat status = {};
+    stat(kPath, &status);
+    EXPECT_EQ(status.st_size, 300001);
+    EXPECT_EQ(status.st_mode & 07777U, 0640U);
+    const std::string strBefore = FileText(kPath);
+
+    devserver::NextAnswer cut;
+    cut.cut_after = 1000;
+    devserver::NextAnswer error;
+    error.status = 500;
+    for (const devserver::NextAnswer &answer : {cut, error}) {
+        devserver::NextAnswer next = answer;
+        next.method = "get";
+        s_pServer->AnswerNext(kFileApi, next);
+        Run(GetFile(), 1);
+        EXPECT_EQ(FileText(kPath), strBefore);
+    }
+    ExpectAlone();
+
+    fs::create_symlink(kPath, "/tmp/link");
+    Arguments throughLink = GetFile();
+    throughLink[1] = "/tmp/link";
+    Run(throughLink, 0);
+    EXPECT_TRUE(fs::is_symlink("/tmp/link"));
+    EXPECT_EQ(fs::file_size(kPath), 300000U);
+    fs::remove("/tmp/link");
+    Arguments folder = GetFile();
+    folder[1] = "/tmp/files";
+    Run(folder, 1);
+
+    Arguments inPlace = GetFile();
+    inPlace.emplace_back("--in-place");
+    Run(inPlace, 0);
+    EXPECT_EQ(fs::file_size(kPath), 0U) << "the copy was current, and emptied first";
+}
+
+TEST_F(QrmctlCall, AnInterruptedFetchLeavesTheFileAsItWas) {
+    std::ofstream(kPath) << "old";
+    devserver::NextAnswer slow;
+    slow.method = "get";
+    slow.bytes_per_s = 2000;
+    s_pServer->AnswerNext(kFileApi, slow);
+    Arguments command = GetFile();
+    command.insert(command.begin(), QRMCTL);
+    run_program::Program program(command);
+    const auto isWriting = [] {
+        for (const auto &entry : fs::recursive_directory_iterator("/tmp/files")) {
+            if (entry.path().filename() == "file" && entry.path() != kPath &&
+                s_pServer->Requests().size() == 2) {
+                return true;
+            }
+        }
+        return false;
+    };
+    ASSERT_TRUE(run_program::Until(isWriting));
+    program.Signal(SIGINT);
+    EXPECT_EQ(program.Wait().status, 1);
+    EXPECT_EQ(FileText(kPath), "old");
+    ExpectAlone();
+}
+
+}  // namespace
