@@ -149,6 +149,7 @@ const DevServer::Route DevServer::kRoutes[] = {
     {"ZELO.QRM.RPC", 1, "/qrm/rpc", "info", true, &DevServer::Info},
     {"ZELO.QRM.RPC.ClientInfo", 1, "/qrm/client-info", "update", true, &DevServer::Update},
     {"ZELO.QRM.RPC.File", 1, "/qrm/file", "get", true, &DevServer::File},
+    {"ZELO.QRM.RPC.Log", 1, "/qrm/log", "push", true, &DevServer::Push},
 };
 
 // The caller holds the mutex.
@@ -235,6 +236,16 @@ Reply DevServer::File(const Json::Value &params) {
     return reply;
 }
 
+Reply DevServer::Push(const Json::Value &params) {
+    const std::string strReason = LogEntries::WhyRefused(params);
+    if (!strReason.empty()) {
+        return Refuse(kBadParameter, strReason.c_str());
+    }
+    const std::lock_guard<std::mutex> lock(m_mutex);
+    m_log.Add(params);
+    return Ok(Json::objectValue);
+}
+
 void DevServer::Handle(const char *szScheme, const httplib::Request &request,
                        httplib::Response &response) {
     const auto pause = [this](int ms) { return Delay(ms); };
@@ -261,6 +272,9 @@ Reply DevServer::HandleDevelopment(const httplib::Request &request) {
     }
     if (strWhat == "GET /dev/clients") {
         return JsonReply(200, Clients());
+    }
+    if (strWhat == "GET /dev/log") {
+        return JsonReply(200, Log());
     }
     if (strWhat != "POST /dev/next") {
         return Reply{404, "text/plain", "", nullptr};
@@ -397,6 +411,11 @@ Json::Value DevServer::Clients() const {
         clients.append(client);
     }
     return clients;
+}
+
+Json::Value DevServer::Log() const {
+    const std::lock_guard<std::mutex> lock(m_mutex);
+    return m_log.All();
 }
 
 bool DevServer::Start(std::string &strReason) {

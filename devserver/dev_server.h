@@ -17,6 +17,7 @@
 #include <vector>
 
 #include "dev_certificate.h"
+#include "log_entries.h"
 #include "loopback_listener.h"
 #include "next_answer.h"
 #include "reply.h"
@@ -66,6 +67,9 @@ class DevServer {
     // The clients that joined, as GET /dev/clients shows them.
     Json::Value Clients() const;
 
+    // The newest log entries that clients pushed, as GET /dev/log shows them.
+    Json::Value Log() const;
+
   private:
     struct Call;
     struct Route {
@@ -82,6 +86,7 @@ class DevServer {
     Reply Info(const Json::Value &params);
     Reply Update(const Json::Value &params);
     Reply File(const Json::Value &params);
+    Reply Push(const Json::Value &params);
     Json::Value *FindClient(const Json::Value &sn, int &id);
 
     void Handle(const char *szScheme, const httplib::Request &request, httplib::Response &response);
@@ -101,6 +106,7 @@ class DevServer {
     std::deque<Json::Value> m_requests;
     std::deque<std::pair<std::string, NextAnswer>> m_answers;  // with the API that each is for
     std::vector<Json::Value> m_descriptions;  // of the clients; number n stands at n - 1
+    LogEntries m_log;
 
     // Last, so that their threads end before what they use.
     LoopbackListener m_http;
