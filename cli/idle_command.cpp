@@ -1,5 +1,6 @@
 // qrmctl idle: the disks' idle time.
 
+#include <charconv>
 #include <memory>
 
 #include "commands.h"
@@ -7,6 +8,13 @@
 
 namespace qrmctl {
 namespace {
+
+// The whole text as a number. CLI11 itself takes "-1" for the largest one.
+bool ReadNumber(const std::string &strText, unsigned long &number) {
+    const char *szEnd = strText.data() + strText.size();
+    const auto [szRest, error] = std::from_chars(strText.data(), szEnd, number);
+    return error == std::errc() && szRest == szEnd;
+}
 
 ExitCode Get(Report &report) {
     unsigned long idleTime = 0;
@@ -34,7 +42,14 @@ void AddIdle(CLI::App &app, Action &action) {
         ->callback([&action] { action = Get; });
     auto *const pSet = pIdle->add_subcommand("set", "Set the idle time");
     const auto pTime = std::make_shared<unsigned long>(0);
-    pSet->add_option("MINUTES", *pTime, "Minutes without use before the disks sleep; 0: never")
+    pSet->add_option_function<std::string>(
+            "MINUTES",
+            [pTime](const std::string &strMinutes) {
+                if (!ReadNumber(strMinutes, *pTime)) {
+                    throw CLI::ValidationError("MINUTES", "'" + strMinutes + "' is no number");
+                }
+            },
+            "Minutes without use before the disks sleep; 0: never")
         ->required();
     pSet->callback(
         [pTime, &action] { action = [pTime](Report &report) { return Set(*pTime, report); }; });

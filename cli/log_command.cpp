@@ -21,6 +21,30 @@ struct Options {
     bool blRender = false;
 };
 
+class Usage : public CLI::Formatter {
+  public:
+    std::string make_usage(const CLI::App * /*pApp*/, std::string /*strName*/) const override {
+        return "Usage: qrmctl log [OPTIONS] LEVEL SECTION KEY [PARAM...]\n";
+    }
+};
+
+// An option for each parameter: an option with a list of values would take "[a,b]" for two.
+void AddParams(CLI::App &command, Options &options) {
+    constexpr int kMostParams = 32;
+    for (int i = 0; i < kMostParams; ++i) {
+        const auto add = [&options](const std::string &strParam) {
+            options.params.push_back(strParam);
+        };
+        auto *const pParam =
+            command.add_option_function<std::string>("PARAM" + (i == 0 ? "" : std::to_string(i)),
+                                                     add, "What fills its markers {0}, {1}, ...");
+        if (i > 0) {
+            pParam->group("");
+        }
+    }
+    command.formatter(std::make_shared<Usage>());
+}
+
 bool ReadLevel(const std::string &strLevel, int &level) {
     for (const QRMCLIENT_LOG_LEVEL *pEntry = gZELOQRMClientLogLevelTable; pEntry->level >= 0;
          ++pEntry) {
@@ -87,7 +111,7 @@ void AddLog(CLI::App &app, Action &action) {
                      "Section of the strings files; - when KEY is the message itself")
         ->required();
     pCommand->add_option("KEY", pOptions->strKey, "The message")->required();
-    pCommand->add_option("PARAM", pOptions->params, "What fills its markers {0}, {1}, ...");
+    AddParams(*pCommand, *pOptions);
     auto *const pExtraInfo = pCommand->add_option("--extra-info", pOptions->strExtraInfo,
                                                   "Text sent beside the message");
     pCommand->add_flag("--render", pOptions->blRender,
