@@ -428,8 +428,9 @@ ZELOQRM_API int ConvertLog(const char *szSection, const char *szKey, YLIBSZLIST 
                            Json::Value &out);
 
 // Writes the text of the list at the index, its references expanded from the strings file, to
-// szOut, a buffer of cbOut bytes, cut to fit. At most 64 references of each form are expanded, so
-// that texts that name each other come to an end.
+// szOut, a buffer of cbOut bytes, cut to fit. What a text brings in is expanded too, the first form
+// before the second; at most 1,024 replacements of each form are made, so that texts that name each
+// other come to an end. A replacement that does not fit ends the expansion of its form.
 ZELOQRM_API void ParamGet(YLIBSZLIST *pslParams, int index, const char *szStringsFile, char *szOut,
                           int cbOut);
 

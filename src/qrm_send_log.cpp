@@ -51,8 +51,9 @@ int LevelNumber(const std::string &name) {
 
 constexpr int kReferenceLimit = 512;
 
-// Enough for any text that people write, and an end for texts that name each other in a circle.
-constexpr int kMaxReplacements = 64;
+// More references than people can write into a parameter, and an end for texts that name each other
+// in a circle.
+constexpr int kMaxReplacements = 1024;
 
 struct FreeText {
     void operator()(char *sz) const { std::free(sz); }
