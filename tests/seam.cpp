@@ -15,10 +15,13 @@
 #include "credential_store.h"
 #include "file_lock.h"
 #include "file_system.h"
+#include "host_name.h"
+#include "idle_timer.h"
 #include "key_value_file.h"
 #include "notification.h"
 #include "process.h"
 #include "serial_number.h"
+#include "strings_file.h"
 #include "text_containers.h"
 #include "web_api_request.h"
 
@@ -42,6 +45,11 @@ bool Enter(const char *szName, const std::string &strArguments) {
     t_pObservation->outcome.details.push_back(szName + strArguments);
     const int nth = ++t_pObservation->counts[szName];
     return t_pObservation->fault.strOperation == szName && t_pObservation->fault.nth == nth;
+}
+
+// A release is made in any case; what fails is its result.
+bool FailsRelease(const char *szName) {
+    return t_pObservation != nullptr && t_pObservation->fault.strOperation == szName;
 }
 
 bool IsForced() {
@@ -114,6 +122,15 @@ Outcome Observe(const Fault &fault, const std::function<void()> &body) {
     void Wrap_##name parameters {                               \
         seam::AddRecords(-static_cast<int>(lost));              \
         Real_##name arguments;                                  \
+    }
+
+#define SEAM_RELEASE_RESULT(symbol, name, Result, parameters, arguments, failure, lost) \
+    Result Real_##name parameters asm("__real_" symbol);                                \
+    Result Wrap_##name parameters asm("__wrap_" symbol);                                \
+    Result Wrap_##name parameters {                                                     \
+        seam::AddRecords(-static_cast<int>(lost));                                      \
+        Result result = Real_##name arguments;                                          \
+        return seam::FailsRelease(#name) ? failure : result;                            \
     }
 
 #include "seam_operations.inc"

@@ -27,7 +27,7 @@ struct Outcome {
 
 struct Fault {
     std::string strOperation;
-    int nth = 1;                 // which call of the operation, counted from 1
+    int nth = 1;                 // which call of the operation, counted from 1; not for releases
     bool blForceResult = false;  // false: the call is not made and gives its failure value
     long result = 0;             // true: the call is made, and this takes the place of its result
 };

@@ -1,0 +1,527 @@
+// Log entries: the levels, the message with its references in every language, and the push to a
+// real server.
+
+#include <chrono>
+#include <vector>
+
+#include "joined.h"
+#include "json_text.h"
+#include "last_error.h"
+#include "log_entries.h"
+#include "platform_handles.h"
+#include "torture.h"
+#include "zeloqrmclient.h"
+
+devserver::DevServer *joined::Joined::s_pServer = nullptr;
+
+namespace {
+
+using joined::Messages;
+using torture::Expected;
+
+constexpr const char *kFile = "qrm_send_log";
+constexpr const char *kLogApi = "ZELO.QRM.RPC.Log";
+constexpr const char *kTexts = "/usr/zelo/zeloman/webman/texts/";
+const std::vector<std::string> kLanguages = {"chs", "cht", "csy", "dan", "enu", "fre", "ger",
+                                             "hun", "ita", "jpn", "krn", "nld", "nor", "plk",
+                                             "ptb", "ptg", "rus", "spn", "sve", "trk"};
+
+std::string PathOf(const std::string &strLanguage) {
+    return kTexts + strLanguage + "/strings";
+}
+
+void WriteTexts(const std::string &strText) {
+    for (const std::string &strLanguage : kLanguages) {
+        std::ofstream(PathOf(strLanguage)) << strText;
+    }
+}
+
+std::string Repeated(const std::string &strText, std::size_t cbMost) {
+    std::string strAll;
+    while (strAll.size() + strText.size() <= cbMost) {
+        strAll += strText;
+    }
+    return strAll;
+}
+
+struct TextList {
+    explicit TextList(const std::vector<std::string> &texts) : list(YLIBCSzListAlloc(0)) {
+        for (const std::string &strText : texts) {
+            YLIBCSzListPush(list.Address(), strText.c_str());
+        }
+    }
+    YLIBSZLIST *Get() const { return list.Get(); }
+    ListHandle list;
+};
+
+// Such as "19 text; 1 other".
+std::string Counted(const std::map<std::string, int> &counts) {
+    std::string strAll;
+    for (const auto &[strText, count] : counts) {
+        if (count > 0) {
+            strAll += (strAll.empty() ? "" : "; ") + std::to_string(count) + ' ' + strText;
+        }
+    }
+    return strAll;
+}
+
+std::string CountedTexts(const Json::Value &log) {
+    std::map<std::string, int> counts;
+    for (const std::string &strLanguage : log.getMemberNames()) {
+        ++counts[log[strLanguage].asString()];
+    }
+    return Counted(counts);
+}
+
+std::string Repeat(const std::string &strText, std::size_t times) {
+    return torture::Joined(std::vector<std::string>(times, strText), " ");
+}
+
+// What is logged without a list of languages: file and line stand in it twice.
+std::string NoList() {
+    Json::Value out;
+    const seam::Outcome outcome =
+        seam::Observe({"YLIBCSzListAlloc", 1}, [&] { ConvertLog(nullptr, "text", nullptr, out); });
+    const std::string strLine = Messages(outcome);
+    EXPECT_TRUE(std::regex_match(
+        strLine, std::regex(R"(qrm_send_log:[1-9][0-9]*\(ConvertLog\) pslList calloc failure\n)")))
+        << strLine;
+    return strLine;
+}
+
+class SendLog : public joined::Joined {
+  protected:
+    void SetUp() override {
+        Joined::SetUp();
+        // The first request of a process leaves records behind, which later ones exchange.
+        Json::Value reply;
+        ZELOQRMClientSendWebapi(reply, "ZELO.QRM.RPC", 1, "info", Json::Value(), false);
+        s_pServer->ForgetRequests();
+    }
+
+    // The parameters of the last push, with the time as "now" where it is.
+    static std::string Sent() {
+        Json::Value params;
+        for (const Json::Value &request : s_pServer->Requests()) {
+            Json::Value call;
+            json_text::FromString(request["body"].asString(), call);
+            params = call["method"] == "push" ? call["params"] : params;
+        }
+        if (params.isNull()) {
+            return "nothing";
+        }
+        const std::string strTexts = CountedTexts(params["log"]);
+        const long age = std::time(nullptr) - params["happen_time"].asInt64();
+        if (age >= 0 && age < 60) {
+            params["happen_time"] = "now";
+        }
+        params.removeMember("log");
+        return json_text::ToLogText(params) + ' ' + strTexts;
+    }
+};
+
+TEST(LogLevels, OnlyTheEightNamesAndNumbersStandForThemselves) {
+    const char *const names[] = {"emerg",   "alert",  "crit", "err",
+                                 "warning", "notice", "info", "debug"};
+    for (int level = 0; level < 8; ++level) {
+        EXPECT_EQ(gZELOQRMClientLogLevelTable[level].level, level);
+        EXPECT_EQ(ZELOQRMClientLogLevelIntToStr(level), names[level]);
+        EXPECT_EQ(ZELOQRMClientLogLevelStrToInt(names[level]), level);
+    }
+    EXPECT_EQ(gZELOQRMClientLogLevelTable[8].level, -1);
+    EXPECT_EQ(gZELOQRMClientLogLevelTable[8].name, "");
+    for (int level : {-1, 8, 100, -2147483647}) {
+        EXPECT_EQ(ZELOQRMClientLogLevelIntToStr(level), "info");
+    }
+    for (const char *szName : {"WARNING", "warn", " err", "error", "err ", ""}) {
+        EXPECT_EQ(ZELOQRMClientLogLevelStrToInt(szName), 6) << szName;
+    }
+    EXPECT_EQ(ZELOQRMClientLogLevelStrToInt(std::string("err\0", 4)), 6);
+}
+
+// --- References ---------------------------------------------------------------------------------
+
+std::string Expand(const std::string &strParam, std::size_t cb = 4096) {
+    constexpr const char *kStrings = "/tmp/strings";
+    std::ofstream(kStrings) << "[s]\nk=\"VAL\"\nutf=\"" + Repeated("é", 1200) + "\"\nlong=\"" +
+                                   std::string(600, 'l') +
+                                   "\"\nself=\"{s:self}\"\ngrow=\"x{s:grow}\"\n"
+                                   "a=\"{s:b}\"\nb=\"{s:a}\"\n"
+                                   "c=\"_T(s,d)\"\nd=\"_T(s,e)\"\ne=\"_T(s,c)\"\n"
+                                   "place=\"{s:k}\"\ntoken=\"_T(s,k)\"\n[]\nk=\"NAMELESS\"\n";
+    // Exactly as large as it is said to be, so that a sanitizer sees what goes past it.
+    std::vector<char> out(cb, '?');
+    ParamGet(TextList({strParam}).Get(), 0, kStrings, out.data(), static_cast<int>(cb));
+    return {out.data()};
+}
+
+TEST(References, AreReplacedByTextsOrByTheirKeys) {
+    const std::string strX(505, 'x');
+    const std::string strS(511, 's');
+    const std::string strK(511, 'k');
+    const struct {
+        std::string strParam;
+        std::string strText;
+    } rows[] = {
+        {"", ""},
+        {"plain", "plain"},
+        {"{s:k}", "VAL"},
+        {"}{s:k} and {s:k}{s:none}", "}VAL and VALnone"},
+        {"{:k}", "NAMELESS"},
+        {"{s:}|{:}", "|"},
+        {"{ s:k}{s: k}", "k k"},
+        {"{0} x {a:b}", "b"},
+        {"{s:k", "{s:k"},
+        {"{s k} {", "{s k} {"},
+        {"{" + strS + ":" + strK + "}", strK},
+        {"{" + strS + "s:k}{s:k}", "{" + strS + "s:k}{s:k}"},
+        {"{s:" + strK + "k}{s:k}", "{s:" + strK + "k}{s:k}"},
+        {"_T(s,k)", "VAL"},
+        {"a_T( \"s\" ,\t'k'\r\n)b", "aVALb"},
+        {"_T(s,none)_T(s,k)", "noneVAL"},
+        {"_T(s,k,k)", "k,k"},
+        {"_T(s k)_T(s,k)", "_T(s k)_T(s,k)"},
+        {"_T( ' ,k)", "_T( ' ,k)"},
+        {"_T(s,\")", "_T(s,\")"},
+        {"_T(s,k", "_T(s,k"},
+        {"_T(s," + strX + ")", strX},
+        // A text is looked through for the forms in turn, so only the second may bring in more.
+        {"{s:token}", "VAL"},
+        {"_T(s,token)", "VAL"},
+        {"_T(s,place)", "{s:k}"},
+        {"_T({s:none},{s:k})", "VAL"},
+        // What cannot be replaced ends its form, not the other one.
+        {"_T(s,k){s:self}", "VAL{s:self}"},
+        {std::string(3500, 'x') + "{s:long}_T(s,k)", std::string(3500, 'x') + "{s:long}VAL"},
+    };
+    for (const auto &row : rows) {
+        const seam::Outcome outcome =
+            seam::Observe([&] { EXPECT_EQ(Expand(row.strParam), row.strText); });
+        EXPECT_EQ(Messages(outcome), "") << row.strParam;
+    }
+    const std::string strTooLong = "_T(s," + strX + "x)_T(s,k)";
+    const seam::Outcome outcome = seam::Observe([&] { EXPECT_EQ(Expand(strTooLong), strTooLong); });
+    EXPECT_EQ(Messages(outcome), "Char string length not enough");
+    // Different ones, as many as fit.
+    std::string strMany;
+    for (int i = 100; i < 700; ++i) {
+        strMany += "{:" + std::to_string(i) + '}';
+    }
+    EXPECT_EQ(Expand(strMany).substr(0, 12), "100101102103");
+    EXPECT_EQ(Expand(strMany).size(), 1800U);
+}
+
+TEST(References, CheckedAloneFillTheBuffersAndNoMore) {
+    const struct {
+        const char *szText;
+        int tpl1;
+        int tpl2;
+    } rows[] = {{"{abc:def}", 0, -1}, {"{abcd:e}", -1, -1}, {"{a:bcde}", -1, -1},
+                {"_T(a,b)", -1, 0},   {"_T(a,bc)", -1, -1}, {"x{:}_T(a,b)", 0, 0},
+                {"_T(", -1, -1},      {"", -1, -1},         {nullptr, -1, -1}};
+    for (const auto &row : rows) {
+        std::vector<char> section(8, '?');
+        std::vector<char> key(8, '?');
+        std::vector<char> token(8, '?');
+        EXPECT_EQ(CheckSectionKey_tpl1(row.szText, section.data(), key.data(), 4), row.tpl1);
+        EXPECT_EQ(section[4], '?');
+        EXPECT_EQ(key[4], '?');
+        EXPECT_EQ(CheckSectionKey_tpl2(row.szText, section.data(), key.data(), token.data(), 8),
+                  row.tpl2);
+        if (row.tpl2 == 0) {
+            EXPECT_STREQ(token.data(), "_T(a,b)");
+        }
+    }
+}
+
+TEST(References, TextIsCutBetweenCharacters) {
+    for (const auto &[cb, strText] : std::vector<std::pair<std::size_t, std::string>>{
+             {1, ""}, {2, "a"}, {3, "a"}, {4, "a"}, {5, "a€"}, {6, "a€"}, {8, "a€"}, {9, "a€😀"}}) {
+        EXPECT_EQ(Expand("a€😀b", cb), strText) << cb;
+    }
+    EXPECT_EQ(Expand("{s:utf}"), Repeated("é", 1023));
+    Json::Value log;
+    EXPECT_EQ(ConvertLog(nullptr, ("a" + Repeated("€", 5000)).c_str(), nullptr, log), 0);
+    EXPECT_EQ(log["jpn"], "a" + Repeated("€", 4094));
+}
+
+TEST(References, ExpansionEndsOnEveryInput) {
+    const std::string inputs[] = {
+        std::string(4095, '{'),
+        Repeated("_T(", 4095),
+        Repeated("{:", 4095),
+        Repeated("_T(,", 4095) + ")",
+        Repeated("{", 2000) + ":" + Repeated("}", 2000),
+        "{s:self}",
+        "{s:grow}",
+        "{s:a}",
+        "_T(s,c)",
+        Repeated("{s:a}{s:grow}_T(s,c){s:self}", 4095),
+    };
+    for (const std::string &strInput : inputs) {
+        const auto start = std::chrono::steady_clock::now();
+        EXPECT_LE(Expand(strInput).size(), 4095U);
+        EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(1))
+            << strInput.substr(0, 40);
+    }
+    EXPECT_EQ(Expand("{s:self}"), "{s:self}");
+    EXPECT_EQ(Expand("{s:grow}").substr(0, 4), "xxxx");
+}
+
+// --- The message in every language --------------------------------------------------------------
+
+TEST_F(SendLog, RenderingSurvivesEveryFailingCall) {
+    WriteTexts("[m]\nmsg=\"A {0} B {1}\"\n[s]\nk=\"VAL\"\nt=\"TOK\"\n");
+    const std::string strWhole = "A VAL B TOK";
+    const TextList params({"{s:k}", "_T(s, t)"});
+    Json::Value out;
+    torture::Case test;
+    test.strName = "ConvertLog";
+    test.strFile = kFile;
+    test.setUp = [&] { out = Json::objectValue; };
+    test.run = [&] { return std::to_string(ConvertLog("m", "msg", params.Get(), out)); };
+    test.state = [&] { return CountedTexts(out); };
+    const auto with = [&](const char *szText) {
+        return Expected{"0", "", Counted({{strWhole, 19}, {szText, 1}})};
+    };
+    test.unfaulted = {"0", "", Counted({{strWhole, 20}})};
+
+    const std::string strLanguage =
+        "YLIBCSzListGet YLIBCFileGetSectionValue "
+        "YLIBCSzListGet YLIBCFileGetSectionValue YLIBCStrReplace YLIBCStrReplace "
+        "YLIBCSzListGet YLIBCStrTokIndex YLIBCStrTrim YLIBCStrTrim YLIBCFileGetSectionValue "
+        "YLIBCStrReplace YLIBCStrReplace";
+    test.strCalls = "YLIBCSzListAlloc YLIBCStrTok " + Repeat(strLanguage, 20);
+    const auto add = [&test](const char *szCall, int nth, const Expected &expected) {
+        test.faults[std::string(szCall) + '#' + std::to_string(nth)] = expected;
+    };
+    for (int i = 0; i < 20; ++i) {
+        add("YLIBCSzListGet", 3 * i + 1, {"-1", "", Counted({{strWhole, i}})});
+        add("YLIBCSzListGet", 3 * i + 2, with("A  B TOK"));
+        add("YLIBCSzListGet", 3 * i + 3, with("A VAL B "));
+        // Without a message of its own a language gets the English one.
+        add("YLIBCFileGetSectionValue", 3 * i + 1, test.unfaulted);
+        add("YLIBCFileGetSectionValue", 3 * i + 2, with("A k B TOK"));
+        add("YLIBCFileGetSectionValue", 3 * i + 3, with("A VAL B t"));
+        add("YLIBCStrReplace", 4 * i + 1, with("A {s:k} B TOK"));
+        add("YLIBCStrReplace", 4 * i + 2, with("A {0} B TOK"));
+        add("YLIBCStrReplace", 4 * i + 3, with("A VAL B _T(s, t)"));
+        add("YLIBCStrReplace", 4 * i + 4, with("A VAL B {1}"));
+    }
+    test.faults["YLIBCStrTokIndex"] = with("A VAL B _T(s, t)");
+    test.faults["YLIBCStrTrim"] = with("A VAL B _T(s, t)");
+    test.faults["YLIBCStrTok"] = {"-1", "", ""};
+    test.faults["YLIBCSzListAlloc"] = {"-1", NoList(), ""};
+    torture::Run(test);
+
+    const seam::Outcome outcome = seam::Observe([&] { test.run(); });
+    const std::string strPath = "'" + PathOf("chs") + "', ";
+    EXPECT_EQ(outcome.details.at(0), "YLIBCSzListAlloc(512)");
+    EXPECT_EQ(torture::Joined({outcome.details.begin() + 3, outcome.details.begin() + 8}, "\n"),
+              "YLIBCFileGetSectionValue(" + strPath + "'m', 'msg', buf, 4096)\n" +
+                  "YLIBCSzListGet(*, 0)\n" + "YLIBCFileGetSectionValue(" + strPath +
+                  "'s', 'k', buf, 1024)\n" + "YLIBCStrReplace(buf, '{s:k}', 'VAL', 0, 4096)\n" +
+                  "YLIBCStrReplace(buf, '{0}', 'VAL', 0, 4096)");
+}
+
+TEST_F(SendLog, ALanguageWithoutTheMessageSpeaksEnglish) {
+    WriteTexts("[m]\nmsg=\"eigen {0} {0} {1} {2}\"\n[s]\nk=\"W\"\n");
+    std::ofstream(PathOf("enu")) << "[m]\nmsg=\"own {0} {0} {1} {2}\"\n[s]\nk=\"E\"\n";
+    std::ofstream(PathOf("fre")) << "[s]\nk=\"F\"\n";
+    std::ofstream(PathOf("trk")) << "[m]\nmsg=\"{0}\"\n";
+    Json::Value out;
+    out["other"] = "stays";
+    const TextList params({"{s:k}", "{1}"});
+    EXPECT_EQ(ConvertLog("m", "msg", params.Get(), out), 0);
+    EXPECT_EQ(CountedTexts(out), "17 eigen W W {1} {2}; 1 k; 2 own E E {1} {2}; 1 stays");
+    EXPECT_EQ(out["fre"], "own E E {1} {2}");
+
+    out = Json::Value();
+    EXPECT_EQ(ConvertLog(nullptr, "{0}/{1}", TextList({"{s:k}", "_T(s,k)"}).Get(), out), 0);
+    EXPECT_EQ(CountedTexts(out), "1 E/E; 1 F/F; 17 W/W; 1 k/k");
+    EXPECT_EQ(ConvertLog(nullptr, "{0}", nullptr, out), 0);
+    EXPECT_EQ(CountedTexts(out), "20 {0}");
+    EXPECT_EQ(ConvertLog(nullptr, nullptr, nullptr, out), -1);
+    EXPECT_EQ(ConvertLog("m", nullptr, nullptr, out), -1);
+    Json::Value array(Json::arrayValue);
+    EXPECT_EQ(ConvertLog(nullptr, "text", nullptr, array), -1);
+
+    // In every file but the English one, and then in one file less.
+    std::ofstream(PathOf("enu")) << "[m]\n";
+    std::ofstream(PathOf("fre")) << "[m]\nmsg=\"ma\"\n";
+    out = Json::Value();
+    EXPECT_EQ(ConvertLog("m", "msg", nullptr, out), -1);
+    EXPECT_EQ(CountedTexts(out), "4 eigen {0} {0} {1} {2}") << "what was done by then";
+}
+
+// --- Push ---------------------------------------------------------------------------------------
+
+TEST_F(SendLog, TheListOverloadSurvivesEveryFailingCall) {
+    const std::string strSent =
+        R"({"extra_info":"x","happen_time":"now","level":"warning","username":"[zelobox]"})";
+    const Expected unread{"-1", "conver (null):hi string failed. ", "nothing"};
+    torture::Case test;
+    test.strName = "list";
+    test.strFile = kFile;
+    test.setUp = [] { s_pServer->ForgetRequests(); };
+    test.run = [] {
+        return std::to_string(
+            ZELOQRMClientLog(4, nullptr, "hi", static_cast<YLIBSZLIST *>(nullptr), "x"));
+    };
+    test.state = Sent;
+    test.strCalls =
+        "ZELOLnxGetHostname time YLIBCSzListAlloc YLIBCStrTok " + Repeat("YLIBCSzListGet", 20);
+    test.countedCalls = 24;  // what follows belongs to the Web API call
+    test.unfaulted = {"0", "", strSent + " 20 hi"};
+    Expected noTime = test.unfaulted;
+    noTime.strStored.replace(noTime.strStored.find("\"now\""), 5, "-1");
+    test.faults = {{"ZELOLnxGetHostname", {"-1", "get hostname failed ", "nothing"}},
+                   {"time", noTime},
+                   {"YLIBCSzListAlloc", {"-1", NoList() + "\n" + unread.strLog, "nothing"}},
+                   {"YLIBCStrTok", unread},
+                   {"YLIBCSzListGet", unread}};
+    torture::Run(test);
+}
+
+TEST_F(SendLog, TheTextOverloadSurvivesEveryFailingCall) {
+    const std::string strSent = R"({"happen_time":"now","level":"info","username":"[zelobox]"})";
+    const auto sent = [&](const std::string &strTexts) {
+        return Expected{"0", "", strSent + ' ' + strTexts};
+    };
+    const Expected unread{"-1", "conver (null):{0}-{1} string failed. ", "nothing"};
+    torture::Case test;
+    test.strName = "texts";
+    test.strFile = kFile;
+    test.setUp = [] { s_pServer->ForgetRequests(); };
+    test.run = [] {
+        return std::to_string(ZELOQRMClientLog(9, nullptr, "{0}-{1}", "a", nullptr, "b"));
+    };
+    test.state = Sent;
+    test.strCalls =
+        "YLIBCSzListAlloc YLIBCSzListPush YLIBCSzListPush ZELOLnxGetHostname time "
+        "YLIBCSzListAlloc YLIBCStrTok " +
+        Repeat("YLIBCSzListGet YLIBCSzListGet YLIBCStrReplace YLIBCSzListGet YLIBCStrReplace", 20);
+    test.countedCalls = 107;
+    test.unfaulted = sent("20 a-b");
+    test.faults = {{"YLIBCSzListAlloc#1", {"-1", "Failed to allocate list", "nothing"}},
+                   {"YLIBCSzListAlloc#2", {"-1", NoList() + "\n" + unread.strLog, "nothing"}},
+                   {"YLIBCSzListPush#1", sent("20 b-{1}")},
+                   {"YLIBCSzListPush#2", sent("20 a-{1}")},
+                   {"ZELOLnxGetHostname", {"-1", "get hostname failed ", "nothing"}},
+                   {"time", sent("20 a-b")},
+                   {"YLIBCStrTok", unread}};
+    test.faults["time"].strStored.replace(strSent.find("\"now\""), 5, "-1");
+    for (int i = 0; i < 20; ++i) {
+        const auto nth = [](const char *szCall, int n) { return szCall + std::to_string(n); };
+        test.faults[nth("YLIBCSzListGet#", 3 * i + 1)] = unread;
+        test.faults[nth("YLIBCSzListGet#", 3 * i + 2)] = sent("1 -b; 19 a-b");
+        test.faults[nth("YLIBCSzListGet#", 3 * i + 3)] = sent("1 a-; 19 a-b");
+        test.faults[nth("YLIBCStrReplace#", 2 * i + 1)] = sent("19 a-b; 1 {0}-b");
+        test.faults[nth("YLIBCStrReplace#", 2 * i + 2)] = sent("19 a-b; 1 a-{1}");
+    }
+    torture::Run(test);
+}
+
+TEST_F(SendLog, TheServerGetsWhatTheCallerSays) {
+    WriteTexts("[m]\nmsg=\"{0} {1}\"\n");
+    YLIBSZLIST *const pslNone = nullptr;
+    const std::string strHead = R"("happen_time":"now","level":)";
+    const std::string strTail = R"(,"username":"[zelobox]"})";
+    EXPECT_EQ(ZELOQRMClientLog(3, "m", "msg", TextList({"ä\"\n"}).Get(), nullptr), 0);
+    EXPECT_EQ(Sent(), "{" + strHead + "\"err\"" + strTail + " 20 ä\"\n {1}");
+    EXPECT_EQ(ZELOQRMClientLog(-1, nullptr, "t", pslNone, ""), 0);
+    EXPECT_EQ(Sent(), R"({"extra_info":"",)" + strHead + "\"info\"" + strTail + " 20 t");
+    EXPECT_EQ(ZELOQRMClientLog(0, "m", "msg", nullptr, "a", nullptr), 0);
+    EXPECT_EQ(Sent(), "{" + strHead + "\"emerg\"" + strTail + " 20 a {1}");
+    EXPECT_EQ(ZELOQRMClientLog(7, "m", "msg", nullptr, nullptr, nullptr), 0);
+    EXPECT_EQ(Sent(), "{" + strHead + "\"debug\"" + strTail + " 20 {0} {1}");
+    const Json::Value log = s_pServer->Log();
+    EXPECT_EQ(log[log.size() - 1]["level"], "debug");
+    // Bytes that are no UTF-8 do not break the request.
+    EXPECT_EQ(ZELOQRMClientLog(7, nullptr, "a\xE4\xC3", pslNone, "\xFF"), 0);
+
+    s_pServer->ForgetRequests();
+    YLIBCErrSetEx(YLIBC_ERR_NONE, "", 0);
+    const seam::Outcome null =
+        seam::Observe([&] { EXPECT_EQ(ZELOQRMClientLog(3, "m", nullptr, pslNone, ""), -1); });
+    EXPECT_EQ(Messages(null), "Invaild Argument (__null != szKey)=[0]\n");
+    EXPECT_TRUE(null.calls.empty());
+    EXPECT_EQ(YLIBCErrGet(), 0x0D00U);
+    const seam::Outcome absent =
+        seam::Observe([] { EXPECT_EQ(ZELOQRMClientLog(3, "m", "none", "a", "b", "c"), -1); });
+    EXPECT_EQ(Messages(absent), "conver m:none string failed. ");
+    EXPECT_EQ(Sent(), "nothing");
+}
+
+TEST_F(SendLog, OnlyBooleanTrueConfirmsAnEntry) {
+    YLIBSZLIST *const pslNone = nullptr;
+    const struct {
+        const char *szBody;
+        int result;
+        const char *szLog;
+    } rows[] = {
+        {R"({"success":true})", 0, ""},
+        {R"({"success":"true"})", -1, "push log webapi response failed, jsReq={"},
+        {R"({"success":1})", -1, "push log webapi response failed, jsReq={"},
+        {R"({"success":false})", -1, "push log webapi response failed, jsReq={"},
+        {"{}", -1, "push log webapi response failed, jsReq={"},
+        {"[true]", -1, "push log webapi response failed, jsReq={"},
+        {"no json", -1, "push log webapi failed, jsReq={"},
+    };
+    for (const auto &row : rows) {
+        SCOPED_TRACE(row.szBody);
+        devserver::NextAnswer answer;
+        answer.body = row.szBody;
+        s_pServer->AnswerNext(kLogApi, answer);
+        // The message is too long for a line.
+        const std::string strMessage(3000, 'm');
+        const seam::Outcome outcome = seam::Observe([&] {
+            EXPECT_EQ(ZELOQRMClientLog(3, nullptr, strMessage.c_str(), pslNone, nullptr),
+                      row.result);
+        });
+        const std::string strLast = outcome.logs.empty() ? "" : outcome.logs.back().strMessage;
+        EXPECT_EQ(strLast.substr(0, strLast.find('{') + 1), row.szLog);
+        EXPECT_EQ(strLast.find(" bytes in all]") != std::string::npos, row.result != 0);
+        EXPECT_EQ(outcome.recordsLeft, 0);
+    }
+}
+
+TEST_F(SendLog, TheServerRefusesWhatIsNoEntry) {
+    const auto push = [](const Json::Value &params) {
+        Json::Value reply;
+        EXPECT_EQ(ZELOQRMClientSendWebapi(reply, kLogApi, 1, "push", params, false), 0);
+        return json_text::ErrorCode(reply);
+    };
+    Json::Value entry;
+    entry["happen_time"] = 1;
+    entry["level"] = "err";
+    entry["username"] = "[h]";
+    entry["log"]["enu"] = "text";
+    EXPECT_EQ(push(entry), 0);
+    const std::pair<const char *, Json::Value> rows[] = {
+        {"happen_time", 1.0}, {"happen_time", "1"},
+        {"level", "error"},   {"level", 3},
+        {"username", 1},      {"extra_info", Json::Value()},
+        {"log", "text"},      {"log", Json::Value(Json::objectValue)}};
+    for (const auto &[szMember, value] : rows) {
+        Json::Value changed = entry;
+        changed[szMember] = value;
+        EXPECT_EQ(push(changed), 101) << szMember;
+    }
+    entry["log"]["enu"] = 1;
+    EXPECT_EQ(push(entry), 101);
+    stored::AddSession(1, "wrong");
+    EXPECT_EQ(push(entry), 105);
+
+    devserver::LogEntries entries;
+    for (int i = 0; i < 1001; ++i) {
+        entry["happen_time"] = i;
+        entry["other"] = "is not kept";
+        entries.Add(entry);
+    }
+    EXPECT_EQ(entries.All().size(), 1000U);
+    EXPECT_EQ(entries.All()[0]["happen_time"], 1);
+    EXPECT_EQ(entries.All()[0].size(), 4U);
+}
+
+}  // namespace
