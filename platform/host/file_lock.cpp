@@ -25,7 +25,8 @@ using Clock = std::chrono::steady_clock;
 constexpr const char *kFile = "file_lock";
 constexpr int kTimeout_s = 30;
 
-// A lock that is held elsewhere is tried again after a wait that grows from the first to the last.
+// A lock that is held elsewhere is tried again after a wait that grows from the first to the last;
+// by the one who is next in turn after the first each time.
 constexpr std::chrono::microseconds kFirstWait{100};
 constexpr std::chrono::microseconds kLastWait{2000};
 
@@ -129,38 +130,70 @@ Try TryLock(int fd) {
     return blHeld ? Try::kHeld : Try::kHeldElsewhere;
 }
 
+// Only who is next in turn tries the lock itself. Without turns a process that takes the lock over
+// and over would get it each time before those who wait, and they would wait for ever. A turn goes
+// with the open lock file.
+bool TakeTurn(int fd, short type) {
+    struct flock turn = {};
+    turn.l_type = type;
+    turn.l_whence = SEEK_SET;
+    turn.l_len = 1;
+    return fcntl(fd, F_OFD_SETLK, &turn) == 0;
+}
+
 // Waits a while, not beyond the end. False when the end has come.
-bool Wait(Clock::time_point end, std::chrono::microseconds &wait) {
+bool Wait(Clock::time_point end, std::chrono::microseconds wait) {
     const Clock::duration left = end - Clock::now();
     if (left <= Clock::duration::zero()) {
         return false;
     }
     std::this_thread::sleep_for(std::min<Clock::duration>(wait, left));
-    wait = std::min(2 * wait, kLastWait);
     return true;
+}
+
+// Waits for the turn and then for the lock.
+Try WaitForLock(int fd, Clock::time_point end) {
+    // What is refused is not waited for.
+    struct stat status = {};
+    if (fstat(fd, &status) != 0) {
+        return Try::kFailed;
+    }
+    if (!host::IsOwnFile(status)) {
+        return Try::kUnsafe;
+    }
+    for (std::chrono::microseconds wait = kFirstWait; !TakeTurn(fd, F_WRLCK);
+         wait = std::min(2 * wait, kLastWait)) {
+        if (errno != EAGAIN && errno != EACCES) {
+            return Try::kFailed;
+        }
+        if (!Wait(end, wait)) {
+            return Try::kHeldElsewhere;
+        }
+    }
+    Try result = TryLock(fd);
+    while (result == Try::kHeldElsewhere && Wait(end, kFirstWait)) {
+        result = TryLock(fd);
+    }
+    static_cast<void>(TakeTurn(fd, F_UNLCK));
+    return result;
 }
 
 int Lock(const char *szPath, int timeout_s, int &handle) {
     const Clock::time_point end = Clock::now() + std::chrono::seconds(timeout_s);
-    std::chrono::microseconds wait = kFirstWait;
     for (;;) {
         LockFile file(szPath);
         if (file.Get() < 0) {
             return HOST_FAIL(errno == ELOOP ? YLIBC_ERR_UNSAFE_FILE : YLIBC_ERR_FILE);
         }
-        Try result = TryLock(file.Get());
-        while (result == Try::kHeldElsewhere) {
-            if (!Wait(end, wait)) {
-                return HOST_FAIL(YLIBC_ERR_BUSY);
-            }
-            result = TryLock(file.Get());
-        }
+        const Try result = WaitForLock(file.Get(), end);
         switch (result) {
             case Try::kHeld:
                 handle = file.HandOut();
                 return 1;
             case Try::kRemoved:
                 continue;
+            case Try::kHeldElsewhere:
+                return HOST_FAIL(YLIBC_ERR_BUSY);
             case Try::kUnsafe:
                 return HOST_FAIL(YLIBC_ERR_UNSAFE_FILE);
             default:
