@@ -1,24 +1,21 @@
-// qrmctl join: the enrolling program. The library's join stores where the server is; the session
-// with the access token is this program's to store, and what is added is its to remove on failure.
+// qrmctl join: the enrolling program. The library's join stores where the server is; every other
+// step of a membership is this program's to take, in order, and to undo when one fails.
 
-#include <algorithm>
-#include <cstring>
+#include <functional>
 #include <memory>
 #include <vector>
 
 #include "candidates.h"
 #include "commands.h"
-#include "credential_store.h"
 #include "input_file.h"
 #include "json_text.h"
-#include "platform_handles.h"
+#include "membership.h"
 #include "serial_number.h"
 #include "zeloqrmclient.h"
 
 namespace qrmctl {
 namespace {
 
-constexpr const char *kApplication = "ZELO.QRM";
 constexpr const char *kApi = "ZELO.QRM.RPC";
 
 struct Options {
@@ -30,6 +27,7 @@ struct Options {
     std::string strCandidates;
     std::string strId;
     bool blAllowHttp = false;
+    bool blAgain = false;
 };
 
 std::string SerialNumber() {
@@ -38,65 +36,6 @@ std::string SerialNumber() {
         YLIBGetSerialNumber(sz, sizeof(sz));
     }
     return sz;
-}
-
-// A filter that keeps the server's credentials but those whose ids are in a text such as " 3 7 ".
-int KeepUnlisted(const ZELO_CRED *pCred, const char *szIds) {
-    long id = -1;
-    return ZELOCredKeepByApplication(pCred, kApplication) != 0 &&
-                   ZELOCredItemGetID(&id, pCred) >= 0 &&
-                   std::strstr(szIds, (' ' + std::to_string(id) + ' ').c_str()) == nullptr
-               ? 1
-               : 0;
-}
-
-// Looks for a server credential that is not among the known ones; id is negative when there is
-// none. Returns false when the store cannot be read.
-bool FindUnknown(const std::vector<long> &known, long &id) {
-    std::string strIds = " ";
-    for (long knownId : known) {
-        strIds += std::to_string(knownId) + ' ';
-    }
-    ZELO_CRED *pFirst = nullptr;
-    const int count = ZELOCredListGet(&pFirst, KeepUnlisted, strIds.c_str());
-    const CredListHandle list(pFirst);
-    id = -1;
-    return count == 0 || (count > 0 && ZELOCredItemGetID(&id, pFirst) >= 0);
-}
-
-bool FindAll(std::vector<long> &ids) {
-    long id = -1;
-    while (FindUnknown(ids, id)) {
-        if (id < 0) {
-            return true;
-        }
-        ids.push_back(id);
-    }
-    return false;
-}
-
-bool Remove(long id) {
-    return ZELOCredSessRemoveByID(id) >= 0 && ZELOCredRemoveByID(id) >= 0;
-}
-
-bool RemoveUnknown(const std::vector<long> &known) {
-    long id = -1;
-    while (FindUnknown(known, id)) {
-        if (id < 0) {
-            return true;
-        }
-        if (!Remove(id)) {
-            return false;
-        }
-    }
-    return false;
-}
-
-bool StoreSession(long id, const std::string &strToken) {
-    const CredSessHandle pSess(ZELOCredSessAlloc());
-    return pSess != nullptr && ZELOCredSessItemSetID(pSess.get(), id) >= 0 &&
-           ZELOCredSessItemSetAccessToken(pSess.get(), strToken.c_str()) >= 0 &&
-           ZELOCredSessSave(pSess.get()) >= 0;
 }
 
 // An id that reads as a number goes as one.
@@ -153,48 +92,70 @@ Json::Value AllCandidates(const Json::Value &joinInfo) {
     return all;
 }
 
-// Takes back what a failed join added to the credentials that were stored before.
-ExitCode FailAndTakeBack(const std::string &strError, const std::vector<long> &before,
-                         Report &report) {
-    if (!RemoveUnknown(before)) {
-        return report.Fail(strError +
-                           "; what it stored could not be removed: run "
-                           "'qrmctl credential delete'");
-    }
-    return report.Fail(strError + (before.empty() ? "; nothing of it stays stored"
-                                                  : "; the credential stored before is in force"));
+struct Step {
+    const char *szFailed;
+    std::function<bool()> Take;
+};
+
+// The join flag comes last: "yes" is only ever written over a complete state.
+std::vector<Step> Steps(const Json::Value &joinInfo) {
+    const std::string strToken = joinInfo["access_token"].asString();
+    const std::string strSerial = joinInfo["sn"].asString();
+    return {
+        {"the server did not accept the join (check token and serial number; -v shows its "
+         "answer), or the appliance's model, version or ports could not be read (check "
+         "/etc.defaults/zeloinfo.conf, /etc.defaults/VERSION and /etc/zeloinfo.conf)",
+         [&joinInfo] { return ZELOQRMClientSendCreateClient(joinInfo) == 0; }},
+        {"the serial number could not be stored", [strSerial] { return StoreSerial(strSerial); }},
+        {"the session could not be stored", [strToken] { return StoreServerSession(strToken); }},
+        {"the notification center's credential could not be stored",
+         [strToken] { return StoreNotificationCenter(strToken); }},
+        {"the cache daemon could not be started", StartCacheDaemon},
+        {"the web sessions could not be added", AddClientSessions},
+        {"the service account could not be created", CreateServiceAccount},
+        {"the join flag could not be set", [] { return SetJoinFlag("yes"); }},
+        {"the indicators of membership disagree after the join",
+         [] { return ZELOQRMClientStatus() == 1; }}};
 }
 
-// The lowest id is in force, so a credential that is there already stays in force until the new one
-// is complete, whenever this program ends.
-ExitCode JoinAndStore(const Json::Value &joinInfo, Report &report) {
-    std::vector<long> before;
-    if (!FindAll(before)) {
-        return report.Fail(
-            "the credential store cannot be read, nothing was changed; -v shows the reason");
-    }
-    if (ZELOQRMClientSendCreateClient(joinInfo) != 0) {
-        return FailAndTakeBack(
-            "the server did not accept the join (check token and serial number; -v shows its "
-            "answer), or the appliance's model, version or ports could not be read (check "
-            "/etc.defaults/zeloinfo.conf, /etc.defaults/VERSION and /etc/zeloinfo.conf)",
-            before, report);
-    }
-    long id = -1;
-    if (!FindUnknown(before, id) || !StoreSession(id, joinInfo["access_token"].asString())) {
-        return FailAndTakeBack("the session could not be stored", before, report);
-    }
-    if (!std::all_of(before.begin(), before.end(), Remove)) {
-        return report.Fail(
-            "the server accepted the join, but a credential stored before could not be removed "
-            "and may be in force: run 'qrmctl credential delete' and join again");
-    }
+// Leaves as if to join again, so that nobody is told of the end of a membership that never began.
+bool Undo() {
+    LeaveRequest request;
+    request.blRejoin = true;
+    return LeaveWholly(request) && LeaveWholly(LeaveRequest());
+}
+
+ExitCode FailAndUndo(const std::string &strError, Report &report) {
+    return report.Fail(strError + (Undo() ? "; nothing of it stays stored"
+                                          : "; what came before could not be undone wholly: run "
+                                            "'qrmctl leave'"));
+}
+
+void TellServer(const Json::Value &sn, Report &report) {
     Json::Value server(Json::objectValue);
     ZELOQRMClientGetServerCredential(server);
     for (const char *szName : {"protocol", "host", "port"}) {
         report.Fact(szName, server[szName]);
     }
-    report.Fact("sn", joinInfo["sn"]);
+    report.Fact("sn", sn);
+}
+
+// A server has answered. What is left of an earlier membership goes first: a credential that is
+// stored already would hide the new one.
+ExitCode Enrol(const Json::Value &joinInfo, Report &report) {
+    LeaveRequest before;
+    before.blRejoin = true;
+    if (!LeaveWholly(before)) {
+        return report.Fail(
+            "what is left of a membership before could not be removed, no join was begun: -v shows "
+            "the reason; run 'qrmctl leave' when its cause is mended");
+    }
+    for (const Step &step : Steps(joinInfo)) {
+        if (!step.Take()) {
+            return FailAndUndo(step.szFailed, report);
+        }
+    }
+    TellServer(joinInfo["sn"], report);
     report.Say("Joined. The server's address and the access token are stored.");
     return report.Done();
 }
@@ -211,14 +172,20 @@ ExitCode Join(const Options &options, Report &report) {
             "no candidate has an https port, and the access token does not go over plain http: "
             "give --https-port, or accept the risk with --allow-http");
     }
-    // A join without a connection would look to its caller like one that the server refused.
+    // Nothing is left, nor removed, for a server that cannot be had.
     Json::Value connection;
     if (!ZELOQRMClientTestConnect(candidates, kApi, connection)) {
         return report.Fail("no server answered at '" + options.strServer +
                            "' or any other candidate, nothing was changed: check address, ports "
                            "and certificate; -v shows the reason of each attempt");
     }
-    return JoinAndStore(joinInfo, report);
+    const bool blJoined = ZELOQRMClientStatus() == 1;
+    report.Member("was_joined", blJoined);
+    if (blJoined && !options.blAgain) {
+        report.Say("This appliance is joined already, nothing was changed; --again joins anew.");
+        return report.Done();
+    }
+    return Enrol(joinInfo, report);
 }
 
 }  // namespace
@@ -248,6 +215,8 @@ void AddJoin(CLI::App &app, Action &action) {
     pCommand->add_option("--id", pOptions->strId, "What the server calls this appliance");
     pCommand->add_flag("--allow-http", pOptions->blAllowHttp,
                        "Let the access token go over plain HTTP");
+    pCommand->add_flag("--again", pOptions->blAgain,
+                       "Leave first where a server is joined already");
     pCommand->callback([pOptions, &action] {
         action = [pOptions](Report &report) { return Join(*pOptions, report); };
     });

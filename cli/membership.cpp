@@ -8,6 +8,7 @@
 
 #include "credential_store.h"
 #include "fixed_text.h"
+#include "json_text.h"
 #include "key_value_file.h"
 #include "platform_handles.h"
 #include "process.h"
@@ -54,24 +55,36 @@ bool SeedGenerator() {
     return true;
 }
 
-// What join status does not look at: the account of a killed leave, its folder, its rights, and a
-// flag that still announces a join.
+// What join status does not look at: the account of a killed leave, its folder, and, where no join
+// is to follow, the account's rights and a flag that announces one.
 bool RemoveRemains(bool blRejoin) {
     std::error_code error;
     if (!ZELOQRMClientDeleteServerUser()) {
         return false;
     }
     std::filesystem::remove_all(kAccountFolder, error);
-    if (error || YLIBGroupExtraAdminSet("QRM", 0, 0, 0, 0) != 0) {
+    if (error || blRejoin) {
+        return !error;
+    }
+    if (YLIBGroupExtraAdminSet("QRM", 0, 0, 0, 0) != 0) {
         return false;
     }
-    if (!blRejoin && YLIBCFileCheckKeyValue(kConfigFile, kJoinFlag, "rejoin", 0) == 1) {
-        return SetJoinFlag("no");
-    }
-    return true;
+    return YLIBCFileCheckKeyValue(kConfigFile, kJoinFlag, "rejoin", 0) != 1 || SetJoinFlag("no");
 }
 
 }  // namespace
+
+bool StoreSerial(const std::string &strSerial) {
+    Json::Value extraInfo;
+    extraInfo["sn"] = strSerial;
+    std::string strText;
+    const CredHandle pCred(ZELOCredAlloc());
+    const long id = ZELOCredIDGetByApplication(kServerApplication);
+    return pCred != nullptr && id >= 0 && json_text::ToString(extraInfo, strText) &&
+           ZELOCredLoad(id, pCred.get()) >= 0 &&
+           ZELOCredItemSetExtraInfo(pCred.get(), strText.c_str()) >= 0 &&
+           ZELOCredSave(pCred.get()) >= 0;
+}
 
 bool StoreServerSession(const std::string &strToken) {
     return StoreSession(ZELOCredIDGetByApplication(kServerApplication), strToken);
@@ -116,6 +129,10 @@ bool SetJoinFlag(const char *szValue) {
 }
 
 bool LeaveWholly(const LeaveRequest &request) {
+    // A flag that cannot be judged counts as not joined whatever else there is.
+    if (YLIBCFileCheckKeyValue(kConfigFile, kJoinFlag, "yes", 0) < 0 && !SetJoinFlag("no")) {
+        return false;
+    }
     for (int i = 0; i < kMaxLeaves && ZELOQRMClientStatus() != 0; ++i) {
         if (!ZELOQRMClientDeleteServer(request.blRejoin, request.strFrom, request.blClearGluster)) {
             return false;

@@ -20,6 +20,9 @@ constexpr int kSessionIndex = 13;
 // The steps of a join behind the library's own, each of which returns whether it succeeded. They
 // are taken in this order, the join flag last: "yes" is only ever written over a complete state.
 
+// Stores the serial number with the credential that is in force: plug-ins are told it at a leave.
+bool StoreSerial(const std::string &strSerial);
+
 // Stores the session with the access token under the id of the credential that is in force.
 bool StoreServerSession(const std::string &strToken);
 
