@@ -4,6 +4,8 @@
 #include <syslog.h>
 #include <unistd.h>
 
+#include <cerrno>
+#include <csignal>
 #include <cstdarg>
 #include <cstddef>
 #include <cstdio>
@@ -19,11 +21,15 @@
 #include "idle_timer.h"
 #include "key_value_file.h"
 #include "notification.h"
+#include "plugin_sdk.h"
 #include "process.h"
 #include "serial_number.h"
 #include "strings_file.h"
+#include "service.h"
 #include "text_containers.h"
+#include "user_group.h"
 #include "web_api_request.h"
+#include "web_session.h"
 
 namespace seam {
 namespace {
@@ -36,8 +42,16 @@ struct Observation {
 
 thread_local Observation *t_pObservation = nullptr;
 
+// Counts a call, a release included, and ends the process at the one that the fault names.
+void Count() {
+    if (t_pObservation != nullptr && --t_pObservation->fault.killAt == 0) {
+        raise(SIGKILL);
+    }
+}
+
 // Whether this call is the one that the fault names.
 bool Enter(const char *szName, const std::string &strArguments) {
+    Count();
     if (t_pObservation == nullptr) {
         return false;
     }
@@ -120,6 +134,7 @@ Outcome Observe(const Fault &fault, const std::function<void()> &body) {
     void Real_##name parameters asm("__real_" symbol);          \
     void Wrap_##name parameters asm("__wrap_" symbol);          \
     void Wrap_##name parameters {                               \
+        seam::Count();                                          \
         seam::AddRecords(-static_cast<int>(lost));              \
         Real_##name arguments;                                  \
     }

@@ -30,7 +30,7 @@ struct Expected {
 
 struct Case {
     std::string strName;
-    std::string strFile;  // the source file that logs
+    std::string strFile;  // the source file that logs; "" where each message begins with its file
     std::function<void()> setUp;
     std::function<std::string()> run;  // calls the function, returns its result as text
     std::function<std::string()> state;
@@ -88,11 +88,12 @@ inline void Check(const Case &test, const seam::Outcome &outcome, const std::str
     EXPECT_EQ(outcome.recordsLeft, expected.recordsKept);
     std::string strLog;
     for (const seam::LogLine &log : outcome.logs) {
-        strLog += (strLog.empty() ? "" : "\n") + log.strMessage;
-        EXPECT_EQ(log.strFile, test.strFile);
+        strLog += (strLog.empty() ? "" : "\n") + (test.strFile.empty() ? log.strFile + ' ' : "") +
+                  WithoutErrorTail(log.strMessage);
+        EXPECT_TRUE(test.strFile.empty() || log.strFile == test.strFile) << log.strFile;
         EXPECT_EQ(log.level, 3);
     }
-    EXPECT_EQ(WithoutErrorTail(strLog), expected.strLog);
+    EXPECT_EQ(strLog, expected.strLog);
 }
 
 inline std::string Joined(const std::vector<std::string> &parts, const char *szBetween,

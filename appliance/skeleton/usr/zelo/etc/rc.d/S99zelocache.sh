@@ -54,12 +54,16 @@ start() {
 }
 
 stop() {
-    local pid
+    local pid try
     take_turn
     if runs; then
-        read -r pid <"$pid_file"
-        grep -q zelocache "/proc/$pid/cmdline" 2>/dev/null ||
-            fail 1 "the daemon runs, but '$pid_file' does not name it: end it by hand"
+        # The daemon writes its id too: a look may find the file emptied for that.
+        for try in 1 2 3 4 5; do
+            read -r pid <"$pid_file" && grep -q zelocache "/proc/$pid/cmdline" 2>/dev/null && break
+            [ "$try" -lt 5 ] ||
+                fail 1 "the daemon runs, but '$pid_file' does not name it: end it by hand"
+            sleep 0.2
+        done
         kill "$pid"
         if ! flock -w 5 -s 9; then
             kill -KILL "$pid"
