@@ -56,12 +56,16 @@ inline std::string Remains() {
     const accounts::Names members = accounts::Members();
     add(std::count(members.begin(), members.end(), kUser) != 0, "member");
     add(std::filesystem::exists(kFolder), "folder");
-    add(Value("join_nvo_qrm") != "no", '\'' + Value("join_nvo_qrm") + '\'');
+    const std::string strFlag = Value("join_nvo_qrm");
+    add(!strFlag.empty() && strFlag != "no", '\'' + strFlag + '\'');
     add(!Value("extra_admin_QRM").empty(), "rights");
     return strAll;
 }
 
-// A whole membership as Remains() shows it, and one without what removing the account takes away.
+// A whole membership as Remains() shows it; the rights are given by others.
+constexpr const char *kJoined =
+    "daemon ZELO.QRM ZELO.NotificationCenter ZELO.QRM.Client ZELO.QRM.Client.Machine account "
+    "member folder 'yes'";
 constexpr const char *kWhole =
     "daemon ZELO.QRM ZELO.NotificationCenter ZELO.QRM.Client ZELO.QRM.Client.Machine account "
     "member folder 'yes' rights";

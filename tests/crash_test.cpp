@@ -1,0 +1,123 @@
+// qrmctl join and leave, killed before every platform call in turn: whatever is left behind, one
+// leave clears it away.
+
+#include <cstdlib>
+#include <iostream>
+
+#include "commands.h"
+#include "joined.h"
+#include "membership_state.h"
+#include "zeloqrmclient.h"
+
+devserver::DevServer *joined::Joined::s_pServer = nullptr;
+
+namespace {
+
+using Arguments = std::vector<std::string>;
+
+constexpr int kKilled = -SIGKILL;
+constexpr const char *kTokenFile = "/tmp/token";
+
+class Crash : public joined::Joined {
+  protected:
+    void SetUp() override {
+        std::ofstream(kTokenFile) << joined::kToken;
+        s_without = accounts::ReadFiles();
+        membership::Clear(s_without);
+    }
+    void TearDown() override { membership::Clear(s_without); }
+
+    // Runs a command of qrmctl in a process of its own, which dies before the call with that
+    // number; 0 lets it live. Returns the exit status, or the signal's number below zero.
+    static int Run(Arguments arguments, int killAt = 0) {
+        std::fflush(nullptr);
+        const pid_t pid = fork();
+        if (pid == 0) {
+            CLI::App app;
+            qrmctl::Action action;
+            qrmctl::AddJoin(app, action);
+            qrmctl::AddLeave(app, action);
+            std::reverse(arguments.begin(), arguments.end());
+            app.parse(arguments);
+            const std::ostringstream quiet;
+            std::cout.rdbuf(quiet.rdbuf());
+            qrmctl::Report report(false);
+            seam::Fault fault;
+            fault.killAt = killAt;
+            int status = qrmctl::kFailed;
+            seam::Observe(fault, [&] { status = action(report); });
+            _exit(status);
+        }
+        int status = -1;
+        waitpid(pid, &status, 0);
+        return WIFEXITED(status) ? WEXITSTATUS(status) : -WTERMSIG(status);
+    }
+
+    // Kills the command before its first call, its second one, and so on until it has no more;
+    // returns how many there were.
+    static int KillAtEveryCall(const Arguments &command, const std::function<void()> &setUp) {
+        for (int killAt = 1;; ++killAt) {
+            SCOPED_TRACE("killed at call " + std::to_string(killAt));
+            setUp();
+            const int status = Run(command, killAt);
+            if (status != kKilled) {
+                EXPECT_EQ(status, 0) << "what is not killed succeeds";
+                return killAt - 1;
+            }
+            EXPECT_EQ(Run({"leave"}), 0);
+            EXPECT_EQ(Left(), "");
+        }
+    }
+
+    // All that a membership may leave behind, also what nobody looks at.
+    static std::string Left() {
+        std::string strAll = membership::Remains() + accounts::Findings();
+        strAll += ZELOQRMClientStatus() == 0 ? "" : " status";
+        for (const char *szPath : {membership::kPreference, "/var/services/homes/ZelonixQRM",
+                                   "/var/run/zelocache.pid"}) {
+            strAll += std::filesystem::exists(szPath) ? ' ' + std::string(szPath) : "";
+        }
+        for (long id = 0; id < 10; ++id) {
+            const std::unique_ptr<ZELO_CRED_SESS, void (*)(ZELO_CRED_SESS *)> pSess(
+                ZELOCredSessAlloc(), ZELOCredSessFree);
+            strAll += ZELOCredSessLoad(id, pSess.get()) < 0 ? "" : " session";
+        }
+        return strAll;
+    }
+
+    static accounts::Files s_without;
+};
+
+accounts::Files Crash::s_without;
+
+TEST_F(Crash, OneLeaveClearsAwayAJoinThatWasKilledAnywhere) {
+    const Arguments join = {"join",
+                            "--server",
+                            "localhost",
+                            "--http-port",
+                            "0",
+                            "--https-port",
+                            std::to_string(s_pServer->HttpsPort()),
+                            "--token-file",
+                            kTokenFile};
+    const int calls = KillAtEveryCall(join, [] {});
+    EXPECT_EQ(membership::Remains(), membership::kJoined);
+    EXPECT_EQ(ZELOQRMClientStatus(), 1);
+    EXPECT_GT(calls, 100);
+    std::cout << "join: killed at each of " << calls << " calls\n";
+}
+
+// The start is one that takes a leave more than once: joined twice, with rights.
+TEST_F(Crash, OneLeaveEndsWhatAKilledOneBegan) {
+    ASSERT_TRUE(ZELOQRMClientCreateServerUser());
+    const accounts::Files files = accounts::ReadFiles();
+    const int calls = KillAtEveryCall({"leave"}, [&] {
+        membership::Build(files);
+        stored::AddSession(stored::AddCredential("ZELO.QRM", "second"), "t");
+    });
+    EXPECT_EQ(Left(), "");
+    EXPECT_GT(calls, 50);
+    std::cout << "leave: killed at each of " << calls << " calls\n";
+}
+
+}  // namespace
