@@ -61,7 +61,7 @@ struct FreeText {
 using TextCopy = std::unique_ptr<char, FreeText>;
 
 TextCopy Copy(const char *szText) {
-    return TextCopy(szText == nullptr ? nullptr : strdup(szText));
+    return TextCopy(szText == nullptr ? nullptr : strndup(szText, std::strlen(szText)));
 }
 
 // "{section:key}": everything between the marks counts, blanks too.
