@@ -21,7 +21,7 @@ std::string Padded(const std::string &strText, std::size_t width) {
 
 void Explain(Report &report) {
     constexpr std::size_t kNameWidth = 32;
-    constexpr std::size_t kHoldsWidth = 36;
+    constexpr std::size_t kHoldsWidth = 44;
     Json::Value indicators(Json::arrayValue);
     for (const Indicator &indicator : ReadIndicators()) {
         Json::Value entry;
