@@ -48,10 +48,11 @@ inline std::string TakePart(std::string_view &input) {
     return strPart;
 }
 
-// A file that is written anew for each input, in a folder whose files are not synced to disk.
+// A file in memory that is written anew for each input. Everybody can write to its folder, so a
+// change does not wait for a disk.
 class InputFile {
   public:
-    InputFile() : m_strPath("/tmp/fuzz_input_" + std::to_string(getpid())) {}
+    InputFile() : m_strPath("/dev/shm/fuzz_input_" + std::to_string(getpid())) {}
     ~InputFile() { unlink(m_strPath.c_str()); }
     InputFile(const InputFile &) = delete;
     InputFile &operator=(const InputFile &) = delete;
