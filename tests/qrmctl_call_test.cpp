@@ -67,6 +67,30 @@ TEST_F(QrmctlCall, ACallPrintsTheReplyAndSaysWhetherItSucceeded) {
     Run({"notify", "QRMClientDetachSuccess", "novalue"}, 1);
 }
 
+TEST_F(QrmctlCall, ALogEntryAndAnIdleTimeAreTakenAsTheyAreTyped) {
+    Run({"log", "warning", "-", "{0}|{1}|{2}", "[a,b]", "", "x", "--extra-info", "[e,f]"}, 0);
+    const Json::Value entries = s_pServer->Log();
+    EXPECT_EQ(entries[0]["level"], "warning");
+    EXPECT_EQ(entries[0]["extra_info"], "[e,f]");
+    EXPECT_EQ(entries[0]["log"]["jpn"], "[a,b]||x");
+    const Json::Value rendered =
+        Run({"log", "3", "qrm_log", "volume_degraded", "1", "_T(volume,disk_missing)", "--render"},
+            0)["log"];
+    EXPECT_EQ(rendered.size(), 20U);
+    EXPECT_EQ(rendered["enu"], "Volume 1 is degraded: a disk is missing.");
+    Run({"log", "9", "-", "text"}, 1);
+    Run({"log", "err", "nosuch", "text"}, 1);
+    EXPECT_EQ(s_pServer->Log().size(), 1U);
+
+    for (const char *szTime : {"0", "18446744073709551615"}) {
+        Run({"idle", "set", szTime}, 0);
+        EXPECT_EQ(Run({"idle", "get"}, 0)["idle_minutes"].asString(), szTime);
+    }
+    for (const char *szTime : {"-1", "18446744073709551616", "1x", ""}) {
+        EXPECT_EQ(run_program::Run({QRMCTL, "idle", "set", szTime}).status, 2) << szTime;
+    }
+}
+
 TEST_F(QrmctlCall, AFileIsReplacedOnlyByAWholeOne) {
     EXPECT_EQ(Run(GetFile(), 0)["bytes"], 300000);
     EXPECT_EQ(fs::file_size(kPath), 300000U);
