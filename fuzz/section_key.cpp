@@ -1,4 +1,4 @@
-// CheckSectionKey_tpl1 and CheckSectionKey_tpl2: a byte for the limit, and the text.
+// CheckSectionKey_tpl1 and CheckSectionKey_tpl2: a byte for the limit, -128 to 127, and the text.
 
 #include <vector>
 
@@ -37,7 +37,7 @@ void Check(const std::string &strText, int limit) {
 
 int LLVMFuzzerTestOneInput(const std::uint8_t *pData, std::size_t cb) {
     std::string_view input = fuzz::Input(pData, cb);
-    const int limit = static_cast<signed char>(fuzz::TakeByte(input));
+    const int limit = fuzz::TakeByte(input) - 128;
     const std::string strText = fuzz::TakePart(input);
     Check(strText, limit);
     Check(strText, 512);
