@@ -145,7 +145,7 @@ Outcome Observe(const Fault &fault, const std::function<void()> &body) {
     Result Wrap_##name parameters {                                                     \
         seam::AddRecords(-static_cast<int>(lost));                                      \
         Result result = Real_##name arguments;                                          \
-        return seam::FailsRelease(#name) ? failure : result;                            \
+        return seam::FailsRelease(#name) ? (failure) : result;                          \
     }
 
 #include "seam_operations.inc"

@@ -82,7 +82,7 @@ std::string NoList() {
     Json::Value out;
     const seam::Outcome outcome =
         seam::Observe({"YLIBCSzListAlloc", 1}, [&] { ConvertLog(nullptr, "text", nullptr, out); });
-    const std::string strLine = Messages(outcome);
+    std::string strLine = Messages(outcome);
     const std::string strEnd = "(ConvertLog) pslList calloc failure\n";
     EXPECT_EQ(strLine.compare(0, 13, "qrm_send_log:"), 0) << strLine;
     EXPECT_GT(std::atoi(strLine.c_str() + 13), 0) << strLine;
@@ -262,7 +262,7 @@ TEST(References, ExpansionEndsOnEveryInput) {
     for (const std::string &strInput : inputs) {
         const auto start = std::chrono::steady_clock::now();
         EXPECT_LE(Expand(strInput).size(), 4095U);
-        EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(1))
+        EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(5))
             << strInput.substr(0, 40);
     }
     EXPECT_EQ(Expand("{s:self}"), "{s:self}");
