@@ -120,4 +120,21 @@ TEST_F(Crash, OneLeaveEndsWhatAKilledOneBegan) {
     std::cout << "leave: killed at each of " << calls << " calls\n";
 }
 
+TEST_F(Crash, OneLeaveClearsAwayWhatTheStatusDoesNotLookAt) {
+    ASSERT_TRUE(ZELOQRMClientCreateServerUser());
+    YLIBGroupExtraAdminSet("QRM", 1, 2, 3, 4);
+    YLIBCINFOSetKeyValue("join_nvo_qrm", "rejoin");
+    EXPECT_EQ(ZELOQRMClientStatus(), 0);
+    EXPECT_EQ(Run({"leave"}), 0);
+    EXPECT_EQ(Left(), "");
+
+    const std::string strConfig = joined::FileText(membership::kConfig);
+    std::filesystem::remove(membership::kConfig);
+    stored::AddCredential("ZELO.QRM", "h");
+    EXPECT_EQ(ZELOQRMClientStatus(), 0) << "nothing disagrees with a flag that cannot be read";
+    EXPECT_EQ(Run({"leave"}), 0);
+    EXPECT_EQ(Left(), "");
+    std::ofstream(membership::kConfig) << strConfig;
+}
+
 }  // namespace
