@@ -103,9 +103,8 @@ bool Create(const FoundFile &found, mode_t mode, TemporaryFile &temporary) {
 // The owner goes first: a change of owner takes rights away from the mode.
 bool SetOwnerAndMode(const FoundFile &found, mode_t mode, TemporaryFile &temporary) {
     const int fd = temporary.file.Get();
-    const bool blSameOwner =
-        !found.file.IsOpen() || (found.status.st_uid == temporary.status.st_uid &&
-                                 found.status.st_gid == temporary.status.st_gid);
+    const bool blSameOwner = !found.blThere || (found.status.st_uid == temporary.status.st_uid &&
+                                                found.status.st_gid == temporary.status.st_gid);
     if (!blSameOwner && fchown(fd, found.status.st_uid, found.status.st_gid) != 0) {
         return false;
     }
@@ -136,7 +135,7 @@ int ReplaceFile(const FoundFile &found, const std::string &strContent) {
     if (!ReadShared(found.strFolder, blShared)) {
         return -1;
     }
-    const mode_t mode = found.file.IsOpen() ? found.status.st_mode & 07777U : kModeOfNew;
+    const mode_t mode = found.blThere ? found.status.st_mode & 07777U : kModeOfNew;
     // Until it has its owner, nobody else may change the file or read what is not for everybody.
     const mode_t modeAtFirst = mode & ((mode & S_IROTH) != 0 ? 0755U : 0700U);
     TemporaryFile temporary;

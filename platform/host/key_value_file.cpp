@@ -4,10 +4,11 @@
 
 #include <new>
 #include <string_view>
-#include <unordered_set>
+#include <vector>
 
 #include "../file_lock.h"
 #include "file_replacement.h"
+#include "hash_place.h"
 #include "key_value_lookup.h"
 #include "last_error.h"
 #include "text_buffer.h"
@@ -20,13 +21,18 @@ constexpr const char *kConfigLock = "/etc/.zeloinfo.conf.lock";
 
 // --- The format ---------------------------------------------------------------------------------
 
+bool IsBlank(char c) {
+    return c == ' ' || c == '\t' || c == '\r' || c == '\n';
+}
+
 std::string_view Trim(std::string_view text) {
-    constexpr std::string_view kBlanks = " \t\r\n";
-    const std::size_t begin = text.find_first_not_of(kBlanks);
-    if (begin == std::string_view::npos) {
-        return {};
+    while (!text.empty() && IsBlank(text.front())) {
+        text.remove_prefix(1);
     }
-    return text.substr(begin, text.find_last_not_of(kBlanks) - begin + 1);
+    while (!text.empty() && IsBlank(text.back())) {
+        text.remove_suffix(1);
+    }
+    return text;
 }
 
 // The text up to the closing quote. What follows that quote does not count; without one the value
@@ -74,12 +80,18 @@ bool TakeLine(std::string_view &text, Line &line) {
 }
 
 // Takes lines off the front of the text up to the first one with the key. False when there is none.
+// A line that does not hold the key's characters anywhere is passed over unread.
 bool TakeLineWithKey(std::string_view &text, std::string_view key, Line &line) {
-    while (TakeLine(text, line)) {
+    for (std::size_t at = text.find(key); at != std::string_view::npos; at = text.find(key)) {
+        text.remove_prefix(text.substr(0, at).rfind('\n') + 1);  // npos + 1 is 0
+        if (!TakeLine(text, line)) {
+            return false;
+        }
         if (line.HasKey(key)) {
             return true;
         }
     }
+    text = {};
     return false;
 }
 
@@ -133,8 +145,11 @@ bool Read(const char *szPath, std::string &strText) {
 // The same for a file that may be missing: it then counts as empty.
 bool ReadForChange(const char *szPath, host::FoundFile &found, std::string &strText) {
     const host::Find find = host::FindFile(szPath, found);
-    return find == host::Find::kNoFile ||
-           (find == host::Find::kFile && host::ReadContent(found, strText));
+    const bool blRead = find == host::Find::kNoFile ||
+                        (find == host::Find::kFile && host::ReadContent(found, strText));
+    // A file system takes longer to replace a file that is still open.
+    found.file = host::FileDescriptor();
+    return blRead;
 }
 
 int SetValue(const char *szPath, std::string_view key, std::string_view value) {
@@ -144,6 +159,7 @@ int SetValue(const char *szPath, std::string_view key, std::string_view value) {
         return -1;
     }
     std::string strNew;
+    strNew.reserve(strOld.size() + key.size() + 2 * value.size() + sizeof("\n=\"\"\n"));
     Line line;
     std::string_view rest = strOld;
     if (TakeLineWithKey(rest, key, line)) {
@@ -152,7 +168,7 @@ int SetValue(const char *szPath, std::string_view key, std::string_view value) {
         }
         strNew.assign(strOld, 0, strOld.size() - rest.size() - line.text.size());
     } else {
-        strNew = strOld;
+        strNew.append(strOld);
         if (!strNew.empty() && strNew.back() != '\n') {
             strNew += '\n';
         }
@@ -169,12 +185,15 @@ int RemoveLines(const char *szPath, std::string_view key) {
         return -1;
     }
     std::string strNew;
+    strNew.reserve(strOld.size());
     Line line;
-    for (std::string_view rest = strOld; TakeLine(rest, line);) {
-        if (!line.HasKey(key)) {
-            strNew.append(line.text);
-        }
+    std::string_view rest = strOld;
+    std::string_view kept = rest;
+    while (TakeLineWithKey(rest, key, line)) {
+        strNew.append(kept, 0, kept.size() - rest.size() - line.text.size());
+        kept = rest;
     }
+    strNew.append(kept);
     return strNew.size() == strOld.size() ? 0 : host::ReplaceFile(found, strNew);
 }
 
@@ -183,17 +202,28 @@ int ReadPairs(const char *szPath, YLIBSZHASH **ppHash) {
     if (!Read(szPath, strText)) {
         return -1;
     }
-    std::unordered_set<std::string_view> keys;
+    // Of several lines with a key the first one holds: what it has set is not set again.
+    YLIBSZHASH &hash = **ppHash;
+    std::vector<bool> blOldSet(static_cast<std::size_t>(hash.nItem), false);
+    int keys = 0;
     Line line;
     for (std::string_view rest = strText; TakeLine(rest, line);) {
-        // Of several lines with a key the first one holds.
-        if (!line.key.empty() && keys.insert(line.key).second &&
-            YLIBCSzHashSetValue(ppHash, std::string(line.key).c_str(),
-                                ValueOf(line.value).c_str()) < 0) {
-            return -1;
+        if (line.key.empty()) {
+            continue;
+        }
+        std::string strValue = ValueOf(line.value);
+        const int before = hash.nItem;
+        const host::PlaceInHash place = host::FindOrAddKey(hash, line.key);
+        const bool blOld = place.index < blOldSet.size();
+        if (hash.nItem > before || (blOld && !blOldSet[place.index])) {
+            place.strValue.swap(strValue);
+            ++keys;
+        }
+        if (blOld) {
+            blOldSet[place.index] = true;
         }
     }
-    return static_cast<int>(keys.size());
+    return keys;
 }
 
 }  // namespace

@@ -5,15 +5,18 @@
 
 #include "../text_containers.h"
 
+#include <algorithm>
+#include <cstdint>
 #include <cstring>
+#include <deque>
 #include <functional>
-#include <map>
 #include <memory>
 #include <new>
 #include <string>
 #include <string_view>
 #include <vector>
 
+#include "hash_place.h"
 #include "last_error.h"
 #include "text_buffer.h"
 
@@ -23,16 +26,22 @@ struct YLIBSZLIST_ITEMS {
 };
 
 struct YLIBSZHASH_PAIRS {
-    using Map = std::map<std::string, std::string, std::less<>>;
+    struct Pair {
+        std::string strKey;
+        std::string strValue;
+        std::size_t hash = 0;
+    };
     YLIBSZHASH record = {0, this};
-    Map values;
-    std::vector<Map::pointer> inOrder;  // of the keys' coming; a map's pairs never move
+    std::deque<Pair> inOrder;  // of the keys' coming; what a deque holds never moves
+
+    // Where the keys stand in there, plus 1; 0 in a free slot. Their number is a power of two. A
+    // key has the first slot free for it from that of its hash on. At least half are free.
+    std::vector<std::uint32_t> slots;
 };
 
 namespace {
 
 constexpr const char *kFile = "text_containers";
-constexpr std::size_t kFirstPairs = 8;
 
 // A new record of the given kind whose sequence has room for about cbInitial bytes.
 template <typename Content, typename Sequence>
@@ -62,12 +71,12 @@ int Append(YLIBSZLIST &list, std::string_view text) {
 }
 
 // The pair at an index; null when there is none.
-YLIBSZHASH_PAIRS::Map::const_pointer PairAt(const YLIBSZHASH *pHash, int index) {
+const YLIBSZHASH_PAIRS::Pair *PairAt(const YLIBSZHASH *pHash, int index) {
     if (pHash == nullptr || index < 0 || index >= pHash->nItem) {
         HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
         return nullptr;
     }
-    return pHash->pPairs->inOrder[static_cast<std::size_t>(index)];
+    return &pHash->pPairs->inOrder[static_cast<std::size_t>(index)];
 }
 
 bool IsDelimiter(const char *szDelimiter) {
@@ -113,6 +122,37 @@ int Replace(const char *szText, const char *szOld, std::string_view replacement,
     return AppendWithin(cbMost, szRest, strResult) ? occurrences : -1;
 }
 
+// --- Slots of a hash ----------------------------------------------------------------------------
+
+// The key's slot, or the free one that would be its.
+std::uint32_t &SlotOf(YLIBSZHASH_PAIRS &pairs, std::string_view key, std::size_t hash) {
+    const std::size_t last = pairs.slots.size() - 1;
+    std::size_t at = hash & last;
+    while (pairs.slots[at] != 0) {
+        const YLIBSZHASH_PAIRS::Pair &pair = pairs.inOrder[pairs.slots[at] - 1];
+        if (pair.hash == hash && pair.strKey == key) {
+            break;
+        }
+        at = (at + 1) & last;
+    }
+    return pairs.slots[at];
+}
+
+// Makes room for one more key.
+void GrowSlots(YLIBSZHASH_PAIRS &pairs) {
+    constexpr std::size_t kFirstSlots = 64;
+    const auto keys = static_cast<std::size_t>(pairs.record.nItem);
+    if (2 * (keys + 1) <= pairs.slots.size()) {
+        return;
+    }
+    std::vector<std::uint32_t> slots(std::max(kFirstSlots, 2 * pairs.slots.size()), 0);
+    pairs.slots.swap(slots);
+    for (std::size_t i = 0; i < keys; ++i) {
+        const YLIBSZHASH_PAIRS::Pair &pair = pairs.inOrder[i];
+        SlotOf(pairs, pair.strKey, pair.hash) = static_cast<std::uint32_t>(i) + 1;
+    }
+}
+
 }  // namespace
 
 // --- Lists --------------------------------------------------------------------------------------
@@ -144,8 +184,20 @@ const char *YLIBCSzListGet(const YLIBSZLIST *pslList, int index) {
 
 // --- Hashes -------------------------------------------------------------------------------------
 
+host::PlaceInHash host::FindOrAddKey(YLIBSZHASH &hash, std::string_view key) {
+    YLIBSZHASH_PAIRS &pairs = *hash.pPairs;
+    GrowSlots(pairs);
+    const std::size_t keyHash = std::hash<std::string_view>()(key);
+    std::uint32_t &slot = SlotOf(pairs, key, keyHash);
+    if (slot == 0) {
+        pairs.inOrder.push_back({std::string(key), {}, keyHash});
+        slot = static_cast<std::uint32_t>(++hash.nItem);
+    }
+    return {slot - 1, pairs.inOrder[slot - 1].strValue};
+}
+
 YLIBSZHASH *YLIBCSzHashAlloc(int cbInitial) {
-    return NewRecord(cbInitial, &YLIBSZHASH_PAIRS::inOrder);
+    return NewRecord(cbInitial, &YLIBSZHASH_PAIRS::slots);
 }
 
 void YLIBCSzHashFree(YLIBSZHASH *pHash) {
@@ -158,19 +210,9 @@ int YLIBCSzHashSetValue(YLIBSZHASH **ppHash, const char *szKey, const char *szVa
     if (ppHash == nullptr || *ppHash == nullptr || szKey == nullptr || szValue == nullptr) {
         return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
     }
-    YLIBSZHASH_PAIRS &pairs = *(*ppHash)->pPairs;
     try {
-        const auto known = pairs.values.find(szKey);
-        if (known != pairs.values.end()) {
-            known->second = std::string(szValue);
-            return 0;
-        }
-        // The room first: once the pair is in, nothing may fail.
-        if (pairs.inOrder.size() == pairs.inOrder.capacity()) {
-            pairs.inOrder.reserve(2 * pairs.inOrder.size() + kFirstPairs);
-        }
-        pairs.inOrder.push_back(&*pairs.values.emplace(szKey, szValue).first);
-        ++(*ppHash)->nItem;
+        std::string strValue = szValue;
+        host::FindOrAddKey(**ppHash, szKey).strValue.swap(strValue);
         return 0;
     } catch (const std::bad_alloc &) {
         return HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
@@ -182,22 +224,24 @@ const char *YLIBCSzHashGetValue(const YLIBSZHASH *pHash, const char *szKey) {
         HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
         return nullptr;
     }
-    const auto known = pHash->pPairs->values.find(szKey);
-    if (known == pHash->pPairs->values.end()) {
+    YLIBSZHASH_PAIRS &pairs = *pHash->pPairs;
+    const std::uint32_t slot =
+        pairs.slots.empty() ? 0 : SlotOf(pairs, szKey, std::hash<std::string_view>()(szKey));
+    if (slot == 0) {
         HOST_FAIL(YLIBC_ERR_NOT_FOUND);
         return nullptr;
     }
-    return known->second.c_str();
+    return pairs.inOrder[slot - 1].strValue.c_str();
 }
 
 const char *YLIBCSzHashKeyAt(const YLIBSZHASH *pHash, int index) {
     const auto *const pPair = PairAt(pHash, index);
-    return pPair == nullptr ? nullptr : pPair->first.c_str();
+    return pPair == nullptr ? nullptr : pPair->strKey.c_str();
 }
 
 const char *YLIBCSzHashValueAt(const YLIBSZHASH *pHash, int index) {
     const auto *const pPair = PairAt(pHash, index);
-    return pPair == nullptr ? nullptr : pPair->second.c_str();
+    return pPair == nullptr ? nullptr : pPair->strValue.c_str();
 }
 
 // --- Text ---------------------------------------------------------------------------------------

@@ -91,7 +91,8 @@ Find FindFile(const char *szPath, FoundFile &found) {
     for (int links = 0; links <= kMaxLinks; ++links) {
         found.file = FileDescriptor(
             open(found.Path().c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
-        if (found.file.IsOpen()) {
+        found.blThere = found.file.IsOpen();
+        if (found.blThere) {
             return LookAtOpened(found);
         }
         if (errno == ENOENT) {

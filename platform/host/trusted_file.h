@@ -22,8 +22,9 @@ namespace host {
 struct FoundFile {
     std::string strFolder;  // "" or with a slash at its end
     std::string strName;
-    FileDescriptor file;      // for reading; not open when there is no file yet
-    struct stat status = {};  // of the open file
+    bool blThere = false;     // whether there is a file
+    FileDescriptor file;      // for reading; a caller who has read it may close it
+    struct stat status = {};  // of that file
 
     std::string Path() const { return strFolder + strName; }
 };
