@@ -16,7 +16,7 @@ namespace {
 
 // Of measured time, both sides together.
 constexpr double kRepetition_s = 0.4;
-constexpr int kRepetitions = 7;
+constexpr int kRepetitions = 5;
 
 // No growth, but for the noise of two measurements: on a busy disk each is off by up to a tenth.
 constexpr double kGrowthGoal = 1.2;
@@ -32,13 +32,18 @@ double Median(std::vector<double> &values) {
     return *middle;
 }
 
-// One turn: the seconds that the operation took.
+// One turn: the seconds that the operation took, or what it measured itself.
 double TakeTurn(const Side &side, const std::string &strSide) {
-    const auto begin = std::chrono::steady_clock::now();
-    const bool blDone = side.operation();
-    const std::chrono::duration<double> taken = std::chrono::steady_clock::now() - begin;
-    Require(blDone && (side.undo == nullptr || side.undo()), strSide + " failed");
-    return taken.count();
+    const double measure = side.measure != nullptr ? side.measure() : Seconds(side.operation);
+    Require(measure >= 0 && (side.undo == nullptr || side.undo()), strSide + " failed");
+    return measure;
+}
+
+// A ratio as it is shown: with as many decimals as its goal needs.
+std::string Shown(double ratio, double goal) {
+    char szText[32];
+    std::snprintf(szText, sizeof(szText), goal < 0.1 ? "%.4f" : "%.2f", ratio);
+    return szText;
 }
 
 // A row as Google Benchmark runs it.
@@ -47,6 +52,10 @@ class Contest : public benchmark::Fixture {
     explicit Contest(const Row &row) : m_row(row) {
         SetName(row.strName.c_str());
         UseManualTime();
+        if (row.pairs > 0) {
+            Iterations(row.pairs);
+            return;
+        }
         MinTime(kRepetition_s);
         Repetitions(kRepetitions);
     }
@@ -84,7 +93,7 @@ class Contest : public benchmark::Fixture {
 class Table : public benchmark::BenchmarkReporter {
   public:
     bool ReportContext(const Context & /*context*/) override {
-        std::printf("%-56s %5s %5s  %-6s  %s\n", "row", "ratio", "goal", "", "peer");
+        std::printf("%-56s %6s %6s  %-6s  %s\n", "row", "ratio", "goal", "", "peer");
         return true;
     }
 
@@ -94,7 +103,8 @@ class Table : public benchmark::BenchmarkReporter {
             if (run.error_occurred && m_failed.insert(row.strName).second) {
                 std::printf("%-56s cannot be measured: %s\n", row.strName.c_str(),
                             run.error_message.c_str());
-            } else if (run.aggregate_name == "median" && m_failed.count(row.strName) == 0) {
+            } else if (run.aggregate_name == (row.pairs > 0 ? "" : "median") &&
+                       m_failed.count(row.strName) == 0) {
                 ReportRatio(row, run.counters.at("ratio"));
             }
         }
@@ -119,11 +129,12 @@ class Table : public benchmark::BenchmarkReporter {
     }
 
     void Show(const std::string &strName, double ratio, double goal, const std::string &strPeer) {
-        const bool blMet = ratio <= goal;
+        const std::string strRatio = Shown(ratio, goal);
+        const bool blMet = std::stod(strRatio) <= goal;
         ++m_shown;
         m_met += blMet ? 1 : 0;
-        std::printf("%-56s %5.2f %5.2f  %-6s  %s\n", strName.c_str(), ratio, goal,
-                    blMet ? "met" : "missed", strPeer.c_str());
+        std::printf("%-56s %6s %6s  %-6s  %s\n", strName.c_str(), strRatio.c_str(),
+                    Shown(goal, goal).c_str(), blMet ? "met" : "missed", strPeer.c_str());
     }
 
     std::map<std::string, double> m_ratios;
@@ -144,6 +155,13 @@ void Require(bool blHolds, const std::string &strReason) {
     if (!blHolds) {
         throw std::runtime_error(strReason);
     }
+}
+
+double Seconds(const std::function<bool()> &operation) {
+    const auto begin = std::chrono::steady_clock::now();
+    const bool blDone = operation();
+    const std::chrono::duration<double> taken = std::chrono::steady_clock::now() - begin;
+    return blDone ? taken.count() : -1;
 }
 
 int Run(int argc, char **argv) {

@@ -5,8 +5,15 @@
 
 namespace bench {
 
+// Before all others: its child processes have to come from one that has not called the library.
+void AddColdCallRow();
+
+void AddCallRows();
 void AddConnectionRows();
 void AddCredentialRows();
+void AddDownloadRows(int mib);
+void AddFileRows();
+void AddLogRows();
 
 }  // namespace bench
 

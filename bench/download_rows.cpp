@@ -1,0 +1,156 @@
+// Files from the server and their digests, against the programs and the bare loop that do the same.
+
+#include <fcntl.h>
+#include <spawn.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <cstring>
+#include <fstream>
+#include <memory>
+#include <vector>
+
+#include "bare_exchange.h"
+#include "child_process.h"
+#include "generated_file.h"
+#include "ratio_table.h"
+#include "rows.h"
+#include "zeloqrmclient.h"
+
+namespace bench {
+namespace {
+
+constexpr const char *kApi = "ZELO.QRM.RPC.File";
+constexpr const char *kPath = "/qrm/file";
+constexpr const char *kName = "image";
+
+// In memory: what a disk does meanwhile is neither side's doing.
+constexpr const char *kDestination = "/dev/shm/zelo-bench-file";
+constexpr int kMiB = 1024 * 1024;
+constexpr int kPairs = 7;
+
+bool RemoveDestination() {
+    return unlink(kDestination) == 0;
+}
+
+// Runs a program with its output going nowhere. True when it went well.
+bool RunProgram(std::vector<const char *> arguments) {
+    posix_spawn_file_actions_t actions;
+    posix_spawn_file_actions_init(&actions);
+    posix_spawn_file_actions_addopen(&actions, STDOUT_FILENO, "/dev/null", O_WRONLY, 0);
+    arguments.push_back(nullptr);
+    pid_t pid = -1;
+    const int error = posix_spawnp(&pid, arguments[0], &actions, nullptr,
+                                   const_cast<char **>(arguments.data()), environ);
+    posix_spawn_file_actions_destroy(&actions);
+    int status = -1;
+    return error == 0 && waitpid(pid, &status, 0) == pid && status == 0;
+}
+
+bool Download(int mib) {
+    Json::Value params;
+    params["name"] = kName;
+    params["size"] = static_cast<Json::Int64>(mib) * kMiB;
+    return ZELOQRMClientGetFile(kDestination, kApi, 1, "get", params) == 0;
+}
+
+struct Target {
+    ServerProcess server;
+    std::string strUrl;
+    std::string strBody;
+
+    Target(int mib, const std::string &strProtocol)
+        : strUrl(server.Url(strProtocol, kPath)),
+          strBody(std::string(R"({"api":")") + kApi +
+                  R"(","method":"get","version":1,"params":{"name":")" + kName + R"(","size":)" +
+                  std::to_string(static_cast<long>(mib) * kMiB) + "}}") {
+        server.Join(strProtocol);
+    }
+
+    bool DownloadBare() const {
+        const int fd = open(kDestination, O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0644);
+        BareExchange bare;
+        bare.Post(strUrl, strBody, kServerToken);
+        bare.WriteTo(fd);
+        const bool blDone = bare.Perform();
+        return close(fd) == 0 && blDone;
+    }
+
+    bool DownloadByProgram() const {
+        const std::string strToken = std::string("Authorization: Bearer ") + kServerToken;
+        return RunProgram({"curl", "--silent", "--fail", "--noproxy", "*", "--cacert", kAuthority,
+                           "--header", strToken.c_str(), "--header",
+                           "Content-Type: application/json", "--data", strBody.c_str(), "--output",
+                           kDestination, strUrl.c_str()});
+    }
+};
+
+Pair DownloadPair(int mib, const std::string &strProtocol, bool (Target::*pfnPeer)() const) {
+    const auto pTarget = std::make_shared<Target>(mib, strProtocol);
+    return {{[pTarget, mib] { return Download(mib); }, RemoveDestination},
+            {[pTarget, pfnPeer] { return (*pTarget.*pfnPeer)(); }, RemoveDestination}};
+}
+
+// The most memory that the process has had so far, in KiB.
+double PeakMemory() {
+    std::ifstream status("/proc/self/status");
+    for (std::string strLine; std::getline(status, strLine);) {
+        if (strLine.rfind("VmHWM:", 0) == 0) {
+            return std::stod(strLine.substr(std::strlen("VmHWM:")));
+        }
+    }
+    return -1;
+}
+
+Pair MemoryPair(int mib) {
+    const auto pTarget = std::make_shared<Target>(mib, "https");
+    const auto peakOf = [pTarget](int size_mib) {
+        return [size_mib, pTarget] {
+            return InChild([size_mib] { return Download(size_mib) ? PeakMemory() : -1; });
+        };
+    };
+    return {{nullptr, RemoveDestination, peakOf(mib)}, {nullptr, RemoveDestination, peakOf(1)}};
+}
+
+Pair DigestPair(int mib) {
+    const devserver::GeneratedFile content(kName, static_cast<std::uint64_t>(mib) * kMiB);
+    std::ofstream file(kDestination, std::ios::binary);
+    for (std::uint64_t offset = 0; offset < content.Size(); offset += kMiB) {
+        file << content.Read(offset, kMiB);
+    }
+    file.close();
+    Require(file.good(), "cannot write the file to digest");
+    const std::shared_ptr<void> pRemoval(nullptr, [](void *) { RemoveDestination(); });
+    const auto subject = [pRemoval] {
+        char szDigest[33];
+        return GetFileMd5String(kDestination, szDigest, sizeof(szDigest)) == 0;
+    };
+    return {{subject, nullptr},
+            {[] {
+                 return RunProgram({"openssl", "md5", kDestination});
+             },
+             nullptr}};
+}
+
+}  // namespace
+
+void AddDownloadRows(int mib) {
+    const std::string strSize = std::to_string(mib) + " MiB";
+    for (const std::string strProtocol : {"http", "https"}) {
+        std::string strName = "ZELOQRMClientGetFile, " + strSize;
+        strName += ", " + strProtocol;
+        strName += ", ";
+        const auto add = [&](const char *szPeer, bool (Target::*pfnPeer)() const) {
+            AddRow({strName + szPeer, szPeer, 1.00,
+                    [=] { return DownloadPair(mib, strProtocol, pfnPeer); }, "", kPairs});
+        };
+        add("curl command", &Target::DownloadByProgram);
+        add("libcurl loop", &Target::DownloadBare);
+    }
+    AddRow({"ZELOQRMClientGetFile, memory for " + strSize, "memory for 1 MiB", 1.05,
+            [mib] { return MemoryPair(mib); }, "", kPairs});
+    AddRow({"GetFileMd5String, " + strSize, "openssl md5", 1.00, [mib] { return DigestPair(mib); },
+            "", kPairs});
+}
+
+}  // namespace bench
