@@ -95,7 +95,7 @@ void AddPlugins(CLI::App &app, Action &action) {
     pRun->add_option("ACTION", *pAction, "PRE or POST")
         ->required()
         ->check(CLI::IsMember({"PRE", "POST"}));
-    pRun->callback([pAction, &action] {
+    pRun->callback([pPlugin, pAction, &action] {
         action = [pAction](Report &report) { return RunPlugins(*pAction, report); };
     });
 }

@@ -79,6 +79,7 @@ Outcome Fetch(const std::string &strPath, const Options &options, Json::Value &p
     const int result =
         ZELOQRMClientGetFile(strPath, options.strApi, options.version, options.strMethod, params);
     ZELO::CredRequestUtil::SetProgressObserver(nullptr, nullptr);
+    progress.Clear();
     if (result != 0) {
         return Outcome::kFailed;
     }
@@ -88,11 +89,11 @@ Outcome Fetch(const std::string &strPath, const Options &options, Json::Value &p
 ExitCode Tell(Outcome outcome, const std::string &strPath, const Progress &progress,
               Report &report) {
     if (outcome == Outcome::kFailed) {
-        return report.Fail(
-            g_interrupted != 0
-                ? "interrupted"
-                : "the file could not be fetched: is this appliance joined, and does the server "
-                  "have the file? -v shows the reason");
+        return report.Fail(g_interrupted != 0
+                               ? "interrupted"
+                               : "the file could not be fetched: is this appliance joined, does "
+                                 "the server have the "
+                                 "file, and is there room for it? -v shows the reason");
     }
     report.Fact("path", strPath);
     report.Fact("unchanged", outcome == Outcome::kUnchanged);
@@ -134,6 +135,10 @@ class Workplace {
 // Through links to the file itself, so that a link stays one; absolute, so that it has a folder.
 bool ResolveDestination(const std::string &strPath, fs::path &destination, std::string &strError) {
     std::error_code error;
+    if (strPath.empty()) {
+        strError = "the path is empty: name the file";
+        return false;
+    }
     destination = fs::weakly_canonical(fs::absolute(strPath, error), error);
     if (!error && (fs::is_directory(destination, error) || !destination.has_filename())) {
         strError = "'" + strPath + "' is a directory: name the file in it";
@@ -142,7 +147,7 @@ bool ResolveDestination(const std::string &strPath, fs::path &destination, std::
     const std::string strFolder = destination.parent_path();
     constexpr int kOwner = 1024;
     constexpr int kGroup = 100;
-    if (strPath.empty() || ZELOFSMkdirP(strFolder.c_str(), 0, 1, kOwner, kGroup, 0755) < 0) {
+    if (ZELOFSMkdirP(strFolder.c_str(), 0, 1, kOwner, kGroup, 0755) < 0) {
         strError =
             "cannot create the directory of '" + strPath + "': name a path that can be written";
         return false;

@@ -51,7 +51,9 @@ Indicator ReadCredential(const Flag &flag, const char *szName, const char *szApp
     const long id = ZELOCredIDGetByApplication(szApplication);
     const CredHandle pCred(ZELOCredAlloc());
     FixedText<1024> host;
-    if (id < 0) {
+    if (!IsStoreReadable()) {
+        indicator.strHolds = "cannot be read (-v names the store)";
+    } else if (id < 0) {
         indicator.strHolds = "not stored";
     } else if (pCred != nullptr && ZELOCredLoad(id, pCred.get()) >= 0 &&
                ZELOCredItemGetHost(host.Buffer(), FixedText<1024>::Size(), pCred.get()) == 0) {

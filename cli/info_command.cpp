@@ -47,6 +47,9 @@ bool SetVariable(const std::string &strText, YLIBSZHASH **ppHash) {
 ExitCode Notify(const std::string &strTag, const std::vector<std::string> &variables,
                 Report &report) {
     constexpr int kHashSize = 512;
+    if (strTag.empty()) {
+        return report.Fail("the tag is empty: name the event, such as QRMClientConnectFailed");
+    }
     HashHandle hash(YLIBCSzHashAlloc(kHashSize));
     for (const std::string &strVariable : variables) {
         if (!SetVariable(strVariable, hash.Address())) {

@@ -103,7 +103,8 @@ std::vector<Step> Steps(const Json::Value &joinInfo) {
     const std::string strSerial = joinInfo["sn"].asString();
     return {
         {"the server did not accept the join (check token and serial number; -v shows its "
-         "answer), or the appliance's model, version or ports could not be read (check "
+         "answer), its address could not be stored, or the appliance's model, version or ports "
+         "could not be read (check "
          "/etc.defaults/zeloinfo.conf, /etc.defaults/VERSION and /etc/zeloinfo.conf)",
          [&joinInfo] { return ZELOQRMClientSendCreateClient(joinInfo) == 0; }},
         {"the serial number could not be stored", [strSerial] { return StoreSerial(strSerial); }},
@@ -142,7 +143,7 @@ void TellServer(const Json::Value &sn, Report &report) {
 
 // A server has answered. What is left of an earlier membership goes first: a credential that is
 // stored already would hide the new one.
-ExitCode Enrol(const Json::Value &joinInfo, Report &report) {
+ExitCode Enrol(const Json::Value &joinInfo, bool blJoined, Report &report) {
     LeaveRequest before;
     before.blRejoin = true;
     if (!LeaveWholly(before)) {
@@ -152,7 +153,9 @@ ExitCode Enrol(const Json::Value &joinInfo, Report &report) {
     }
     for (const Step &step : Steps(joinInfo)) {
         if (!step.Take()) {
-            return FailAndUndo(step.szFailed, report);
+            const std::string strBefore =
+                blJoined ? std::string("; the membership before has ended") : std::string();
+            return FailAndUndo(step.szFailed + strBefore, report);
         }
     }
     TellServer(joinInfo["sn"], report);
@@ -179,13 +182,17 @@ ExitCode Join(const Options &options, Report &report) {
                            "' or any other candidate, nothing was changed: check address, ports "
                            "and certificate; -v shows the reason of each attempt");
     }
+    const MembershipTurn turn;
+    if (!turn.IsTaken()) {
+        return report.Fail("another program is joining or leaving: try again when it is done");
+    }
     const bool blJoined = ZELOQRMClientStatus() == 1;
     report.Member("was_joined", blJoined);
     if (blJoined && !options.blAgain) {
         report.Say("This appliance is joined already, nothing was changed; --again joins anew.");
         return report.Done();
     }
-    return Enrol(joinInfo, report);
+    return Enrol(joinInfo, blJoined, report);
 }
 
 }  // namespace

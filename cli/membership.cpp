@@ -2,11 +2,13 @@
 
 #include <sys/random.h>
 
+#include <csignal>
 #include <cstdlib>
 #include <ctime>
 #include <filesystem>
 
 #include "credential_store.h"
+#include "file_lock.h"
 #include "fixed_text.h"
 #include "json_text.h"
 #include "key_value_file.h"
@@ -86,6 +88,32 @@ bool StoreSerial(const std::string &strSerial) {
            ZELOCredSave(pCred.get()) >= 0;
 }
 
+MembershipTurn::MembershipTurn() {
+    constexpr const char *kLock = "/tmp/qrmctl.membership.lock";
+    constexpr int kTimeout_s = 120;
+    sigset_t ends;
+    sigemptyset(&ends);
+    for (int signal : {SIGINT, SIGTERM, SIGHUP}) {
+        sigaddset(&ends, signal);
+    }
+    pthread_sigmask(SIG_BLOCK, &ends, &m_before);
+    static_cast<void>(YLIBCFileLockTimeByFile(kLock, 1, kTimeout_s, &m_handle));
+}
+
+MembershipTurn::~MembershipTurn() {
+    if (m_handle >= 0) {
+        YLIBCFileUnlockByFile(m_handle);
+    }
+    pthread_sigmask(SIG_SETMASK, &m_before, nullptr);
+}
+
+bool IsStoreReadable() {
+    ZELO_CRED *pList = nullptr;
+    const int count = ZELOCredListGet(&pList, ZELOCredKeepByApplication, kServerApplication);
+    const CredListHandle list(pList);
+    return count >= 0;
+}
+
 bool StoreServerSession(const std::string &strToken) {
     return StoreSession(ZELOCredIDGetByApplication(kServerApplication), strToken);
 }
@@ -129,6 +157,9 @@ bool SetJoinFlag(const char *szValue) {
 }
 
 bool LeaveWholly(const LeaveRequest &request) {
+    if (!IsStoreReadable()) {
+        return false;
+    }
     // A flag that cannot be judged counts as not joined whatever else there is.
     if (YLIBCFileCheckKeyValue(kConfigFile, kJoinFlag, "yes", 0) < 0 && !SetJoinFlag("no")) {
         return false;

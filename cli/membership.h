@@ -4,6 +4,7 @@
 #ifndef QRMCTL_MEMBERSHIP_H
 #define QRMCTL_MEMBERSHIP_H
 
+#include <csignal>
 #include <string>
 
 namespace qrmctl {
@@ -36,6 +37,27 @@ bool AddClientSessions();
 bool CreateServiceAccount();
 
 bool SetJoinFlag(const char *szValue);
+
+// A turn at changing the membership: other programs that take one wait, and a signal that would end
+// this one is put off until the change is whole.
+class MembershipTurn {
+  public:
+    MembershipTurn();
+    ~MembershipTurn();
+    MembershipTurn(const MembershipTurn &) = delete;
+    MembershipTurn &operator=(const MembershipTurn &) = delete;
+
+    // False when another program has kept its turn for too long.
+    bool IsTaken() const { return m_handle >= 0; }
+
+  private:
+    int m_handle = -1;
+    sigset_t m_before = {};
+};
+
+// Whether the credential store can be read. A store that cannot looks like an empty one to the
+// look-ups, and nothing in it could be removed.
+bool IsStoreReadable();
 
 struct LeaveRequest {
     bool blRejoin = false;

@@ -36,10 +36,12 @@ std::string TimeText(double seconds) {
 
 Progress::Progress(bool blShow) : m_blShow(blShow && isatty(STDERR_FILENO) == 1) {}
 
-Progress::~Progress() {
+void Progress::Clear() {
     if (m_blShow && m_drawn != Clock::time_point()) {
         std::fputs("\r\033[K", stderr);
+        std::fflush(stderr);
     }
+    m_drawn = Clock::time_point();
 }
 
 void Progress::Update(long long cbDone, long long cbExpected) {

@@ -11,9 +11,12 @@ class Progress {
   public:
     // blShow: draw a line on standard error, when that is a terminal.
     explicit Progress(bool blShow);
-    ~Progress();  // takes the line away
+    ~Progress() { Clear(); }
     Progress(const Progress &) = delete;
     Progress &operator=(const Progress &) = delete;
+
+    // Takes the line away, before anything else is printed.
+    void Clear();
 
     // Takes the bytes so far and the bytes to expect, -1 when nobody knows. Draws when it is time.
     void Update(long long cbDone, long long cbExpected);

@@ -56,6 +56,10 @@ ExitCode Status(bool blExplain, Report &report) {
 }
 
 ExitCode Leave(const LeaveRequest &request, Report &report) {
+    const MembershipTurn turn;
+    if (!turn.IsTaken()) {
+        return report.Fail("another program is joining or leaving: try again when it is done");
+    }
     const bool blJoined = ZELOQRMClientStatus() != 0;
     if (!LeaveWholly(request)) {
         return report.Fail(

@@ -18,6 +18,7 @@ using json_text::Member;
 constexpr const char *kDiscoveryPath = "/qrm/discover";
 constexpr const char *kDiscoveryMethod = "discover";
 
+constexpr const char *kFilePath = "/qrm/file";
 constexpr const char *kFileType = "application/octet-stream";
 constexpr std::int64_t kMaxFile = std::int64_t{1} << 40U;
 constexpr std::size_t kMd5Digits = 32;
@@ -148,7 +149,7 @@ const DevServer::Route DevServer::kRoutes[] = {
     {"ZELO.QRM.RPC", 1, "/qrm/rpc", "join", false, &DevServer::Join},
     {"ZELO.QRM.RPC", 1, "/qrm/rpc", "info", true, &DevServer::Info},
     {"ZELO.QRM.RPC.ClientInfo", 1, "/qrm/client-info", "update", true, &DevServer::Update},
-    {"ZELO.QRM.RPC.File", 1, "/qrm/file", "get", true, &DevServer::File},
+    {"ZELO.QRM.RPC.File", 1, kFilePath, "get", true, &DevServer::File},
     {"ZELO.QRM.RPC.Log", 1, "/qrm/log", "push", true, &DevServer::Push},
 };
 
@@ -307,11 +308,16 @@ Reply DevServer::HandleOrdinarily(const Call &call) {
 }
 
 Reply DevServer::CarryOut(const Call &call) {
+    // Where a file is expected a refusal must not be taken for it.
+    const bool blFile = call.strPath == kFilePath;
+    const auto refuse = [blFile](int code) {
+        return blFile ? RefuseFile(code, nullptr) : Refuse(code);
+    };
     int version = 0;
     const Json::Value &params = Member(call.body, "params");
     if (call.strApi.empty() || call.strMethod.empty() || !params.isObject() ||
         !json_text::ReadInt(Member(call.body, "version"), version)) {
-        return Refuse(kBadParameter);
+        return refuse(kBadParameter);
     }
     int code = kUnknownApi;
     for (const Route &route : kRoutes) {
@@ -322,14 +328,13 @@ Reply DevServer::CarryOut(const Call &call) {
             if (!route.blNeedsToken || call.strAuthorization == "Bearer " + m_options.token) {
                 return (this->*route.Carry)(params);
             }
-            return route.Carry == &DevServer::File ? RefuseFile(kNoPermission, "wrong access token")
-                                                   : Refuse(kNoPermission);
+            return refuse(kNoPermission);
         }
         if (code != kUnknownMethod) {
             code = version == route.version ? kUnknownMethod : kUnknownVersion;
         }
     }
-    return Refuse(code);
+    return refuse(code);
 }
 
 void DevServer::Record(const char *szScheme, const httplib::Request &request, const Call &call) {

@@ -258,6 +258,28 @@ TEST_F(Qrmctl, JoinTellsTheServerWhoTheApplianceIs) {
     }
 }
 
+TEST_F(Qrmctl, PluginsCanBeTriedWithoutLeaving) {
+    EXPECT_EQ(RunForJson({"plugins", "run", "disjoin", "PRE"}, 0)["result"], 0);
+    EXPECT_EQ(RunForJson({"plugins", "run", "disjoin", "POST"}, 0)["result"], 0);
+}
+
+TEST_F(Qrmctl, TwoJoinsAtOnceMakeOneMembership) {
+    run_program::Program first(Arguments{QRMCTL} + Join("0", s_strHttps));
+    run_program::Program second(Arguments{QRMCTL} + Join("0", s_strHttps));
+    EXPECT_EQ(first.Wait().status, 0);
+    EXPECT_EQ(second.Wait().status, 0);
+    EXPECT_EQ(Run({"status"}).status, 0);
+}
+
+TEST_F(Qrmctl, ADamagedStoreIsNotTakenForAnEmptyOne) {
+    EXPECT_EQ(Run(Join("0", s_strHttps)).status, 0);
+    Write(stored::kDatabase, "garbage, and long enough to be no empty file");
+    EXPECT_TRUE(Holds(Run({"status", "--explain"}).strOut, "cannot be read"));
+    EXPECT_EQ(Run({"leave"}).status, 1);
+    std::filesystem::remove(stored::kDatabase);
+    EXPECT_EQ(Run({"leave"}).status, 0);
+}
+
 TEST_F(Qrmctl, TheNextJoinClearsAwayAKilledOne) {
     devserver::NextAnswer late;
     late.method = "join";
@@ -265,8 +287,8 @@ TEST_F(Qrmctl, TheNextJoinClearsAwayAKilledOne) {
     s_pServer->AnswerNext(kApi, late);
     run_program::Program program(Arguments{QRMCTL} + Join("0", s_strHttps));
     ASSERT_TRUE(run_program::Until([] { return Holds(Requests(), "join"); }));
-    program.Signal(SIGTERM);
-    EXPECT_EQ(program.Wait().status, -SIGTERM);
+    program.Signal(SIGKILL);
+    EXPECT_EQ(program.Wait().status, -SIGKILL);
     EXPECT_EQ(Run({"status"}).status, 4);
 
     EXPECT_FALSE(RunForJson(Join("0", s_strHttps), 0)["was_joined"].asBool());
