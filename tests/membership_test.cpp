@@ -330,8 +330,6 @@ TEST_F(Membership, LeavingGoesOnFromWhereAnyStepFailed) {
     const Expected noPost = Row("", kPre, "", strFile + "Fail to execute disjoin plugin (POST)");
     Expected nothing = Row(kWhole, "");
     nothing.strResult = "1";
-    Expected unreleased = done;
-    unreleased.recordsKept = 1;
     Expected untold = done;
     untold.strStored.back() = '0';
     Expected noHash = untold;
@@ -365,7 +363,7 @@ TEST_F(Membership, LeavingGoesOnFromWhereAnyStepFailed) {
         {"YLIBPluginSetArgByInt#2", noPost},
         {"YLIBPluginAction#1", noPre},
         {"YLIBPluginAction#2", noPost},
-        {"YLIBPluginExit", unreleased},
+        {"YLIBPluginExit", done},
         {"YLIBCExec#2", stopped(kWhole, strFile + "Stop cache daemon fail")},
         {"ZELOCredIDGetByApplication#4", Row("ZELO.QRM", strBoth, "", "", false)},
         {"ZELOCredIDGetByApplication#5", Row("ZELO.NotificationCenter", strBoth)},
@@ -494,7 +492,7 @@ TEST_F(Membership, ThePlugInInterfaceSurvivesEveryFailingCall) {
           {"YLIBPluginSetArgByInt", refused},
           {"YLIBPluginSetArg", refused},
           {"YLIBPluginAction", refused},
-          {"YLIBPluginExit", {"0 0 0", "", "pre 0 <> <> 0 <> 0 0 0\n", 1}}}});
+          {"YLIBPluginExit", {"0 0 0", "", "pre 0 <> <> 0 <> 0 0 0\n"}}}});
 
     const auto argument = [](const char *szCondition, const std::function<int()> &call) {
         Forget();

@@ -470,8 +470,7 @@ TEST_F(SendWebapi, TheDownloadSurvivesEveryFailingCall) {
                   "CreateWebAPIRequestById(1, 'ZELO.QRM.RPC.File', 1, 'get', *)\n"
                   "GetURL(*)\n"
                   "SetRespStream(*, *, null)\n"
-                  "Process(*, 1, 0)\n"
-                  "fclose(*)",
+                  "Process(*, 1, 0)",
                   {"0", "", "100000"},
                   {{"ZELOFSMkdirP", {"-1", "Failed to prepare path [/tmp/got/deep] [E]", "3"}},
                    {"fopen64", untouched},
@@ -479,8 +478,7 @@ TEST_F(SendWebapi, TheDownloadSurvivesEveryFailingCall) {
                    {"CreateWebAPIRequestById", empty},
                    {"GetURL", {"0", "", "100000"}},
                    {"SetRespStream", empty},
-                   {"Process", empty},
-                   {"fclose", {"0", "", "100000", 1}}}});
+                   {"Process", empty}}});
 }
 
 TEST_F(SendWebapi, ADownloadTellsTheCopyThatItHas) {
