@@ -7,7 +7,7 @@
 namespace host {
 namespace {
 
-constexpr std::size_t kMaxBody = 16 * 1024 * 1024;
+constexpr std::size_t kMaxBody = 16UL * 1024 * 1024;
 constexpr long kStatusUnchanged = 304;
 
 bool IsSuccess(long status) {
