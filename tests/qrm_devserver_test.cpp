@@ -39,6 +39,7 @@ TEST_F(QrmDevserver, ServesWhatItsFilesNameUntilItIsToldToEnd) {
             run_program::Run({QRMCTL, "join", "-v", "--server", "localhost", "--http-port", "0",
                               "--https-port", strHttps, "--token-file", "token"});
         EXPECT_EQ(joined.status, 0) << joined.strErr;
+        EXPECT_EQ(run_program::Run({QRMCTL, "leave"}).status, 0);
         const Outcome second = run_program::Run(
             {DEVSERVER, "--token-file", "token", "--http-port", strHttp, "--ports-file", "ports"});
         EXPECT_EQ(second.status, 1);
