@@ -25,14 +25,15 @@ bool StoreSession(const std::string &strToken) {
            ZELOCredSessSave(pSess.get()) >= 0;
 }
 
-// The credential stored first is in force: one that is left from before would hide the new one, and
-// one that a failed join leaves would look like a membership.
-void RemoveCredential() {
-    const long id = ZELOCredIDGetByApplication(kApplication);
-    if (id >= 0) {
-        ZELOCredSessRemoveByID(id);
-        ZELOCredRemoveByID(id);
+// The credential stored first is in force: one that is left from before would hide the new one and
+// take its token, and one that a failed join leaves would look like a membership.
+bool RemoveCredentials() {
+    for (long id = -1; (id = ZELOCredIDGetByApplication(kApplication)) >= 0;) {
+        if (ZELOCredSessRemoveByID(id) < 0 || ZELOCredRemoveByID(id) < 0) {
+            return false;
+        }
     }
+    return true;
 }
 
 }  // namespace
@@ -50,9 +51,12 @@ int main(int argc, char **argv) {
     joinInfo["sn"] = argv[3];
     joinInfo["access_token"] = strToken;
 
-    RemoveCredential();
+    if (!RemoveCredentials()) {
+        std::cerr << "What is stored from before cannot be removed; the system log says why.\n";
+        return 1;
+    }
     if (ZELOQRMClientSendCreateClient(joinInfo) != 0 || !StoreSession(strToken)) {
-        RemoveCredential();
+        RemoveCredentials();
         std::cerr << "Could not join " << argv[1] << "; the system log says why.\n";
         return 1;
     }
