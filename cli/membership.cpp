@@ -91,13 +91,14 @@ bool StoreSerial(const std::string &strSerial) {
 MembershipTurn::MembershipTurn() {
     constexpr const char *kLock = "/tmp/qrmctl.membership.lock";
     constexpr int kTimeout_s = 120;
+    // Waiting can be interrupted; only the change itself cannot.
+    static_cast<void>(YLIBCFileLockTimeByFile(kLock, 1, kTimeout_s, &m_handle));
     sigset_t ends;
     sigemptyset(&ends);
     for (int signal : {SIGINT, SIGTERM, SIGHUP}) {
         sigaddset(&ends, signal);
     }
     pthread_sigmask(SIG_BLOCK, &ends, &m_before);
-    static_cast<void>(YLIBCFileLockTimeByFile(kLock, 1, kTimeout_s, &m_handle));
 }
 
 MembershipTurn::~MembershipTurn() {
