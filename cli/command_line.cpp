@@ -1,0 +1,47 @@
+#include "command_line.h"
+
+namespace qrmctl {
+namespace {
+
+// Every command at every level takes the common options, so that they may stand anywhere.
+void AddCommonOptions(CLI::App &app, CommonOptions &options) {
+    app.add_flag("--json", options.blJson, "Print one JSON object");
+    app.add_flag("-v", options.blVerbose, "Show the library's log lines on standard error");
+    for (CLI::App *pCommand : app.get_subcommands(nullptr)) {
+        AddCommonOptions(*pCommand, options);
+    }
+}
+
+// A misspelt command or option is what the user has to know, not what is missing because of it.
+std::string UsageMessage(const CLI::App *pApp, const CLI::Error &error) {
+    const std::vector<std::string> unknown = pApp->remaining(true);
+    const std::string strWhat =
+        unknown.empty() ? error.what() : "'" + unknown.front() + "' is no command or option here";
+    return "qrmctl: " + Printable(strWhat) +
+           "; 'qrmctl --help' shows the commands, 'qrmctl COMMAND --help' the options of one\n";
+}
+
+}  // namespace
+
+void AddCommandLine(CLI::App &app, Action &action, CommonOptions &options) {
+    app.require_subcommand(1);
+    app.failure_message(UsageMessage);
+    AddTestConnection(app, action);
+    AddJoin(app, action);
+    AddStatus(app, action);
+    AddLeave(app, action);
+    AddCredential(app, action);
+    AddCall(app, action);
+    AddUpdate(app, action);
+    AddGetFile(app, action);
+    AddLog(app, action);
+    AddInfo(app, action);
+    AddNotify(app, action);
+    AddAccount(app, action);
+    AddWelcome(app, action);
+    AddPlugins(app, action);
+    AddIdle(app, action);
+    AddCommonOptions(app, options);
+}
+
+}  // namespace qrmctl
