@@ -11,25 +11,34 @@ namespace qrmctl {
 namespace {
 
 ExitCode Create(Report &report) {
+    Report::Stage("creating the service account");
+    Report::Remedy(
+        "run 'qrmctl account create' again, which completes what was begun, or 'qrmctl leave'");
     if (!CreateServiceAccount()) {
-        return report.Fail("the service account could not be created; -v shows the reason");
+        return report.Fail(ErrorId::kAccountNotCreated,
+                           "the service account could not be created; -v shows the reason");
     }
     report.Say("The service account exists and is an administrator.");
     return report.Done();
 }
 
 ExitCode Delete(Report &report) {
+    Report::Stage("deleting the service account");
+    Report::Remedy("run 'qrmctl account delete' again, or 'qrmctl leave'");
     if (!ZELOQRMClientDeleteServerUser()) {
-        return report.Fail("the service account could not be deleted; -v shows the reason");
+        return report.Fail(ErrorId::kAccountNotDeleted,
+                           "the service account could not be deleted; -v shows the reason");
     }
     report.Say("There is no service account any more.");
     return report.Done();
 }
 
 ExitCode Welcome(const std::string &strUser, bool blShow, Report &report) {
+    Report::Stage("changing the settings of '" + strUser + "'");
     if (!ZELOQRMUserWelcomPage(strUser.c_str(), blShow)) {
-        return report.Fail("the settings of '" + strUser +
-                           "' could not be changed: is there such a user? -v shows the reason");
+        return report.Fail(ErrorId::kWelcomeNotChanged,
+                           "the settings of '" + strUser +
+                               "' could not be changed: is there such a user? -v shows the reason");
     }
     report.Say("The welcome pages of '" + strUser + (blShow ? "' are shown." : "' are hidden."));
     return report.Done();
@@ -43,15 +52,18 @@ ExitCode RunPlugins(const std::string &strAction, Report &report) {
     CopyToFit(server.szSn, sizeof(server.szSn), "TRY");
     server.lPort = 443;
     __tag_qrmclient_plugin_env__ env = {};
+    Report::Stage("running the plug-ins for " + strAction);
     const int ready = ZELOQRMClientPluginInit(&env, "qrm_client/disjoin", &server);
     const int result = ZELOQRMClientPlugin(
         strAction == "PRE" ? SDK_PLUGIN_ACTION_PRE : SDK_PLUGIN_ACTION_POST, &env);
     ZELOQRMClientPluginExit(&env);
     if (ready < 0) {
-        return report.Fail("the plug-ins cannot be made ready; -v shows the reason");
+        return report.Fail(ErrorId::kPluginsNotReady,
+                           "the plug-ins cannot be made ready; -v shows the reason");
     }
     report.Fact("result", result);
-    return result < 0 ? report.Fail("a plug-in failed; -v shows which") : report.Done();
+    return result < 0 ? report.Fail(ErrorId::kPluginFailed, "a plug-in failed; -v shows which")
+                      : report.Done();
 }
 
 void AddWelcomeChange(CLI::App &parent, Action &action, const char *szName, bool blShow) {

@@ -4,6 +4,7 @@
 
 #include "commands.h"
 #include "input_file.h"
+#include "joined_server.h"
 #include "json_text.h"
 #include "zeloqrmclient.h"
 
@@ -19,36 +20,59 @@ struct Options {
     std::string strHost;
 };
 
+// The server's own code, with its name.
+ExitCode Refused(const Json::Value &reply, Report &report) {
+    const int code = json_text::ErrorCode(reply);
+    const std::string strName = ServerErrorName(code);
+    report.Member("server_code", code);
+    report.Member("server_error", strName);
+    return report.Fail(ErrorId::kRefused, "the server refused the call with error code " +
+                                              std::to_string(code) + " (" + strName + ')');
+}
+
 ExitCode Call(const Options &options, Report &report) {
     Json::Value params;
     std::string strError;
+    Report::Stage("reading the parameters");
     if (!ReadParams(options.strParams, params, strError)) {
-        return report.Fail(strError);
+        return report.Fail(ErrorId::kBadInput, strError);
     }
+    ExitCode code = kFailed;
+    const std::optional<JoinedServer> server = RequireJoinedServer(report, code);
+    if (!server) {
+        return code;
+    }
+    Report::Stage("calling " + options.strApi + ' ' + options.strMethod + " at " +
+                  server->Address());
     Json::Value reply;
     if (ZELOQRMClientSendWebapi(reply, options.strApi, options.version, options.strMethod, params,
                                 options.blCached) != 0) {
-        return report.Fail(
-            "no usable reply from the server: is this appliance joined, and can it "
-            "reach the server? -v shows the reason");
+        return report.Fail(ErrorId::kNoReply,
+                           "no usable reply from the server at " + server->Address() +
+                               ": can this appliance reach it? -v shows the reason");
     }
     report.Document("reply", reply);
     if (!json_text::IsTrue(json_text::Member(reply, "success"))) {
-        return report.Fail("the server refused the call with error code " +
-                           std::to_string(json_text::ErrorCode(reply)));
+        return Refused(reply, report);
     }
     return report.Done();
 }
 
 ExitCode Update(const Options &options, Report &report) {
+    ExitCode code = kFailed;
+    const std::optional<JoinedServer> server = RequireJoinedServer(report, code);
+    if (!server) {
+        return code;
+    }
     Json::Value info(Json::objectValue);
     if (!options.strHost.empty()) {
         info["host"] = options.strHost;
     }
+    Report::Stage("updating this appliance's entry at " + server->Address());
     if (ZELOQRMClientSendSetClient(info) != 0) {
-        return report.Fail(
-            "the server did not take the update, or a fact of this appliance is "
-            "missing; -v shows the reason");
+        return report.Fail(ErrorId::kUpdateFailed,
+                           "the server did not take the update, or a fact of this appliance is "
+                           "missing; -v shows the reason");
     }
     report.Say("The server's entry for this appliance is up to date.");
     return report.Done();

@@ -14,6 +14,12 @@ bool IsPort(const Json::Value &value) {
     return json_text::ReadInt(value, port) && ZELO::APIValidator::IsPort(port);
 }
 
+// Port 0 is not tried.
+bool IsTried(const Json::Value &value) {
+    int port = 0;
+    return json_text::ReadInt(value, port) && port > 0;
+}
+
 // What keeps an entry from being tried; null when nothing does.
 const char *Flaw(const Json::Value &candidate) {
     if (!candidate.isObject()) {
@@ -55,6 +61,20 @@ bool ReadCandidates(const std::string &strFile, Report &report, Json::Value &can
     return true;
 }
 
+std::string CandidateNames(const Json::Value &candidates) {
+    std::string strNames;
+    for (const Json::Value &candidate : candidates) {
+        if (Flaw(candidate) != nullptr) {
+            continue;
+        }
+        const Json::Value &port =
+            IsTried(candidate["https_port"]) ? candidate["https_port"] : candidate["http_port"];
+        strNames +=
+            (strNames.empty() ? "" : ", ") + candidate["host"].asString() + ':' + port.asString();
+    }
+    return strNames;
+}
+
 void ForbidHttp(Json::Value &candidates) {
     for (Json::Value &candidate : candidates) {
         // A port of another type keeps the candidate out altogether.
@@ -66,9 +86,7 @@ void ForbidHttp(Json::Value &candidates) {
 
 bool HasSecurePort(const Json::Value &candidates) {
     for (const Json::Value &candidate : candidates) {
-        int port = 0;
-        if (Flaw(candidate) == nullptr &&
-            json_text::ReadInt(Member(candidate, "https_port"), port) && port > 0) {
+        if (Flaw(candidate) == nullptr && IsTried(Member(candidate, "https_port"))) {
             return true;
         }
     }

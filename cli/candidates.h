@@ -16,6 +16,9 @@ namespace qrmctl {
 bool ReadCandidates(const std::string &strFile, Report &report, Json::Value &candidates,
                     std::string &strError);
 
+// The candidates that are tried, such as "qrm.example:5001, 10.0.0.5:5001".
+std::string CandidateNames(const Json::Value &candidates);
+
 // Turns the port for plain HTTP of every candidate to 0.
 void ForbidHttp(Json::Value &candidates);
 

@@ -1,12 +1,32 @@
 #include "command_line.h"
 
+#include <charconv>
+
+#include "deadline.h"
+
 namespace qrmctl {
 namespace {
+
+constexpr double kStatusDeadline_s = 10;
+
+std::string DeadlineFlaw(const std::string &strSeconds) {
+    double seconds = 0;
+    const char *const szEnd = strSeconds.data() + strSeconds.size();
+    const auto [szRest, error] = std::from_chars(strSeconds.data(), szEnd, seconds);
+    const bool blValid =
+        error == std::errc() && szRest == szEnd && seconds > 0 && seconds <= kMaxDeadline_s;
+    return blValid ? "" : "'" + strSeconds + "' is no number of seconds above 0";
+}
 
 // Every command at every level takes the common options, so that they may stand anywhere.
 void AddCommonOptions(CLI::App &app, CommonOptions &options) {
     app.add_flag("--json", options.blJson, "Print one JSON object");
     app.add_flag("-v", options.blVerbose, "Show the library's log lines on standard error");
+    app.add_option("--deadline", options.deadline_s,
+                   "End after so many seconds, whatever it waits for (default: 10 for status, "
+                   "none for the others)")
+        ->type_name("SECONDS")
+        ->check(DeadlineFlaw);
     for (CLI::App *pCommand : app.get_subcommands(nullptr)) {
         AddCommonOptions(*pCommand, options);
     }
@@ -22,6 +42,11 @@ std::string UsageMessage(const CLI::App *pApp, const CLI::Error &error) {
 }
 
 }  // namespace
+
+double DeadlineOf(const CLI::App &app, const CommonOptions &options) {
+    const bool blStatus = options.deadline_s == 0 && app.got_subcommand("status");
+    return blStatus ? kStatusDeadline_s : options.deadline_s;
+}
 
 void AddCommandLine(CLI::App &app, Action &action, CommonOptions &options) {
     app.require_subcommand(1);

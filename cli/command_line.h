@@ -13,10 +13,14 @@ namespace qrmctl {
 struct CommonOptions {
     bool blJson = false;
     bool blVerbose = false;
+    double deadline_s = 0;  // 0: none is asked for
 };
 
 // Adds everything to the program. The action and the options are set when the line is parsed; both
 // have to outlive the program.
+// The deadline of the command that was chosen, in seconds; 0 for none.
+double DeadlineOf(const CLI::App &app, const CommonOptions &options);
+
 void AddCommandLine(CLI::App &app, Action &action, CommonOptions &options);
 
 }  // namespace qrmctl

@@ -6,6 +6,7 @@
 #include "commands.h"
 #include "credential_store.h"
 #include "input_file.h"
+#include "joined_server.h"
 #include "json_text.h"
 #include "zeloqrmclient.h"
 
@@ -16,15 +17,18 @@ using json_text::HasMember;
 using json_text::Member;
 
 ExitCode Show(bool blWithToken, Report &report) {
+    Report::Stage("reading the credential store");
     Json::Value cred(Json::objectValue);
     const bool blFound = blWithToken ? ZELOQRMClientGetServerCredentialWithToken(cred)
                                      : ZELOQRMClientGetServerCredential(cred);
     if (!blFound && HasMember(cred, "host")) {
-        return report.Fail("the server credential has no session: join again");
+        return report.Fail(ErrorId::kNoSession, "the server credential has no session: join again");
     }
     if (!blFound) {
-        return report.Fail(
-            "no server credential is stored (or the store cannot be read, see -v): join first");
+        const std::optional<ErrorId> flaw = StoreFlaw();
+        return flaw ? report.Fail(*flaw, StoreFlawText(*flaw))
+                    : report.Fail(ErrorId::kNoCredential,
+                                  "no server credential is stored: join first, with 'qrmctl join'");
     }
     for (const char *szName :
          {"protocol", "host", "port", "application", "sn", "access_token", "csrf_token"}) {
@@ -60,22 +64,28 @@ std::string Flaw(const Json::Value &cred, bool blComplete) {
 ExitCode Change(const std::string &strFile, bool blCreate, Report &report) {
     Json::Value cred;
     std::string strError;
+    Report::Stage("reading the credential '" + strFile + "'");
     if (!ReadJsonFile("credential", strFile, cred, strError)) {
-        return report.Fail(strError);
+        return report.Fail(ErrorId::kBadInput, strError);
     }
     const std::string strFlaw = Flaw(cred, blCreate);
     if (!strFlaw.empty()) {
-        return report.Fail("cannot use credential '" + strFile + "': " + strFlaw);
+        return report.Fail(ErrorId::kBadInput,
+                           "cannot use credential '" + strFile + "': " + strFlaw);
     }
+    Report::Stage("changing the credential store");
+    Report::Remedy("'qrmctl credential show' tells what is stored; run this again");
     const std::string strApplication = cred["application"].asString();
     const bool blBehind = blCreate && ZELOCredIDGetByApplication(strApplication.c_str()) >= 0;
     if (blCreate && !ZELOQRMClientCreateServerCredential(cred)) {
-        return report.Fail("the credential could not be stored; -v shows the reason");
+        return report.Fail(ErrorId::kCredentialNotStored,
+                           "the credential could not be stored; -v shows the reason");
     }
     if (!blCreate && !ZELOQRMClientUpdateServerCredential(cred)) {
         return report.Fail(
+            ErrorId::kCredentialNotChanged,
             "the credential could not be changed: is one stored for the application '" +
-            strApplication + "', with a session? -v shows more");
+                strApplication + "', with a session? -v shows more");
     }
     if (blBehind) {
         report.Warn("the credential that was stored for '" + strApplication +
@@ -86,8 +96,11 @@ ExitCode Change(const std::string &strFile, bool blCreate, Report &report) {
 }
 
 ExitCode Delete(Report &report) {
+    Report::Stage("changing the credential store");
+    Report::Remedy("run 'qrmctl credential delete' again");
     if (!ZELOQRMClientDeleteServerCredential()) {
-        return report.Fail("the credential could not be removed whole; -v shows the reason");
+        return report.Fail(ErrorId::kCredentialNotRemoved,
+                           "the credential could not be removed whole; -v shows the reason");
     }
     if (ZELOCredIDGetByApplication("ZELO.QRM") >= 0) {
         report.Warn("a server credential that was stored later is in force now: delete again");

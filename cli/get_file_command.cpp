@@ -13,8 +13,10 @@
 #include <memory>
 
 #include "commands.h"
+#include "deadline.h"
 #include "file_system.h"
 #include "input_file.h"
+#include "joined_server.h"
 #include "last_error.h"
 #include "progress.h"
 #include "web_api_request.h"
@@ -89,11 +91,12 @@ Outcome Fetch(const std::string &strPath, const Options &options, Json::Value &p
 ExitCode Tell(Outcome outcome, const std::string &strPath, const Progress &progress,
               Report &report) {
     if (outcome == Outcome::kFailed) {
-        return report.Fail(g_interrupted != 0
-                               ? "interrupted"
-                               : "the file could not be fetched: is this appliance joined, does "
-                                 "the server have the "
-                                 "file, and is there room for it? -v shows the reason");
+        return g_interrupted != 0
+                   ? report.Fail(ErrorId::kInterrupted, "interrupted")
+                   : report.Fail(ErrorId::kFetchFailed,
+                                 "the file could not be fetched: can this appliance reach the "
+                                 "server, does that have the file, and is there room for it? -v "
+                                 "shows the reason");
     }
     report.Fact("path", strPath);
     report.Fact("unchanged", outcome == Outcome::kUnchanged);
@@ -114,18 +117,21 @@ class Workplace {
             m_strFolder.clear();
         }
     }
-    ~Workplace() {
-        std::error_code ignored;
-        if (!m_strFolder.empty()) {
-            fs::remove_all(m_strFolder, ignored);
-        }
-    }
+    ~Workplace() { Remove(); }
     Workplace(const Workplace &) = delete;
     Workplace &operator=(const Workplace &) = delete;
 
     bool IsUsable() const { return !m_strFolder.empty(); }
     int Error() const { return m_error; }
     std::string File() const { return m_strFolder + "/file"; }
+
+    // Also while the file is being written.
+    void Remove() const {
+        std::error_code ignored;
+        if (!m_strFolder.empty()) {
+            fs::remove_all(m_strFolder, ignored);
+        }
+    }
 
   private:
     std::string m_strFolder;
@@ -172,11 +178,19 @@ bool PutInPlace(const std::string &strFile, const fs::path &destination) {
     return blDurable && std::rename(strFile.c_str(), destination.c_str()) == 0;
 }
 
-ExitCode GetBeside(const Options &options, Json::Value &params, Report &report) {
+std::string FetchStage(const Options &options, const JoinedServer &server) {
+    return "fetching the file from " + options.strApi + ' ' + options.strMethod + " at " +
+           server.Address();
+}
+
+ExitCode GetBeside(const Options &options, const JoinedServer &server, Json::Value &params,
+                   Report &report) {
+    Report::Remedy("'" + options.strPath + "' is as it was; give it more time with --deadline");
+    Report::Stage("preparing the place beside '" + options.strPath + "'");
     fs::path destination;
     std::string strError;
     if (!ResolveDestination(options.strPath, destination, strError)) {
-        return report.Fail(strError);
+        return report.Fail(ErrorId::kBadDestination, strError);
     }
     char szMd5[33] = {};
     if (GetFileMd5String(destination.c_str(), szMd5, sizeof(szMd5)) == 0) {
@@ -185,14 +199,17 @@ ExitCode GetBeside(const Options &options, Json::Value &params, Report &report) 
     const InterruptGuard guard;
     const Workplace workplace(destination);
     if (!workplace.IsUsable()) {
-        return report.Fail("cannot write beside '" + options.strPath +
-                           "': " + std::strerror(workplace.Error()));
+        return report.Fail(ErrorId::kBadDestination, "cannot write beside '" + options.strPath +
+                                                         "': " + std::strerror(workplace.Error()));
     }
+    const DeadlineCleanup cleanup([&workplace] { workplace.Remove(); });
+    Report::Stage(FetchStage(options, server));
     Progress progress(!report.IsJson());
     const Outcome outcome = Fetch(workplace.File(), options, params, progress);
+    Report::Stage("putting the file in place");
     if (outcome == Outcome::kFetched && !PutInPlace(workplace.File(), destination)) {
-        return report.Fail("cannot replace '" + options.strPath + "': " + std::strerror(errno) +
-                           "; it is as it was");
+        return report.Fail(ErrorId::kNotReplaced, "cannot replace '" + options.strPath + "': " +
+                                                      std::strerror(errno) + "; it is as it was");
     }
     return Tell(outcome, options.strPath, progress, report);
 }
@@ -200,12 +217,20 @@ ExitCode GetBeside(const Options &options, Json::Value &params, Report &report) 
 ExitCode GetFile(const Options &options, Report &report) {
     Json::Value params;
     std::string strError;
+    Report::Stage("reading the parameters");
     if (!ReadParams(options.strParams, params, strError)) {
-        return report.Fail(strError);
+        return report.Fail(ErrorId::kBadInput, strError);
+    }
+    ExitCode code = kFailed;
+    const std::optional<JoinedServer> server = RequireJoinedServer(report, code);
+    if (!server) {
+        return code;
     }
     if (!options.blInPlace) {
-        return GetBeside(options, params, report);
+        return GetBeside(options, *server, params, report);
     }
+    Report::Stage(FetchStage(options, *server));
+    Report::Remedy("'" + options.strPath + "' holds what had arrived; fetch it again");
     Progress progress(!report.IsJson());
     const InterruptGuard guard;
     const Outcome outcome = Fetch(options.strPath, options, params, progress);

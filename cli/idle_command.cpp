@@ -17,17 +17,22 @@ bool ReadNumber(const std::string &strText, unsigned long &number) {
 }
 
 ExitCode Get(Report &report) {
+    Report::Stage("reading the idle time");
     unsigned long idleTime = 0;
     if (ZELOQRMIdleTimeGet(idleTime) != 0) {
-        return report.Fail("the disks' idle time cannot be read; -v shows the reason");
+        return report.Fail(ErrorId::kIdleUnreadable,
+                           "the disks' idle time cannot be read; -v shows the reason");
     }
     report.Fact("idle_minutes", static_cast<Json::UInt64>(idleTime));
     return report.Done();
 }
 
 ExitCode Set(unsigned long idleTime, Report &report) {
+    Report::Stage("setting the idle time, with its lock");
+    Report::Remedy("'qrmctl idle get' tells what is set; run this again");
     if (ZELOQRMIdleTimeSet(idleTime) != 0) {
-        return report.Fail("the disks' idle time cannot be set; -v shows the reason");
+        return report.Fail(ErrorId::kIdleNotSet,
+                           "the disks' idle time cannot be set; -v shows the reason");
     }
     report.Fact("idle_minutes", static_cast<Json::UInt64>(idleTime));
     return report.Done();

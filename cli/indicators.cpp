@@ -1,6 +1,7 @@
 #include "indicators.h"
 
 #include "credential_store.h"
+#include "deadline.h"
 #include "fixed_text.h"
 #include "key_value_file.h"
 #include "membership.h"
@@ -130,12 +131,17 @@ Indicator ReadAccount(const Flag &flag) {
 std::vector<Indicator> ReadIndicators() {
     Flag flag = {};
     std::vector<Indicator> indicators;
+    EnterStage("reading the join flag");
     indicators.push_back(ReadFlag(flag));
+    EnterStage("reading the credential store");
     indicators.push_back(ReadCredential(flag, "server credential", kServerApplication, 1));
     indicators.push_back(
         ReadCredential(flag, "notification-center credential", kNotificationCenter, 3));
+    EnterStage("asking the cache daemon's script for its status");
     indicators.push_back(ReadDaemon(flag));
+    EnterStage("reading the web sessions");
     indicators.push_back(ReadSessions(flag));
+    EnterStage("reading the service account");
     indicators.push_back(ReadAccount(flag));
     return indicators;
 }

@@ -4,28 +4,49 @@
 #include <vector>
 
 #include "commands.h"
+#include "key_value_file.h"
 #include "platform_handles.h"
 #include "zeloqrmclient.h"
 
 namespace qrmctl {
 namespace {
 
+constexpr const char *kInfoFile = "/tmp/qrm_client.info";
+
+// Whether a key that has no value is there all the same.
+bool HasInfoKey(const std::string &strKey) {
+    return YLIBCFileCheckKeyValue(kInfoFile, strKey.c_str(), "", 0) == 1;
+}
+
 ExitCode Get(const std::string &strKey, Report &report) {
+    Report::Stage("reading the client info file");
     std::string strValue;
     if (!ZELOQRMClientGetInfo(strKey, strValue)) {
-        return report.Fail(
-            "the client info file cannot be read: no call to the server has had a "
-            "reply since this appliance was started, or it is damaged");
+        return report.Fail(ErrorId::kInfoUnreadable,
+                           "the client info file cannot be read: no call to the server has had a "
+                           "reply since this appliance was started, or it is damaged");
     }
-    report.Fact(strKey, strValue);
+    // The library gives an empty value for a key that is not there.
+    if (strValue.empty() && !HasInfoKey(strKey)) {
+        return report.Fail(ErrorId::kNoSuchKey, "the client info file has no key '" + strKey + "'");
+    }
+    if (report.IsJson()) {
+        report.Member("key", strKey);
+        report.Member("value", strValue);
+    } else {
+        report.Fact(strKey, strValue);
+    }
     return report.Done();
 }
 
 ExitCode Set(const std::string &strKey, const std::string &strValue, Report &report) {
+    Report::Stage("writing the client info file, with its lock");
+    Report::Remedy("'qrmctl info get' tells what is set; run this again");
     if (!ZELOQRMClientSetInfo(strKey, strValue)) {
-        return report.Fail("cannot set '" + strKey +
-                           "': neither key nor value may hold a line feed, the key no '=', and "
-                           "/tmp/qrm_client.info has to be writable");
+        return report.Fail(ErrorId::kInfoNotWritten,
+                           "cannot set '" + strKey +
+                               "': neither key nor value may hold a line feed, the key no '=', and "
+                               "/tmp/qrm_client.info has to be writable");
     }
     report.Say("'" + strKey + "' is set.");
     return report.Done();
@@ -48,15 +69,18 @@ ExitCode Notify(const std::string &strTag, const std::vector<std::string> &varia
                 Report &report) {
     constexpr int kHashSize = 512;
     if (strTag.empty()) {
-        return report.Fail("the tag is empty: name the event, such as QRMClientConnectFailed");
+        return report.Fail(ErrorId::kBadInput,
+                           "the tag is empty: name the event, such as QRMClientConnectFailed");
     }
     HashHandle hash(YLIBCSzHashAlloc(kHashSize));
     for (const std::string &strVariable : variables) {
         if (!SetVariable(strVariable, hash.Address())) {
-            return report.Fail("cannot use variable '" + strVariable +
-                               "': write it as NAME=VALUE, such as QRM_SERVER=qrm.example");
+            return report.Fail(ErrorId::kBadInput,
+                               "cannot use variable '" + strVariable +
+                                   "': write it as NAME=VALUE, such as QRM_SERVER=qrm.example");
         }
     }
+    Report::Stage("handing over the notification, with its hooks");
     SendNotification(strTag.c_str(), hash.Address());
     report.Say("The notification '" + strTag + "' is handed to the notification service.");
     return report.Done();

@@ -93,6 +93,7 @@ Json::Value AllCandidates(const Json::Value &joinInfo) {
 }
 
 struct Step {
+    const char *szStage;
     const char *szFailed;
     std::function<bool()> Take;
 };
@@ -102,34 +103,43 @@ std::vector<Step> Steps(const Json::Value &joinInfo) {
     const std::string strToken = joinInfo["access_token"].asString();
     const std::string strSerial = joinInfo["sn"].asString();
     return {
-        {"the server did not accept the join (check token and serial number; -v shows its "
+        {"joining: the server's answer",
+         "the server did not accept the join (check token and serial number; -v shows its "
          "answer), its address could not be stored, or the appliance's model, version or ports "
          "could not be read (check "
          "/etc.defaults/zeloinfo.conf, /etc.defaults/VERSION and /etc/zeloinfo.conf)",
          [&joinInfo] { return ZELOQRMClientSendCreateClient(joinInfo) == 0; }},
-        {"the serial number could not be stored", [strSerial] { return StoreSerial(strSerial); }},
-        {"the session could not be stored", [strToken] { return StoreServerSession(strToken); }},
-        {"the notification center's credential could not be stored",
+        {"storing the serial number", "the serial number could not be stored",
+         [strSerial] { return StoreSerial(strSerial); }},
+        {"storing the session", "the session could not be stored",
+         [strToken] { return StoreServerSession(strToken); }},
+        {"storing the notification center's credential",
+         "the notification center's credential could not be stored",
          [strToken] { return StoreNotificationCenter(strToken); }},
-        {"the cache daemon could not be started", StartCacheDaemon},
-        {"the web sessions could not be added", AddClientSessions},
-        {"the service account could not be created", CreateServiceAccount},
-        {"the join flag could not be set", [] { return SetJoinFlag("yes"); }},
-        {"the indicators of membership disagree after the join",
+        {"starting the cache daemon", "the cache daemon could not be started", StartCacheDaemon},
+        {"adding the web sessions", "the web sessions could not be added", AddClientSessions},
+        {"creating the service account", "the service account could not be created",
+         CreateServiceAccount},
+        {"setting the join flag", "the join flag could not be set",
+         [] { return SetJoinFlag("yes"); }},
+        {"judging the membership", "the indicators of membership disagree after the join",
          [] { return ZELOQRMClientStatus() == 1; }}};
 }
 
 // Leaves as if to join again, so that nobody is told of the end of a membership that never began.
 bool Undo() {
+    Report::Stage("undoing what was begun");
     LeaveRequest request;
     request.blRejoin = true;
     return LeaveWholly(request) && LeaveWholly(LeaveRequest());
 }
 
 ExitCode FailAndUndo(const std::string &strError, Report &report) {
-    return report.Fail(strError + (Undo() ? "; nothing of it stays stored"
-                                          : "; what came before could not be undone wholly: run "
-                                            "'qrmctl leave'"));
+    return Undo() ? report.Fail(ErrorId::kJoinFailed, strError + "; nothing of it stays stored")
+                  : report.Fail(ErrorId::kJoinNotUndone,
+                                strError +
+                                    "; what came before could not be undone wholly: run "
+                                    "'qrmctl leave'");
 }
 
 void TellServer(const Json::Value &sn, Report &report) {
@@ -144,14 +154,20 @@ void TellServer(const Json::Value &sn, Report &report) {
 // A server has answered. What is left of an earlier membership goes first: a credential that is
 // stored already would hide the new one.
 ExitCode Enrol(const Json::Value &joinInfo, bool blJoined, Report &report) {
+    Report::Stage("removing what is left of a membership before");
+    Report::Remedy(
+        "run 'qrmctl leave', which removes what was begun, or 'qrmctl join' again, which removes "
+        "it first");
     LeaveRequest before;
     before.blRejoin = true;
     if (!LeaveWholly(before)) {
         return report.Fail(
+            ErrorId::kRemainsNotRemoved,
             "what is left of a membership before could not be removed, no join was begun: -v shows "
             "the reason; run 'qrmctl leave' when its cause is mended");
     }
     for (const Step &step : Steps(joinInfo)) {
+        Report::Stage(step.szStage);
         if (!step.Take()) {
             const std::string strBefore =
                 blJoined ? std::string("; the membership before has ended") : std::string();
@@ -166,26 +182,35 @@ ExitCode Enrol(const Json::Value &joinInfo, bool blJoined, Report &report) {
 ExitCode Join(const Options &options, Report &report) {
     Json::Value joinInfo(Json::objectValue);
     std::string strError;
+    Report::Stage("reading the token file and the candidate list");
+    Report::Remedy("nothing was changed; mend what it waited for, or give it more time");
     if (!BuildJoinInfo(options, report, joinInfo, strError)) {
-        return report.Fail(strError);
+        return report.Fail(ErrorId::kBadInput, strError);
     }
     const Json::Value candidates = AllCandidates(joinInfo);
     if (!options.blAllowHttp && !HasSecurePort(candidates)) {
         return report.Fail(
+            ErrorId::kNoSecurePort,
             "no candidate has an https port, and the access token does not go over plain http: "
             "give --https-port, or accept the risk with --allow-http");
     }
     // Nothing is left, nor removed, for a server that cannot be had.
+    Report::Stage("asking " + CandidateNames(candidates) + " for the API '" + kApi + '\'');
     Json::Value connection;
     if (!ZELOQRMClientTestConnect(candidates, kApi, connection)) {
-        return report.Fail("no server answered at '" + options.strServer +
-                           "' or any other candidate, nothing was changed: check address, ports "
-                           "and certificate; -v shows the reason of each attempt");
+        return report.Fail(
+            ErrorId::kNoServer,
+            "no server answered at '" + options.strServer +
+                "' or any other candidate, nothing was changed: check address, ports "
+                "and certificate; -v shows the reason of each attempt");
     }
+    Report::Stage(kTurnStage);
     const MembershipTurn turn;
     if (!turn.IsTaken()) {
-        return report.Fail("another program is joining or leaving: try again when it is done");
+        return report.Fail(ErrorId::kBusy,
+                           "another program is joining or leaving: try again when it is done");
     }
+    Report::Stage("judging the membership");
     const bool blJoined = ZELOQRMClientStatus() == 1;
     report.Member("was_joined", blJoined);
     if (blJoined && !options.blAgain) {

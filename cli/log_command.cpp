@@ -4,6 +4,7 @@
 #include <vector>
 
 #include "commands.h"
+#include "joined_server.h"
 #include "json_text.h"
 #include "platform_handles.h"
 #include "zeloqrmclient.h"
@@ -57,11 +58,13 @@ bool ReadLevel(const std::string &strLevel, int &level) {
 }
 
 ExitCode Render(const Options &options, YLIBSZLIST *pslParams, Report &report) {
+    Report::Stage("reading the strings files");
     const char *szSection = options.strSection == "-" ? nullptr : options.strSection.c_str();
     Json::Value texts;
     if (ConvertLog(szSection, options.strKey.c_str(), pslParams, texts) != 0) {
-        return report.Fail("no strings file has the key '" + options.strKey + "' in the section '" +
-                           options.strSection + "'");
+        return report.Fail(ErrorId::kNoSuchText, "no strings file has the key '" + options.strKey +
+                                                     "' in the section '" + options.strSection +
+                                                     "'");
     }
     if (report.IsJson()) {
         report.Fact("log", texts);
@@ -76,24 +79,34 @@ ExitCode Render(const Options &options, YLIBSZLIST *pslParams, Report &report) {
 ExitCode Push(const Options &options, Report &report) {
     int level = 0;
     if (!ReadLevel(options.strLevel, level)) {
-        return report.Fail("there is no level '" + options.strLevel +
-                           "': give 0 to 7, or emerg, alert, crit, err, warning, notice, info or "
-                           "debug");
+        return report.Fail(
+            ErrorId::kNoSuchLevel,
+            "there is no level '" + options.strLevel +
+                "': give 0 to 7, or emerg, alert, crit, err, warning, notice, info or "
+                "debug");
     }
     constexpr int kListSize = 1024;
     ListHandle params(YLIBCSzListAlloc(kListSize));
     for (const std::string &strParam : options.params) {
         if (YLIBCSzListPush(params.Address(), strParam.c_str()) < 0) {
-            return report.Fail("out of memory");
+            return report.Fail(ErrorId::kOutOfMemory, "out of memory");
         }
     }
     if (options.blRender) {
         return Render(options, params.Get(), report);
     }
+    ExitCode code = kFailed;
+    const std::optional<JoinedServer> server = RequireJoinedServer(report, code);
+    if (!server) {
+        return code;
+    }
+    Report::Stage("pushing the log entry to " + server->Address());
+    Report::Remedy("the server may have the entry: look there before this is run again");
     const char *szSection = options.strSection == "-" ? nullptr : options.strSection.c_str();
     if (ZELOQRMClientLog(level, szSection, options.strKey.c_str(), params.Get(),
                          options.blExtraInfo ? options.strExtraInfo.c_str() : nullptr) != 0) {
-        return report.Fail("the server has not confirmed the log entry; -v shows the reason");
+        return report.Fail(ErrorId::kLogNotConfirmed,
+                           "the server has not confirmed the log entry; -v shows the reason");
     }
     report.Say("The server has the log entry.");
     return report.Done();

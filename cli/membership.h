@@ -38,6 +38,9 @@ bool CreateServiceAccount();
 
 bool SetJoinFlag(const char *szValue);
 
+// What the time counts for while a turn is waited for.
+constexpr const char *kTurnStage = "waiting for another program that joins or leaves";
+
 // A turn at changing the membership: other programs that take one wait, and a signal that would end
 // this one is put off until the change is whole.
 class MembershipTurn {

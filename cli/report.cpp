@@ -6,6 +6,7 @@
 #include <cstdio>
 #include <iostream>
 
+#include "deadline.h"
 #include "json_text.h"
 
 namespace qrmctl {
@@ -78,30 +79,41 @@ void Report::Warn(const std::string &strSentence) {
     std::cerr << "qrmctl: warning: " << Printable(strSentence) << '\n';
 }
 
+void Report::Stage(const std::string &strName) {
+    EnterStage(strName);
+}
+
+void Report::Remedy(const std::string &strRemedy) {
+    SetDeadlineRemedy(strRemedy);
+}
+
 ExitCode Report::Done(ExitCode code) {
     m_result["success"] = true;
-    PrintJson();
-    std::cout.flush();
-    if (!std::cout) {
+    if (!Print()) {
         std::cerr << "qrmctl: cannot write to standard output\n";
-        return kFailed;
+        return ErrorOf(ErrorId::kOutput).exitCode;
     }
     return code;
 }
 
-ExitCode Report::Fail(const std::string &strError) {
+ExitCode Report::Fail(ErrorId id, const std::string &strError) {
     m_result["success"] = false;
     m_result["error"] = strError;
-    PrintJson();
-    std::cout.flush();
+    m_result["error_id"] = ErrorOf(id).szId;
+    static_cast<void>(Print());
     std::cerr << "qrmctl: " << Printable(strError) << '\n';
-    return kFailed;
+    return ErrorOf(id).exitCode;
 }
 
-void Report::PrintJson() {
+// Puts everything out that is meant for standard output; the deadline strikes until it is.
+bool Report::Print() {
+    BeginOutput();
     if (m_blJson) {
         std::cout << json_text::ToLogText(m_result) << '\n';
     }
+    std::cout.flush();
+    StopDeadline();
+    return static_cast<bool>(std::cout);
 }
 
 }  // namespace qrmctl

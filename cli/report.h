@@ -7,13 +7,17 @@
 
 #include <string>
 
+#include "error_ids.h"
+
 namespace qrmctl {
 
-enum ExitCode { kDone = 0, kFailed = 1, kUsage = 2, kNotJoined = 3, kInconsistent = 4 };
+// "schema" of every JSON object. The number goes up when a member goes or changes its meaning, not
+// when one is added.
+constexpr const char *kSchema = "qrmctl/1";
 
 class Report {
   public:
-    explicit Report(bool blJson) : m_blJson(blJson) {}
+    explicit Report(bool blJson) : m_blJson(blJson) { m_result["schema"] = kSchema; }
 
     // Whether the result is for a program.
     bool IsJson() const { return m_blJson; }
@@ -33,12 +37,18 @@ class Report {
     // Something odd that does not end the command.
     void Warn(const std::string &strSentence);
 
+    // From here on the time counts for the stage with this name; a deadline that strikes names it.
+    static void Stage(const std::string &strName);
+
+    // What the operator is told to do when the deadline strikes from here on.
+    static void Remedy(const std::string &strRemedy);
+
     // Ends the command: prints the JSON object, when one is asked for, and gives the exit code.
     ExitCode Done(ExitCode code = kDone);
-    ExitCode Fail(const std::string &strError);
+    ExitCode Fail(ErrorId id, const std::string &strError);
 
   private:
-    void PrintJson();
+    bool Print();
 
     bool m_blJson;
     Json::Value m_result{Json::objectValue};

@@ -45,6 +45,9 @@ void Explain(Report &report) {
 }
 
 ExitCode Status(bool blExplain, Report &report) {
+    Report::Stage(
+        "judging the membership: configuration, credential store, cache daemon, web sessions and "
+        "service account");
     const int status = ZELOQRMClientStatus();
     report.Fact("status", VerdictName(status));
     if (blExplain) {
@@ -56,15 +59,19 @@ ExitCode Status(bool blExplain, Report &report) {
 }
 
 ExitCode Leave(const LeaveRequest &request, Report &report) {
+    Report::Stage(kTurnStage);
+    Report::Remedy("run 'qrmctl leave' again: what was removed stays removed");
     const MembershipTurn turn;
     if (!turn.IsTaken()) {
-        return report.Fail("another program is joining or leaving: try again when it is done");
+        return report.Fail(ErrorId::kBusy,
+                           "another program is joining or leaving: try again when it is done");
     }
+    Report::Stage("leaving: plug-ins, credentials, web sessions, cache daemon, account");
     const bool blJoined = ZELOQRMClientStatus() != 0;
     if (!LeaveWholly(request)) {
-        return report.Fail(
-            "a step of leaving failed, what came before it is done: -v shows which; "
-            "run 'qrmctl leave' again when its cause is mended");
+        return report.Fail(ErrorId::kLeaveFailed,
+                           "a step of leaving failed, what came before it is done: -v shows which; "
+                           "run 'qrmctl leave' again when its cause is mended");
     }
     report.Fact("was_joined", blJoined);
     report.Say(blJoined ? "This appliance has left the server."

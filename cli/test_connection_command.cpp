@@ -17,15 +17,18 @@ struct Options {
 ExitCode TestConnection(const Options &options, Report &report) {
     Json::Value candidates;
     std::string strError;
+    Report::Stage("reading the candidate list '" + options.strCandidates + "'");
     if (!ReadCandidates(options.strCandidates, report, candidates, strError)) {
-        return report.Fail(strError);
+        return report.Fail(ErrorId::kBadInput, strError);
     }
+    Report::Stage("asking " + CandidateNames(candidates) + " for the API '" + options.strApi + "'");
     Json::Value connection;
     if (!ZELOQRMClientTestConnect(candidates, options.strApi, connection)) {
-        return report.Fail("no candidate of '" + options.strCandidates +
-                           "' answered for the API '" + options.strApi +
-                           "': check addresses, ports and certificates; -v shows "
-                           "the reason of each attempt");
+        return report.Fail(ErrorId::kNoServer,
+                           "no candidate of '" + options.strCandidates +
+                               "' answered for the API '" + options.strApi +
+                               "': check addresses, ports and certificates; -v shows "
+                               "the reason of each attempt");
     }
     report.Fact("protocol", connection["protocol"]);
     report.Fact("host", connection["host"]);

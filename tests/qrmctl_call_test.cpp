@@ -45,7 +45,7 @@ class QrmctlCall : public joined::Joined {
 
 TEST_F(QrmctlCall, ACallPrintsTheReplyAndSaysWhetherItSucceeded) {
     EXPECT_EQ(Run({"call", "ZELO.QRM.RPC", "info"}, 0)["reply"]["data"]["name"], "qrm-devserver");
-    EXPECT_EQ(Run({"info", "get", "status"}, 0)["status"], "success");
+    EXPECT_EQ(Run({"info", "get", "status"}, 0)["value"], "success");
     EXPECT_EQ(Run({"call", "ZELO.QRM.RPC", "info", "--version", "2"}, 1)["reply"]["error"]["code"],
               104);
     std::ofstream("/tmp/files/params") << R"({"sn":"S","x":1})";
@@ -58,13 +58,26 @@ TEST_F(QrmctlCall, ACallPrintsTheReplyAndSaysWhetherItSucceeded) {
         EXPECT_NE(strError.find("arameters"), std::string::npos) << strError;
     }
     Run({"update"}, 1);
-    EXPECT_EQ(Run({"info", "get", "status"}, 0)["status"], "error");
+    EXPECT_EQ(Run({"info", "get", "status"}, 0)["value"], "error");
     Run({"info", "set", "key", "value"}, 0);
-    EXPECT_EQ(Run({"info", "get", "key"}, 0)["key"], "value");
+    EXPECT_EQ(Run({"info", "get", "key"}, 0)["value"], "value");
+    EXPECT_EQ(Run({"info", "get", "absent"}, 1)["error_id"], "no-such-key");
     Run({"info", "set", "a=b", "value"}, 1);
     Run({"notify", "QRMClientDetachSuccess", "QRM_SERVER=other"}, 0);
     EXPECT_NE(FileText(joined::kJournal).find("other"), std::string::npos);
     Run({"notify", "QRMClientDetachSuccess", "novalue"}, 1);
+}
+
+TEST_F(QrmctlCall, WithoutAServerEveryRequestSaysToJoin) {
+    fs::remove_all(stored::kFolder);
+    for (const Arguments &arguments :
+         {Arguments{"call", "ZELO.QRM.RPC", "info"}, Arguments{"update"},
+          Arguments{"log", "err", "-", "text"}, GetFile()}) {
+        const Json::Value result = Run(arguments, 1);
+        EXPECT_EQ(result["error_id"], "not-joined");
+        EXPECT_NE(result["error"].asString().find("qrmctl join"), std::string::npos);
+    }
+    EXPECT_FALSE(fs::exists(joined::kMarker)) << "nobody is told of a server that there is not";
 }
 
 TEST_F(QrmctlCall, ALogEntryAndAnIdleTimeAreTakenAsTheyAreTyped) {

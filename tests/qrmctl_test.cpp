@@ -72,7 +72,8 @@ class Qrmctl : public testing::Test {
         EXPECT_EQ(outcome.strOut.find('\n') + 1, outcome.strOut.size()) << outcome.strOut;
         Json::Value result;
         EXPECT_TRUE(json_text::FromString(outcome.strOut, result));
-        EXPECT_EQ(json_text::Member(result, "success"), status != 1) << outcome.strOut;
+        EXPECT_EQ(json_text::Member(result, "success"), status != 1 && status != 2)
+            << outcome.strOut;
         return result;
     }
     static void StoreBefore() {
@@ -110,7 +111,7 @@ devserver::DevServer *Qrmctl::s_pServer = nullptr;
 std::string Qrmctl::s_strHttp;
 std::string Qrmctl::s_strHttps;
 
-TEST_F(Qrmctl, WrongUsageIsToldOnStandardErrorAlone) {
+TEST_F(Qrmctl, WrongUsageIsToldToPeopleAndPrograms) {
     const struct {
         Arguments arguments;
         const char *szNamed;
@@ -125,11 +126,13 @@ TEST_F(Qrmctl, WrongUsageIsToldOnStandardErrorAlone) {
                 {Join("0", "https"), "https"},
                 {{"join", "--server", "", "--http-port", "0"}, "--server"}};
     for (const auto &row : rows) {
-        const Outcome outcome = Run(row.arguments + Arguments{"--json"});
+        const Outcome outcome = Run(row.arguments);
         EXPECT_EQ(outcome.status, 2);
         EXPECT_EQ(outcome.strOut, "");
-        EXPECT_EQ(outcome.strErr.rfind("qrmctl: ", 0), 0U) << outcome.strErr;
         EXPECT_TRUE(Holds(outcome.strErr, row.szNamed)) << outcome.strErr;
+        const Json::Value result = RunForJson(row.arguments, 2);
+        EXPECT_EQ(result["error_id"], "usage");
+        EXPECT_EQ(outcome.strErr, "qrmctl: " + result["error"].asString() + '\n');
     }
 }
 

@@ -1,0 +1,57 @@
+#include "joined_server.h"
+
+#include "credential_store.h"
+#include "json_text.h"
+#include "last_error.h"
+#include "membership.h"
+#include "zeloqrmclient.h"
+
+namespace qrmctl {
+
+std::optional<ErrorId> StoreFlaw() {
+    if (IsStoreReadable()) {
+        return std::nullopt;
+    }
+    return YLIBCErrGet() == YLIBC_ERR_STORE_DAMAGED ? ErrorId::kStoreDamaged
+                                                    : ErrorId::kStoreUnreadable;
+}
+
+std::string StoreFlawText(ErrorId flaw) {
+    return flaw == ErrorId::kStoreDamaged
+               ? "the credential store is damaged or of another format, and is left as it is: "
+                 "restore a copy, or run 'qrmctl leave', which sets it aside"
+               : "the credential store cannot be read; -v shows the reason";
+}
+
+std::string JoinedServer::Address() const {
+    const auto text = [](const Json::Value &value) {
+        return value.isString() ? value.asString() : json_text::ToLogText(value);
+    };
+    return text(protocol) + "://" + text(host) + ':' + text(port);
+}
+
+std::optional<JoinedServer> FindJoinedServer() {
+    Json::Value cred(Json::objectValue);
+    if (!ZELOQRMClientGetServerCredential(cred)) {
+        return std::nullopt;
+    }
+    using json_text::Member;
+    return JoinedServer{Member(cred, "host"), Member(cred, "port"), Member(cred, "protocol"),
+                        Member(cred, "sn")};
+}
+
+std::optional<JoinedServer> RequireJoinedServer(Report &report, ExitCode &code) {
+    Report::Stage("looking up the joined server in the credential store");
+    std::optional<JoinedServer> server = FindJoinedServer();
+    if (server) {
+        return server;
+    }
+    const std::optional<ErrorId> flaw = StoreFlaw();
+    code = flaw ? report.Fail(*flaw, StoreFlawText(*flaw))
+                : report.Fail(ErrorId::kNotJoined,
+                              "this appliance is not joined, there is no server to ask: run "
+                              "'qrmctl join'");
+    return std::nullopt;
+}
+
+}  // namespace qrmctl

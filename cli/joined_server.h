@@ -1,0 +1,40 @@
+// The server that this appliance is joined to, as it is stored.
+
+#ifndef QRMCTL_JOINED_SERVER_H
+#define QRMCTL_JOINED_SERVER_H
+
+#include <json/value.h>
+
+#include <optional>
+#include <string>
+
+#include "report.h"
+
+namespace qrmctl {
+
+// What is wrong with the credential store; nothing when it can be read, an empty one included.
+std::optional<ErrorId> StoreFlaw();
+
+// A sentence about that flaw.
+std::string StoreFlawText(ErrorId flaw);
+
+struct JoinedServer {
+    Json::Value host;  // null when it is not stored, as the others
+    Json::Value port;
+    Json::Value protocol;
+    Json::Value sn;  // this appliance's serial number there
+
+    // Such as "https://qrm.example:5001".
+    std::string Address() const;
+};
+
+// The server in force; nothing when none is stored, or the store cannot be read.
+std::optional<JoinedServer> FindJoinedServer();
+
+// The same for a command that cannot do without; when there is none, the command has failed, and
+// code is its exit code.
+std::optional<JoinedServer> RequireJoinedServer(Report &report, ExitCode &code);
+
+}  // namespace qrmctl
+
+#endif
