@@ -3,6 +3,7 @@
 #include "credential_store.h"
 #include "deadline.h"
 #include "fixed_text.h"
+#include "joined_server.h"
 #include "key_value_file.h"
 #include "membership.h"
 #include "platform_handles.h"
@@ -52,8 +53,10 @@ Indicator ReadCredential(const Flag &flag, const char *szName, const char *szApp
     const long id = ZELOCredIDGetByApplication(szApplication);
     const CredHandle pCred(ZELOCredAlloc());
     FixedText<1024> host;
-    if (!IsStoreReadable()) {
-        indicator.strHolds = "cannot be read (-v names the store)";
+    if (const std::optional<ErrorId> flaw = StoreFlaw()) {
+        indicator.strHolds = *flaw == ErrorId::kStoreDamaged
+                                 ? "damaged store; 'qrmctl leave' sets it aside"
+                                 : "cannot be read (-v names the store)";
     } else if (id < 0) {
         indicator.strHolds = "not stored";
     } else if (pCred != nullptr && ZELOCredLoad(id, pCred.get()) >= 0 &&

@@ -8,6 +8,7 @@
 #include "candidates.h"
 #include "commands.h"
 #include "input_file.h"
+#include "joined_server.h"
 #include "json_text.h"
 #include "membership.h"
 #include "serial_number.h"
@@ -210,6 +211,8 @@ ExitCode Join(const Options &options, Report &report) {
         return report.Fail(ErrorId::kBusy,
                            "another program is joining or leaving: try again when it is done");
     }
+    Report::Stage("looking for damage in the credential store");
+    ClearDamagedStore(report);
     Report::Stage("judging the membership");
     const bool blJoined = ZELOQRMClientStatus() == 1;
     report.Member("was_joined", blJoined);

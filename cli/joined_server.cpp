@@ -23,11 +23,27 @@ std::string StoreFlawText(ErrorId flaw) {
                : "the credential store cannot be read; -v shows the reason";
 }
 
+bool ClearDamagedStore(Report &report) {
+    std::string strPath;
+    if (!SetAsideDamagedStore(strPath)) {
+        return false;
+    }
+    report.Member("set_aside", strPath);
+    report.Warn("the credential store was damaged or of another format: it is set aside as '" +
+                strPath + "', an empty one takes its place");
+    return true;
+}
+
+std::string AsText(const Json::Value &value) {
+    return value.isString() ? value.asString() : json_text::ToLogText(value);
+}
+
+std::string JoinedServer::HostAndPort() const {
+    return AsText(host) + ':' + AsText(port);
+}
+
 std::string JoinedServer::Address() const {
-    const auto text = [](const Json::Value &value) {
-        return value.isString() ? value.asString() : json_text::ToLogText(value);
-    };
-    return text(protocol) + "://" + text(host) + ':' + text(port);
+    return AsText(protocol) + "://" + HostAndPort();
 }
 
 std::optional<JoinedServer> FindJoinedServer() {

@@ -18,11 +18,21 @@ std::optional<ErrorId> StoreFlaw();
 // A sentence about that flaw.
 std::string StoreFlawText(ErrorId flaw);
 
+// For the commands that may begin anew: sets a damaged store aside, and says where it is. Returns
+// whether there was one.
+bool ClearDamagedStore(Report &report);
+
+// A stored value as text: a text itself, anything else as JSON.
+std::string AsText(const Json::Value &value);
+
 struct JoinedServer {
     Json::Value host;  // null when it is not stored, as the others
     Json::Value port;
     Json::Value protocol;
     Json::Value sn;  // this appliance's serial number there
+
+    // Such as "qrm.example:5001".
+    std::string HostAndPort() const;
 
     // Such as "https://qrm.example:5001".
     std::string Address() const;

@@ -115,6 +115,28 @@ bool IsStoreReadable() {
     return count >= 0;
 }
 
+bool SetAsideDamagedStore(std::string &strPath) {
+    FixedText<1024> path;
+    if (ZELOCredStoreSetAside(path.Buffer(), FixedText<1024>::Size()) != 1) {
+        return false;
+    }
+    strPath = path.sz();
+    return true;
+}
+
+std::vector<std::string> StoresSetAside() {
+    constexpr int kListSize = 1024;
+    std::vector<std::string> paths;
+    ListHandle list(YLIBCSzListAlloc(kListSize));
+    if (list.Get() == nullptr || ZELOCredStoreListSetAside(list.Address()) < 0) {
+        return paths;
+    }
+    for (int i = 0; i < list.Get()->nItem; ++i) {
+        paths.emplace_back(YLIBCSzListGet(list.Get(), i));
+    }
+    return paths;
+}
+
 bool StoreServerSession(const std::string &strToken) {
     return StoreSession(ZELOCredIDGetByApplication(kServerApplication), strToken);
 }

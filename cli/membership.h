@@ -6,6 +6,7 @@
 
 #include <csignal>
 #include <string>
+#include <vector>
 
 namespace qrmctl {
 
@@ -61,6 +62,13 @@ class MembershipTurn {
 // Whether the credential store can be read. A store that cannot looks like an empty one to the
 // look-ups, and nothing in it could be removed.
 bool IsStoreReadable();
+
+// Sets a damaged credential store aside, so that leaving and joining can go on; strPath is where it
+// is now. False when nothing is damaged, or it cannot be set aside.
+bool SetAsideDamagedStore(std::string &strPath);
+
+// Where damaged stores were set aside, now and earlier.
+std::vector<std::string> StoresSetAside();
 
 struct LeaveRequest {
     bool blRejoin = false;

@@ -5,6 +5,7 @@
 
 #include "commands.h"
 #include "indicators.h"
+#include "joined_server.h"
 #include "membership.h"
 #include "zeloqrmclient.h"
 
@@ -17,6 +18,17 @@ const char *VerdictName(int status) {
 
 std::string Padded(const std::string &strText, std::size_t width) {
     return strText + std::string(width - std::min(width, strText.size()), ' ');
+}
+
+// Files of damaged stores stay until somebody looks at them.
+void TellSetAside(Report &report) {
+    Json::Value paths(Json::arrayValue);
+    for (const std::string &strPath : StoresSetAside()) {
+        paths.append(strPath);
+        report.Say("A damaged credential store was set aside as '" + strPath +
+                   "': restore what is needed of it, and remove it.");
+    }
+    report.Member("set_aside", paths);
 }
 
 void Explain(Report &report) {
@@ -42,6 +54,7 @@ void Explain(Report &report) {
         report.Say(strLine);
     }
     report.Member("indicators", indicators);
+    TellSetAside(report);
 }
 
 ExitCode Status(bool blExplain, Report &report) {
@@ -58,6 +71,31 @@ ExitCode Status(bool blExplain, Report &report) {
     return report.Done(status == 1 ? kDone : status == 0 ? kNotJoined : kInconsistent);
 }
 
+// Leaving is local: the server learns nothing of it.
+void TellEntry(const std::optional<JoinedServer> &server, bool blMember, Report &report) {
+    report.Member("entry_remains", blMember);
+    if (!blMember) {
+        return;
+    }
+    if (!server) {
+        report.Member("server", Json::Value());
+        report.Say(
+            "A server may still have an entry for this appliance; which one is not stored any "
+            "more.");
+        return;
+    }
+    Json::Value entry;
+    entry["host"] = server->host;
+    entry["port"] = server->port;
+    entry["sn"] = server->sn;
+    report.Member("server", entry);
+    report.Say("The server's entry for this appliance remains: look on " + server->HostAndPort() +
+               " for " +
+               (server->sn.isNull() ? "it; its serial number there was not stored"
+                                    : "the serial number '" + AsText(server->sn) + '\'') +
+               ", and remove it there.");
+}
+
 ExitCode Leave(const LeaveRequest &request, Report &report) {
     Report::Stage(kTurnStage);
     Report::Remedy("run 'qrmctl leave' again: what was removed stays removed");
@@ -66,6 +104,9 @@ ExitCode Leave(const LeaveRequest &request, Report &report) {
         return report.Fail(ErrorId::kBusy,
                            "another program is joining or leaving: try again when it is done");
     }
+    Report::Stage("looking up the joined server in the credential store");
+    const std::optional<JoinedServer> server = FindJoinedServer();
+    const bool blDamaged = ClearDamagedStore(report);
     Report::Stage("leaving: plug-ins, credentials, web sessions, cache daemon, account");
     const bool blJoined = ZELOQRMClientStatus() != 0;
     if (!LeaveWholly(request)) {
@@ -76,6 +117,7 @@ ExitCode Leave(const LeaveRequest &request, Report &report) {
     report.Fact("was_joined", blJoined);
     report.Say(blJoined ? "This appliance has left the server."
                         : "This appliance was not joined; nothing of a join is left.");
+    TellEntry(server, blJoined || blDamaged, report);
     return report.Done();
 }
 

@@ -28,6 +28,7 @@
 #define ZELO_PLATFORM_CREDENTIAL_STORE_H
 
 #include "api.h"
+#include "text_containers.h"
 
 // Both records are opaque; each port lays them out as it likes.
 struct ZELO_CRED;
@@ -103,6 +104,25 @@ ZELO_PLATFORM_API long ZELOCredIDGetByApplication(const char *szApplication);
 
 // Removes the record with this id, durably. One that is not there counts as removed.
 ZELO_PLATFORM_API int ZELOCredRemoveByID(long id);
+
+// --- A damaged store ----------------------------------------------------------------------------
+//
+// A store whose file is damaged or of another format is left as it is: operations on it fail with
+// YLIBC_ERR_STORE_DAMAGED until somebody restores a copy or sets it aside. Nothing but the
+// following operation sets it aside, and no other failure (a busy store, missing rights, a full
+// disk) counts as damage.
+
+// Looks through the whole store; where it is damaged, renames its file to one in the same folder
+// whose name says when, and never replaces another. The store is empty then.
+//
+// Returns 1 when it was set aside, with the new path in szPath, a buffer of cbPath bytes; 0 when
+// nothing is damaged; a negative value when that could not be found out or done; the operation may
+// be called again then.
+ZELO_PLATFORM_API int ZELOCredStoreSetAside(char *szPath, int cbPath);
+
+// Appends the paths of all files that were set aside and are still there, the oldest first. Returns
+// their number, negative on failure.
+ZELO_PLATFORM_API int ZELOCredStoreListSetAside(YLIBSZLIST **ppslPaths);
 
 // --- Sessions -----------------------------------------------------------------------------------
 

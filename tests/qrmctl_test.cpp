@@ -274,13 +274,70 @@ TEST_F(Qrmctl, TwoJoinsAtOnceMakeOneMembership) {
     EXPECT_EQ(Run({"status"}).status, 0);
 }
 
-TEST_F(Qrmctl, ADamagedStoreIsNotTakenForAnEmptyOne) {
-    EXPECT_EQ(Run(Join("0", s_strHttps)).status, 0);
-    Write(stored::kDatabase, "garbage, and long enough to be no empty file");
-    EXPECT_TRUE(Holds(Run({"status", "--explain"}).strOut, "cannot be read"));
-    EXPECT_EQ(Run({"leave"}).status, 1);
-    std::filesystem::remove(stored::kDatabase);
-    EXPECT_EQ(Run({"leave"}).status, 0);
+TEST_F(Qrmctl, ADamagedStoreIsSetAsideByLeavingAndJoiningAlone) {
+    const auto read = [] {
+        std::ifstream file(stored::kDatabase, std::ios::binary);
+        return std::string(std::istreambuf_iterator<char>(file), {});
+    };
+    const Arguments joinAgain = Join("0", s_strHttps);
+    const struct {
+        const char *szDamage;
+        std::function<std::string(std::string)> damage;
+        Arguments mend;
+    } rows[] = {
+        {"text", [](const std::string &) { return std::string(5000, 'x'); }, {"leave"}},
+        {"another format", [](std::string strFile) { return strFile.replace(60, 4, 4, '\7'); },
+         joinAgain},
+        {"cut", [](const std::string &strFile) { return strFile.substr(0, 4096); }, {"leave"}},
+        {"a page", [](std::string strFile) { return strFile.replace(4096, 4096, 4096, '\x55'); },
+         joinAgain}};
+    std::size_t cAside = 0;
+    for (const auto &row : rows) {
+        SCOPED_TRACE(row.szDamage);
+        ASSERT_EQ(Run(joinAgain).status, 0);
+        const std::string strDamaged = row.damage(read());
+        Write(stored::kDatabase, strDamaged);
+        Write(std::string(stored::kDatabase) + "-shm", "beside it");
+        for (const Arguments &arguments : {Arguments{"status"},
+                                           {"status", "--explain"},
+                                           {"credential", "show"},
+                                           {"call", kApi, "info"}}) {
+            Run(arguments);
+            EXPECT_EQ(read(), strDamaged) << "reading leaves it as it is";
+        }
+        EXPECT_TRUE(Holds(Run({"status", "--explain"}).strOut, "damaged store"));
+        EXPECT_EQ(RunForJson({"call", kApi, "info"}, 1)["error_id"], "store-damaged");
+
+        const Json::Value mended = RunForJson(row.mend, 0);
+        const std::string strAside = mended["set_aside"].asString();
+        EXPECT_EQ(strAside.rfind(std::string(stored::kDatabase) + ".damaged-2", 0), 0U) << strAside;
+        EXPECT_TRUE(std::filesystem::exists(strAside + "-shm"));
+        EXPECT_FALSE(std::filesystem::exists(std::string(stored::kDatabase) + "-shm"));
+        std::ifstream aside(strAside, std::ios::binary);
+        EXPECT_EQ(std::string(std::istreambuf_iterator<char>(aside), {}), strDamaged);
+        EXPECT_EQ(
+            RunForJson({"status", "--explain"}, row.mend == joinAgain ? 0 : 3)["set_aside"].size(),
+            ++cAside);
+        EXPECT_EQ(Run(joinAgain).status, 0);
+        EXPECT_EQ(Run({"leave"}).status, 0);
+    }
+}
+
+TEST_F(Qrmctl, LeavingTellsWhatItCannotUndo) {
+    EXPECT_EQ(Run(Join("0", s_strHttps) + Arguments{"--sn", "SN7"}).status, 0);
+    const Outcome outcome = Run({"leave"});
+    EXPECT_TRUE(Holds(outcome.strOut, "localhost:" + s_strHttps)) << outcome.strOut;
+    EXPECT_TRUE(Holds(outcome.strOut, "'SN7'")) << outcome.strOut;
+    EXPECT_EQ(RunForJson({"leave"}, 0)["entry_remains"], false);
+
+    // The server is gone.
+    const long id = stored::AddCredential("ZELO.QRM", "203.0.113.1", R"({"sn":"SN8"})");
+    stored::AddSession(id, "t");
+    const Json::Value left = RunForJson({"leave", "--deadline", "5"}, 0);
+    EXPECT_EQ(left["server"]["host"], "203.0.113.1");
+    EXPECT_EQ(left["server"]["port"], 443);
+    EXPECT_EQ(left["server"]["sn"], "SN8");
+    EXPECT_EQ(left["entry_remains"], true);
 }
 
 TEST_F(Qrmctl, TheNextJoinClearsAwayAKilledOne) {

@@ -4,6 +4,7 @@
 
 #include <array>
 
+#include "set_aside.h"
 #include "sqlite_database.h"
 
 namespace host::credential_database {
@@ -184,6 +185,14 @@ Result WriteCredential(ZELO_CRED &cred) {
 
 Result RemoveCredential(long id) {
     return RemoveById(kRemoveCredential, id);
+}
+
+Result SetAsideIfDamaged(std::string &strAside) {
+    return g_database.SetAsideIfDamaged(strAside);
+}
+
+std::vector<std::string> ListSetAside() {
+    return host::ListSetAside(kStore.szPath);
 }
 
 Result ReadSession(long id, ZELO_CRED_SESS &sess) {

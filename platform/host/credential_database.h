@@ -5,6 +5,7 @@
 #ifndef ZELO_HOST_CREDENTIAL_DATABASE_H
 #define ZELO_HOST_CREDENTIAL_DATABASE_H
 
+#include <string>
 #include <vector>
 
 #include "credential_record.h"
@@ -29,6 +30,10 @@ Result WriteCredential(ZELO_CRED &cred);
 
 // Removes the record; kDone also when it was not there.
 Result RemoveCredential(long id);
+
+// sqlite::Database::SetAsideIfDamaged, and the files that it has set aside, the oldest first.
+Result SetAsideIfDamaged(std::string &strAside);
+std::vector<std::string> ListSetAside();
 
 Result ReadSession(long id, ZELO_CRED_SESS &sess);
 Result WriteSession(const ZELO_CRED_SESS &sess);

@@ -228,6 +228,36 @@ int ZELOCredRemoveByID(long id) {
     return NoThrow([&] { return ToInt(database::RemoveCredential(id)); });
 }
 
+int ZELOCredStoreSetAside(char *szPath, int cbPath) {
+    if (szPath == nullptr || cbPath <= 0) {
+        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
+    }
+    return NoThrow([&] {
+        std::string strPath;
+        const Result result = database::SetAsideIfDamaged(strPath);
+        if (result != Result::kDone) {
+            return result == Result::kAbsent ? 0 : -1;
+        }
+        static_cast<void>(host::CopyText(strPath, szPath, cbPath));
+        return 1;
+    });
+}
+
+int ZELOCredStoreListSetAside(YLIBSZLIST **ppslPaths) {
+    if (ppslPaths == nullptr) {
+        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
+    }
+    return NoThrow([&] {
+        const std::vector<std::string> paths = database::ListSetAside();
+        for (const std::string &strPath : paths) {
+            if (YLIBCSzListPush(ppslPaths, strPath.c_str()) < 0) {
+                return -1;
+            }
+        }
+        return static_cast<int>(paths.size());
+    });
+}
+
 ZELO_CRED_SESS *ZELOCredSessAlloc() {
     auto *const pSess = new (std::nothrow) ZELO_CRED_SESS;
     if (pSess == nullptr) {

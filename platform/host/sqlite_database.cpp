@@ -13,6 +13,7 @@
 #include <vector>
 
 #include "last_error.h"
+#include "set_aside.h"
 
 namespace host::sqlite {
 namespace {
@@ -251,6 +252,54 @@ Result Database::Connect(bool blWrite) {
         m_pConnection.reset();
     }
     return result;
+}
+
+Result Database::CheckWhole() {
+    sqlite3 *const pDb = m_pConnection->pDb.get();
+    sqlite3_stmt *pRaw = nullptr;
+    int error = sqlite3_prepare_v2(pDb, "PRAGMA integrity_check(1)", -1, &pRaw, nullptr);
+    const StatementHandle pStatement(pRaw);
+    if (error == SQLITE_OK) {
+        error = sqlite3_step(pRaw);
+    }
+    if (error != SQLITE_ROW) {
+        return Fail(error, sqlite3_errmsg(pDb), __LINE__);
+    }
+    const auto *pText = sqlite3_column_text(pRaw, 0);
+    const bool blWhole =
+        pText != nullptr && std::strcmp(reinterpret_cast<const char *>(pText), "ok") == 0;
+    return blWhole ? Result::kDone : Fail(SQLITE_CORRUPT, "", __LINE__);
+}
+
+Result Database::SetAsideIfDamaged(std::string &strAside) {
+    const std::lock_guard<std::mutex> lock(m_mutex);
+    struct stat judged = {};
+    if (lstat(m_store.szPath, &judged) != 0) {
+        return errno == ENOENT ? Result::kAbsent : FailErrno(__LINE__);
+    }
+    Result result = Connect(false);
+    if (result == Result::kDone) {
+        result = CheckWhole();
+    }
+    if (result != Result::kFailed) {
+        return Result::kAbsent;
+    }
+    m_pConnection.reset();
+    if (YLIBCErrGet() != YLIBC_ERR_STORE_DAMAGED) {
+        return Result::kFailed;
+    }
+    // A copy that was restored meanwhile is another file.
+    struct stat now = {};
+    if (lstat(m_store.szPath, &now) != 0 || now.st_ino != judged.st_ino ||
+        now.st_dev != judged.st_dev) {
+        return Result::kAbsent;
+    }
+    if (!SetAside(m_store.szPath, strAside)) {
+        return FailErrno(__LINE__);
+    }
+    syslog(LOG_WARNING, "%s:%d %s '%s' was damaged or of another format: it is '%s' now", kFile,
+           __LINE__, m_store.szName, m_store.szPath, strAside.c_str());
+    return Result::kDone;
 }
 
 // --- Run ----------------------------------------------------------------------------------------

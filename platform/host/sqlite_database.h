@@ -3,9 +3,10 @@
 // What every store keeps to. A statement is a transaction, durable when it returns; another
 // process's write is waited for, within a bound. Reading never creates or changes the file: a store
 // that does not exist yet has no records. A file that is damaged or of another format is left as it
-// is, and each operation on it fails with a log line. What is removed is overwritten. The process
-// keeps one connection to each store, which its threads take in turn; it is closed before a fork,
-// and opened anew when another file has taken the place of the one that it leads to.
+// is, and each operation on it fails with a log line; only SetAsideIfDamaged moves it. What is
+// removed is overwritten. The process keeps one connection to each store, which its threads take in
+// turn; it is closed before a fork, and opened anew when another file has taken the place of the
+// one that it leads to.
 
 #ifndef ZELO_HOST_SQLITE_DATABASE_H
 #define ZELO_HOST_SQLITE_DATABASE_H
@@ -49,6 +50,11 @@ class Database {
     Database(const Database &) = delete;
     Database &operator=(const Database &) = delete;
 
+    // Looks through the whole store, and sets its file aside when that is damaged or of another
+    // format (set_aside.h). kDone: strAside is where it is now. kAbsent: nothing is damaged. A
+    // store that cannot be judged, such as a busy one, fails and stays.
+    Result SetAsideIfDamaged(std::string &strAside);
+
   private:
     friend class Run;
 
@@ -61,6 +67,7 @@ class Database {
     Result CreateFile() const;
     Result TightenModes(mode_t fileMode) const;
     Result CheckFormat();
+    Result CheckWhole();
     Result CreateSchema();
     Result Fail(int sqliteError, const char *szWhat, int line) const;
     Result FailErrno(int line) const;

@@ -1,0 +1,22 @@
+// Files of damaged stores, set aside under a name that says when:
+// "<path>.damaged-20261124T235500Z".
+
+#ifndef ZELO_HOST_SET_ASIDE_H
+#define ZELO_HOST_SET_ASIDE_H
+
+#include <string>
+#include <vector>
+
+namespace host {
+
+// Renames a database file, and before it what belongs to it (-journal, -wal, -shm): a journal that
+// stayed would be played into the next database at the path. Never replaces a file. Returns false
+// with errno; strAside is where the file is now.
+bool SetAside(const std::string &strPath, std::string &strAside);
+
+// All files that were set aside from the path, the oldest first.
+std::vector<std::string> ListSetAside(const std::string &strPath);
+
+}  // namespace host
+
+#endif
