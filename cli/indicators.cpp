@@ -19,16 +19,41 @@ constexpr const char *kJoinAgain = "qrmctl leave, then qrmctl join";
 constexpr const char *kStartDaemon = "/usr/zelo/etc/rc.d/S99zelocache.sh start";
 constexpr const char *kCreateAccount = "qrmctl account create";
 
+struct Rule {
+    const char *szText;     // as the library logs it
+    const char *szMeaning;  // what is wrong when it is broken
+    const char *szRemedy;
+};
+
+// In the order of their numbers, from 1. The table in docs/qrmctl.md is this one.
+constexpr Rule kRules[] = {
+    {"FALSE == blJoined && 0 <= CredId", "not joined, but a server credential is stored", kLeave},
+    {"TRUE == blJoined && 0 > CredId", "joined, but no server credential is stored", kJoinAgain},
+    {"FALSE == blJoined && 0 <= CredId",
+     "not joined, but a notification-center credential is stored", kLeave},
+    {"TRUE == blJoined && 0 > CredId", "joined, but no notification-center credential is stored",
+     kJoinAgain},
+    {"FALSE == blJoined && 0 == runRet", "not joined, but the cache daemon runs", kLeave},
+    {"TRUE == blJoined && 1 == runRet", "joined, but the cache daemon is stopped", kStartDaemon},
+    {"FALSE == blJoined && true == blSessionExist", "not joined, but there are web sessions",
+     kLeave},
+    {"TRUE == blJoined && false == blSessionExist", "joined, but there is no web session",
+     kJoinAgain},
+    {"TRUE == blJoined", "joined, but there is no service account", kCreateAccount},
+    {"TRUE == blJoined", "joined, but the service account is no administrator", kCreateAccount}};
+
 // What the flag says: nothing disagrees with a flag that cannot be judged.
 struct Flag {
     bool blYes;
     bool blNo;
 };
 
-void Break(Indicator &indicator, int rule, const char *szRule, const char *szRemedy) {
-    indicator.rule = rule;
-    indicator.strRule = szRule;
-    indicator.strRemedy = szRemedy;
+void Break(Indicator &indicator, int number) {
+    const Rule &rule = kRules[number - 1];
+    indicator.rule = number;
+    indicator.strRule = rule.szText;
+    indicator.strMeaning = rule.szMeaning;
+    indicator.strRemedy = rule.szRemedy;
 }
 
 Indicator ReadFlag(Flag &flag) {
@@ -66,9 +91,9 @@ Indicator ReadCredential(const Flag &flag, const char *szName, const char *szApp
         indicator.strHolds = "stored";
     }
     if (flag.blNo && id >= 0) {
-        Break(indicator, rule, "FALSE == blJoined && 0 <= CredId", kLeave);
+        Break(indicator, rule);
     } else if (flag.blYes && id < 0) {
-        Break(indicator, rule + 1, "TRUE == blJoined && 0 > CredId", kJoinAgain);
+        Break(indicator, rule + 1);
     }
     return indicator;
 }
@@ -82,9 +107,9 @@ Indicator ReadDaemon(const Flag &flag) {
                          : status < 0  ? "its script cannot be run"
                                        : "status " + std::to_string(status);
     if (flag.blNo && status == 0) {
-        Break(indicator, 5, "FALSE == blJoined && 0 == runRet", kLeave);
+        Break(indicator, 5);
     } else if (flag.blYes && status == 1) {
-        Break(indicator, 6, "TRUE == blJoined && 1 == runRet", kStartDaemon);
+        Break(indicator, 6);
     }
     return indicator;
 }
@@ -106,9 +131,9 @@ Indicator ReadSessions(const Flag &flag) {
     indicator.strName = "web sessions";
     indicator.strHolds = !blReady ? "cannot be read" : blExists ? strSessions : "none";
     if (flag.blNo && blExists) {
-        Break(indicator, 7, "FALSE == blJoined && true == blSessionExist", kLeave);
+        Break(indicator, 7);
     } else if (flag.blYes && !blExists) {
-        Break(indicator, 8, "TRUE == blJoined && false == blSessionExist", kJoinAgain);
+        Break(indicator, 8);
     }
     return indicator;
 }
@@ -124,7 +149,7 @@ Indicator ReadAccount(const Flag &flag) {
                          : blExists ? "exists, no administrator"
                                     : "does not exist";
     if (flag.blYes && !blAdmin) {
-        Break(indicator, blExists ? 10 : 9, "TRUE == blJoined", kCreateAccount);
+        Break(indicator, blExists ? 10 : 9);
     }
     return indicator;
 }

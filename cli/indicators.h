@@ -11,10 +11,11 @@ namespace qrmctl {
 
 struct Indicator {
     std::string strName;
-    std::string strHolds;   // what it holds, for people
-    int rule = 0;           // the rule that it breaks, 1 to 10; 0 for none
-    std::string strRule;    // that rule's text, as the library logs it
-    std::string strRemedy;  // the command that mends it
+    std::string strHolds;    // what it holds, for people
+    int rule = 0;            // the rule that it breaks, 1 to 10; 0 for none
+    std::string strRule;     // that rule's text, as the library logs it
+    std::string strMeaning;  // what is wrong, for people
+    std::string strRemedy;   // the command that mends it
 };
 
 // All six, in the order in which the library reads them.

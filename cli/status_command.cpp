@@ -44,9 +44,10 @@ void Explain(Report &report) {
             Padded(indicator.strName, kNameWidth) + Padded(indicator.strHolds, kHoldsWidth);
         if (indicator.rule != 0) {
             entry["rule_text"] = indicator.strRule;
+            entry["rule_meaning"] = indicator.strMeaning;
             entry["remedy"] = indicator.strRemedy;
-            strLine += "breaks rule " + std::to_string(indicator.rule) +
-                       "; to mend: " + indicator.strRemedy;
+            strLine += "breaks rule " + std::to_string(indicator.rule) + ", " +
+                       indicator.strMeaning + "; to mend: " + indicator.strRemedy;
         } else {
             strLine += "agrees";
         }
