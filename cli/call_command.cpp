@@ -47,9 +47,9 @@ ExitCode Call(const Options &options, Report &report) {
     Json::Value reply;
     if (ZELOQRMClientSendWebapi(reply, options.strApi, options.version, options.strMethod, params,
                                 options.blCached) != 0) {
-        return report.Fail(ErrorId::kNoReply,
-                           "no usable reply from the server at " + server->Address() +
-                               ": can this appliance reach it? -v shows the reason");
+        return report.FailExchange(ErrorId::kNoReply,
+                                   "no usable reply from the server at " + server->Address() +
+                                       ": can this appliance reach it? -v shows the reason");
     }
     report.Document("reply", reply);
     if (!json_text::IsTrue(json_text::Member(reply, "success"))) {
@@ -70,9 +70,10 @@ ExitCode Update(const Options &options, Report &report) {
     }
     Report::Stage("updating this appliance's entry at " + server->Address());
     if (ZELOQRMClientSendSetClient(info) != 0) {
-        return report.Fail(ErrorId::kUpdateFailed,
-                           "the server did not take the update, or a fact of this appliance is "
-                           "missing; -v shows the reason");
+        return report.FailExchange(
+            ErrorId::kUpdateFailed,
+            "the server did not take the update, or a fact of this appliance is "
+            "missing; -v shows the reason");
     }
     report.Say("The server's entry for this appliance is up to date.");
     return report.Done();

@@ -93,10 +93,11 @@ ExitCode Tell(Outcome outcome, const std::string &strPath, const Progress &progr
     if (outcome == Outcome::kFailed) {
         return g_interrupted != 0
                    ? report.Fail(ErrorId::kInterrupted, "interrupted")
-                   : report.Fail(ErrorId::kFetchFailed,
-                                 "the file could not be fetched: can this appliance reach the "
-                                 "server, does that have the file, and is there room for it? -v "
-                                 "shows the reason");
+                   : report.FailExchange(
+                         ErrorId::kFetchFailed,
+                         "the file could not be fetched: can this appliance reach the "
+                         "server, does that have the file, and is there room for it? -v "
+                         "shows the reason");
     }
     report.Fact("path", strPath);
     report.Fact("unchanged", outcome == Outcome::kUnchanged);

@@ -199,12 +199,13 @@ ExitCode Join(const Options &options, Report &report) {
     Report::Stage("asking " + CandidateNames(candidates) + " for the API '" + kApi + '\'');
     Json::Value connection;
     if (!ZELOQRMClientTestConnect(candidates, kApi, connection)) {
-        return report.Fail(
+        return report.FailExchange(
             ErrorId::kNoServer,
             "no server answered at '" + options.strServer +
                 "' or any other candidate, nothing was changed: check address, ports "
                 "and certificate; -v shows the reason of each attempt");
     }
+    report.WarnOfAuthority();
     Report::Stage(kTurnStage);
     const MembershipTurn turn;
     if (!turn.IsTaken()) {

@@ -105,8 +105,9 @@ ExitCode Push(const Options &options, Report &report) {
     const char *szSection = options.strSection == "-" ? nullptr : options.strSection.c_str();
     if (ZELOQRMClientLog(level, szSection, options.strKey.c_str(), params.Get(),
                          options.blExtraInfo ? options.strExtraInfo.c_str() : nullptr) != 0) {
-        return report.Fail(ErrorId::kLogNotConfirmed,
-                           "the server has not confirmed the log entry; -v shows the reason");
+        return report.FailExchange(
+            ErrorId::kLogNotConfirmed,
+            "the server has not confirmed the log entry; -v shows the reason");
     }
     report.Say("The server has the log entry.");
     return report.Done();

@@ -8,6 +8,7 @@
 
 #include "deadline.h"
 #include "json_text.h"
+#include "web_api_request.h"
 
 namespace qrmctl {
 
@@ -103,6 +104,27 @@ ExitCode Report::Fail(ErrorId id, const std::string &strError) {
     static_cast<void>(Print());
     std::cerr << "qrmctl: " << Printable(strError) << '\n';
     return ErrorOf(id).exitCode;
+}
+
+// A sentence about a certificate authority that cannot be read; empty when all can.
+static std::string AuthorityFlaw() {
+    std::string strFile;
+    return ZELO::CredRequestUtil::FindUnreadableAuthority(strFile)
+               ? "cannot read certificates from '" + strFile +
+                     "', so that no server is trusted over https: mend or remove it"
+               : std::string();
+}
+
+void Report::WarnOfAuthority() {
+    const std::string strFlaw = AuthorityFlaw();
+    if (!strFlaw.empty()) {
+        Warn(strFlaw);
+    }
+}
+
+ExitCode Report::FailExchange(ErrorId id, const std::string &strError) {
+    const std::string strFlaw = AuthorityFlaw();
+    return strFlaw.empty() ? Fail(id, strError) : Fail(ErrorId::kCaUnreadable, strFlaw);
 }
 
 // Puts everything out that is meant for standard output; the deadline strikes until it is.

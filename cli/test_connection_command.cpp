@@ -24,12 +24,13 @@ ExitCode TestConnection(const Options &options, Report &report) {
     Report::Stage("asking " + CandidateNames(candidates) + " for the API '" + options.strApi + "'");
     Json::Value connection;
     if (!ZELOQRMClientTestConnect(candidates, options.strApi, connection)) {
-        return report.Fail(ErrorId::kNoServer,
-                           "no candidate of '" + options.strCandidates +
-                               "' answered for the API '" + options.strApi +
-                               "': check addresses, ports and certificates; -v shows "
-                               "the reason of each attempt");
+        return report.FailExchange(ErrorId::kNoServer,
+                                   "no candidate of '" + options.strCandidates +
+                                       "' answered for the API '" + options.strApi +
+                                       "': check addresses, ports and certificates; -v shows "
+                                       "the reason of each attempt");
     }
+    report.WarnOfAuthority();
     report.Fact("protocol", connection["protocol"]);
     report.Fact("host", connection["host"]);
     report.Fact("port", connection["port"]);

@@ -172,4 +172,45 @@ TEST_F(QrmctlCall, AnInterruptedFetchLeavesTheFileAsItWas) {
     ExpectAlone();
 }
 
+TEST_F(QrmctlCall, APrivateAuthorityServesEveryPathAndABadOneIsNamed) {
+    const std::string strPort = std::to_string(s_pServer->HttpsPort());
+    std::ofstream("/tmp/token") << joined::kToken;
+    std::ofstream("/tmp/list") << R"([{"host":"localhost","http_port":0,"https_port":)" << strPort
+                               << "}]";
+    const Arguments commands[] = {{"call", "ZELO.QRM.RPC", "info"},
+                                  {"log", "err", "-", "text"},
+                                  GetFile(),
+                                  {"test-connection", "--api", "ZELO.QRM.RPC", "/tmp/list"},
+                                  {"join", "--server", "localhost", "--http-port", "0",
+                                   "--https-port", strPort, "--token-file", "/tmp/token"},
+                                  {"update"}};
+    for (const Arguments &command : commands) {
+        SCOPED_TRACE(testing::PrintToString(command));
+        Run(command, 0);
+    }
+    const std::string strBad = std::string(joined::kCaFile) + ".crt";
+    const std::function<void()> faults[] = {
+        [&] { std::ofstream(strBad) << "no certificate"; },
+        [&] { std::ofstream(strBad) << FileText(joined::kCaFile).substr(0, 300); },
+        [&] { fs::create_symlink("/tmp/absent", strBad); }};
+    for (const auto &fault : faults) {
+        fault();
+        for (const Arguments &command : commands) {
+            SCOPED_TRACE(testing::PrintToString(command));
+            const Json::Value result = Run(command, 1);
+            EXPECT_EQ(result["error_id"], "ca-unreadable");
+            EXPECT_NE(result["error"].asString().find('\'' + strBad + '\''), std::string::npos);
+        }
+        std::ofstream("/tmp/both")
+            << R"([{"host":"localhost","http_port":)" << s_pServer->HttpPort()
+            << R"(,"https_port":)" << strPort << "}]";
+        EXPECT_EQ(
+            Run({"test-connection", "--api", "ZELO.QRM.RPC", "/tmp/both"}, 0)["warnings"].size(),
+            1U)
+            << "plain http in its place does not go unnoticed";
+        fs::remove(strBad);
+    }
+    Run({"leave"}, 0);
+}
+
 }  // namespace

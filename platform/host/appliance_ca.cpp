@@ -9,6 +9,7 @@
 #include <algorithm>
 #include <filesystem>
 #include <memory>
+#include <new>
 #include <string>
 #include <system_error>
 
@@ -25,6 +26,10 @@ struct FreeBio {
 };
 struct FreeCertificate {
     void operator()(X509 *pCertificate) const { X509_free(pCertificate); }
+};
+
+struct FreeStore {
+    void operator()(X509_STORE *pStore) const { X509_STORE_free(pStore); }
 };
 
 bool IsPemName(const fs::path &path) {
@@ -52,13 +57,12 @@ bool AddFile(X509_STORE *pStore, const std::string &strPath) {
     }
 }
 
-}  // namespace
-
-bool AddApplianceCa(X509_STORE *pStore) {
+// Adds every file of the folder. Returns what cannot be read, empty when there is nothing.
+std::string AddFolder(X509_STORE *pStore) {
     std::error_code error;
     fs::directory_iterator entries(kFolder, error);
     if (error == std::errc::no_such_file_or_directory) {
-        return true;
+        return {};
     }
     bool blAll = !error;
     std::string strPath = kFolder;
@@ -70,11 +74,26 @@ bool AddApplianceCa(X509_STORE *pStore) {
         blAll = blAll && !error;
     }
     ERR_clear_error();
-    if (!blAll) {
+    return blAll ? std::string() : strPath;
+}
+
+}  // namespace
+
+bool AddApplianceCa(X509_STORE *pStore) {
+    const std::string strUnreadable = AddFolder(pStore);
+    if (!strUnreadable.empty()) {
         syslog(LOG_ERR, "%s:%d cannot read certificates from '%s': mend or remove it", kFile,
-               __LINE__, strPath.c_str());
+               __LINE__, strUnreadable.c_str());
     }
-    return blAll;
+    return strUnreadable.empty();
+}
+
+std::string UnreadableCa() {
+    const std::unique_ptr<X509_STORE, FreeStore> pStore(X509_STORE_new());
+    if (pStore == nullptr) {
+        throw std::bad_alloc();
+    }
+    return AddFolder(pStore.get());
 }
 
 CaState CaState::Now() {
