@@ -140,7 +140,7 @@ TEST_F(Deadline, EndsWhateverACommandIsBlockedInAndNamesIt) {
         {{"status", "--explain"}, script, "cache daemon", ""},
         {{"account", "create"}, accounts, "service account", "qrmctl leave"},
         {{"leave"}, lock("/tmp/qrmctl.membership.lock"), szTurn, "qrmctl leave"},
-        {{"leave"}, store, "leav", "qrmctl leave"},
+        {{"leave"}, store, "credential store", "qrmctl leave"},
         {{"info", "set", "key", "value"}, lock("/tmp/qrm_client.info.lock"), "client info", ""},
         {{"idle", "set", "5"}, lock("/tmp/qrm_idle_time.lock"), "idle time", "idle get"},
         {{"credential", "show"}, store, "credential store", ""}};
