@@ -94,7 +94,7 @@ std::vector<pid_t> ChildrenOf(const std::string &strProcess) {
 // the programs that those watch. The wardens only stop at first: one that ended would let the main
 // thread go on to its next step. Returns them.
 std::vector<pid_t> EndStarted() {
-    const std::vector<pid_t> wardens = ChildrenOf("self");
+    std::vector<pid_t> wardens = ChildrenOf("self");
     for (const pid_t warden : wardens) {
         kill(warden, SIGSTOP);
         for (const pid_t program : ChildrenOf(std::to_string(warden))) {
