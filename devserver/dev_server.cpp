@@ -271,6 +271,10 @@ Reply DevServer::HandleDevelopment(const httplib::Request &request) {
         ForgetRequests();
         return Ok(Json::objectValue);
     }
+    if (strWhat == "DELETE /dev/next") {
+        ForgetAnswers();
+        return Ok(Json::objectValue);
+    }
     if (strWhat == "GET /dev/clients") {
         return JsonReply(200, Clients());
     }

@@ -15,7 +15,7 @@
 #include "torture.h"
 #include "zeloqrmclient.h"
 
-devserver::DevServer *joined::Joined::s_pServer = nullptr;
+DevServerProcess *joined::Joined::s_pServer = nullptr;
 
 namespace {
 
@@ -276,7 +276,7 @@ TEST_F(SendWebapi, PlainHttpAsksForProtectedParameters) {
 
 TEST_F(SendWebapi, TheTokensGoToTheServerAloneAndAsHeaders) {
     EXPECT_EQ(Call(), "0");
-    devserver::DevServer other{devserver::Options()};
+    DevServerProcess other{devserver::Options()};
     std::string strReason;
     ASSERT_TRUE(other.Start(strReason)) << strReason;
     devserver::NextAnswer redirect;
