@@ -13,6 +13,7 @@
 #include <fstream>
 #include <iostream>
 
+#include "console_page.h"
 #include "dev_server.h"
 #include "json_text.h"
 
@@ -87,7 +88,9 @@ bool Announce(const devserver::DevServer &server, const std::string &strHost, co
     const bool blColons = strHost.find(':') != std::string::npos;
     const std::string strUrlHost = blColons ? "[" + strHost + "]" : strHost;
     std::cout << "qrm-devserver: http://" << strUrlHost << ":" << server.HttpPort() << " https://"
-              << strUrlHost << ":" << server.HttpsPort() << std::endl;
+              << strUrlHost << ":" << server.HttpsPort()
+              << "\nqrm-devserver: the console is http://" << strUrlHost << ":" << server.HttpPort()
+              << devserver::kConsolePath << std::endl;
     return true;
 }
 
