@@ -7,6 +7,7 @@
 #include <ctime>
 #include <memory>
 
+#include "console_page.h"
 #include "json_text.h"
 
 namespace devserver {
@@ -280,6 +281,11 @@ Reply DevServer::HandleDevelopment(const httplib::Request &request) {
     }
     if (strWhat == "GET /dev/log") {
         return JsonReply(200, Log());
+    }
+    if (request.method == "GET") {
+        if (const std::optional<Reply> file = ConsoleFile(request.path)) {
+            return *file;
+        }
     }
     if (strWhat != "POST /dev/next") {
         return Reply{404, "text/plain", "", nullptr};
