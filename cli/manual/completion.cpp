@@ -83,27 +83,31 @@ std::string BashValues(const Command &command) {
 
 // --- zsh ----------------------------------------------------------------------------------------
 
-std::string ZshValue(const Option &option) {
+// What is shown of a value, and where it comes from.
+std::string ZshValue(const std::string &strName, const Option &option) {
     std::string strAction;
     if (IsFile(option)) {
         strAction = "_files";
     } else if (!option.choices.empty()) {
         strAction = "(" + CLI::detail::join(option.choices, " ") + ")";
     }
-    return ":" + (option.strValue.empty() ? option.names.front() : option.strValue) + ":" +
-           strAction;
+    return ":" + strName + ":" + strAction;
 }
 
+// An option's names exclude each other.
 std::string ZshOption(const Option &option) {
-    std::string strShown;
+    const std::string strExcluded = option.names.size() > 1 ? "(" + Names({option}) + ")" : "";
+    std::string strRest = "[";
     for (char c : option.strDescription) {
-        strShown += c == '[' || c == ']' || c == ':' ? std::string("\\") + c : std::string(1, c);
+        strRest += c == '[' || c == ']' || c == ':' ? std::string("\\") + c : std::string(1, c);
+    }
+    strRest += "]";
+    if (!option.strValue.empty()) {
+        strRest += ZshValue(option.strValue, option);
     }
     std::string strSpecs;
     for (const std::string &strName : option.names) {
-        const std::string strExcluded = option.names.size() > 1 ? "(" + Names({option}) + ")" : "";
-        strSpecs += " \\\n        " + Quoted(strExcluded + strName + "[" + strShown + "]" +
-                                             (option.strValue.empty() ? "" : ZshValue(option)));
+        strSpecs.append(" \\\n        ").append(Quoted(strExcluded + strName + strRest));
     }
     return strSpecs;
 }
@@ -117,12 +121,7 @@ std::string ZshFunction(const Command &command) {
     if (command.commands.empty()) {
         for (std::size_t i = 0; i < command.arguments.size(); ++i) {
             const Option &argument = command.arguments[i];
-            Option shown = argument;
-            shown.strValue = argument.names.front();
-            std::string strValue = ZshValue(shown);
-            if (IsFile(argument)) {
-                strValue = ":" + argument.names.front() + ":_files";
-            }
+            const std::string strValue = ZshValue(argument.names.front(), argument);
             strSpecs += " \\\n        " +
                         Quoted((argument.blRepeats ? "*" : std::to_string(i + 1)) + strValue);
         }
