@@ -1,7 +1,9 @@
 // The development QRM server as a program: listens, says where in the ports file, and serves until
 // it is told to end (SIGINT or SIGTERM).
 
+#include <fcntl.h>
 #include <pthread.h>
+#include <sys/file.h>
 #include <unistd.h>
 
 #include <CLI/CLI.hpp>
@@ -14,6 +16,7 @@
 #include <iostream>
 
 #include "command_line.h"
+#include "console_page.h"
 #include "dev_server.h"
 #include "json_text.h"
 
@@ -50,14 +53,34 @@ bool ReadToken(const std::string &strFile, std::string &strToken) {
     return true;
 }
 
-// A reader sees the whole file or none; in its first moment it has another name.
-bool WriteFile(const std::string &strFile, const std::string &strText) {
+// A server that is killed leaves its ports file, and whoever waits for the next server's would read
+// the old ports. The file of a server that runs is locked, and stays.
+bool RemoveOldPorts(const std::string &strFile) {
+    const int fd = open(strFile.c_str(), O_RDONLY | O_NONBLOCK | O_NOFOLLOW | O_CLOEXEC);
+    const bool blInUse = fd >= 0 && flock(fd, LOCK_SH | LOCK_NB) != 0 && errno == EWOULDBLOCK;
+    if (fd >= 0) {
+        close(fd);
+    }
+    if (blInUse) {
+        return Complain("cannot use ports file '" + strFile +
+                        "': another server that runs has it; name another file");
+    }
+    return unlink(strFile.c_str()) == 0 || errno == ENOENT ||
+           Complain("cannot remove old ports file '" + strFile + "': " + std::strerror(errno) +
+                    "; remove it, or name another file");
+}
+
+enum class Lock { kNone, kUntilTheEnd };
+
+// A reader sees the whole file or none; in its first moment it has another name. A lock lasts until
+// the process ends.
+bool WriteFile(const std::string &strFile, const std::string &strText, Lock lock) {
     std::string strTemporary = strFile + ".XXXXXX";
     const int fd = mkstemp(strTemporary.data());
     const bool blWritten = fd >= 0 && write(fd, strText.data(), strText.size()) ==
                                           static_cast<ssize_t>(strText.size());
-    const bool blClosed = fd >= 0 && close(fd) == 0;
-    if (blWritten && blClosed && std::rename(strTemporary.c_str(), strFile.c_str()) == 0) {
+    const bool blReady = fd >= 0 && (lock == Lock::kNone ? close(fd) : flock(fd, LOCK_EX)) == 0;
+    if (blWritten && blReady && std::rename(strTemporary.c_str(), strFile.c_str()) == 0) {
         return true;
     }
     const int error = errno;
@@ -75,14 +98,16 @@ bool Announce(const devserver::DevServer &server, const std::string &strHost, co
     ports["https_port"] = server.HttpsPort();
     json_text::ToString(ports, strPorts);
     // Who waits for the ports file finds the authority's certificate in place.
-    if ((!files.ca.empty() && !WriteFile(files.ca, server.CaPem())) ||
-        (!files.ports.empty() && !WriteFile(files.ports, strPorts + "\n"))) {
+    if ((!files.ca.empty() && !WriteFile(files.ca, server.CaPem(), Lock::kNone)) ||
+        (!files.ports.empty() && !WriteFile(files.ports, strPorts + "\n", Lock::kUntilTheEnd))) {
         return false;
     }
     const bool blColons = strHost.find(':') != std::string::npos;
     const std::string strUrlHost = blColons ? "[" + strHost + "]" : strHost;
     std::cout << "qrm-devserver: http://" << strUrlHost << ":" << server.HttpPort() << " https://"
-              << strUrlHost << ":" << server.HttpsPort() << std::endl;
+              << strUrlHost << ":" << server.HttpsPort()
+              << "\nqrm-devserver: the console is http://" << strUrlHost << ":" << server.HttpPort()
+              << devserver::kConsolePath << std::endl;
     return true;
 }
 
@@ -121,7 +146,11 @@ int Run(int argc, char **argv) {
     } catch (const CLI::ParseError &error) {
         return app.exit(error) == EXIT_SUCCESS ? EXIT_SUCCESS : devserver::kUsage;
     }
-    return ReadToken(files.token, options.token) ? Serve(options, files) : devserver::kFailed;
+    if ((!files.ports.empty() && !RemoveOldPorts(files.ports)) ||
+        !ReadToken(files.token, options.token)) {
+        return devserver::kFailed;
+    }
+    return Serve(options, files);
 }
 
 }  // namespace

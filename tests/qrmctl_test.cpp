@@ -6,7 +6,7 @@
 #include <fstream>
 #include <sstream>
 
-#include "dev_server.h"
+#include "dev_server_process.h"
 #include "json_text.h"
 #include "run_program.h"
 #include "stored.h"
@@ -38,7 +38,7 @@ class Qrmctl : public testing::Test {
     static void SetUpTestSuite() {
         devserver::Options options;
         options.token = kToken;
-        s_pServer = new devserver::DevServer(options);
+        s_pServer = new DevServerProcess(options);
         std::string strReason;
         ASSERT_TRUE(s_pServer->Start(strReason)) << strReason;
         s_strHttp = std::to_string(s_pServer->HttpPort());
@@ -102,12 +102,12 @@ class Qrmctl : public testing::Test {
         return strAll;
     }
 
-    static devserver::DevServer *s_pServer;
+    static DevServerProcess *s_pServer;
     static std::string s_strHttp;
     static std::string s_strHttps;
 };
 
-devserver::DevServer *Qrmctl::s_pServer = nullptr;
+DevServerProcess *Qrmctl::s_pServer = nullptr;
 std::string Qrmctl::s_strHttp;
 std::string Qrmctl::s_strHttps;
 

@@ -12,7 +12,7 @@
 #include "torture.h"
 #include "zeloqrmclient.h"
 
-devserver::DevServer *joined::Joined::s_pServer = nullptr;
+DevServerProcess *joined::Joined::s_pServer = nullptr;
 
 namespace {
 

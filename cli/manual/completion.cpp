@@ -107,7 +107,9 @@ std::string ZshOption(const Option &option) {
     }
     std::string strSpecs;
     for (const std::string &strName : option.names) {
-        strSpecs.append(" \\\n        ").append(Quoted(strExcluded + strName + strRest));
+        std::string strSpec = strExcluded;
+        strSpec.append(strName).append(strRest);
+        strSpecs.append(" \\\n        ").append(Quoted(strSpec));
     }
     return strSpecs;
 }
