@@ -11,7 +11,7 @@
 namespace {
 
 int Run(int argc, char **argv) {
-    CLI::App app("Makes this appliance a client of a QRM server, and shows what it is.", "qrmctl");
+    CLI::App app(qrmctl::kSummary, "qrmctl");
     qrmctl::Action action;
     qrmctl::CommonOptions options;
     qrmctl::AddCommandLine(app, action, options);

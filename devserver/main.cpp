@@ -15,21 +15,16 @@
 #include <fstream>
 #include <iostream>
 
+#include "command_line.h"
 #include "console_page.h"
 #include "dev_server.h"
 #include "json_text.h"
 
 namespace {
 
-constexpr int kExitFailed = 1;
-constexpr int kExitUsage = 2;
 constexpr std::size_t kMaxToken = 4096;
 
-struct Files {
-    std::string token;
-    std::string ports;
-    std::string ca;
-};
+using devserver::Files;
 
 bool Complain(const std::string &strLine) {
     std::cerr << "qrm-devserver: " << strLine << std::endl;
@@ -128,10 +123,10 @@ int Serve(const devserver::Options &options, const Files &files) {
     std::string strReason;
     if (!server.Start(strReason)) {
         Complain(strReason);
-        return kExitFailed;
+        return devserver::kFailed;
     }
     if (!Announce(server, options.host, files)) {
-        return kExitFailed;
+        return devserver::kFailed;
     }
     int signal = 0;
     sigwait(&ends, &signal);
@@ -144,32 +139,16 @@ int Serve(const devserver::Options &options, const Files &files) {
 int Run(int argc, char **argv) {
     devserver::Options options;
     Files files;
-    CLI::App app("A QRM server for development, on loopback", "qrm-devserver");
-    app.failure_message([](const CLI::App *, const CLI::Error &error) {
-        return std::string("qrm-devserver: ") + error.what() +
-               "; 'qrm-devserver --help' shows the options\n";
-    });
-    app.add_option("--token-file", files.token, "File with the access token")->required();
-    app.add_option("--http-port", options.http_port, "Port for HTTP, 0 for a free one")
-        ->check(CLI::Range(0, 65535));
-    app.add_option("--https-port", options.https_port, "Port for HTTPS, 0 for a free one")
-        ->check(CLI::Range(0, 65535));
-    app.add_option("--ports-file", files.ports, "File to write the ports to, as JSON");
-    app.add_option("--ca-file", files.ca, "File to write the authority's certificate to, as PEM");
-    app.add_option("--host", options.host, "Loopback address to listen on")
-        ->check([](const std::string &strHost) {
-            return devserver::IsLoopback(strHost)
-                       ? std::string()
-                       : "'" + strHost + "' is no loopback address; name 127.0.0.1 or ::1";
-        });
+    CLI::App app(devserver::kSummary, "qrm-devserver");
+    devserver::AddCommandLine(app, options, files);
     try {
         app.parse(argc, argv);
     } catch (const CLI::ParseError &error) {
-        return app.exit(error) == EXIT_SUCCESS ? EXIT_SUCCESS : kExitUsage;
+        return app.exit(error) == EXIT_SUCCESS ? EXIT_SUCCESS : devserver::kUsage;
     }
     if ((!files.ports.empty() && !RemoveOldPorts(files.ports)) ||
         !ReadToken(files.token, options.token)) {
-        return kExitFailed;
+        return devserver::kFailed;
     }
     return Serve(options, files);
 }
@@ -181,6 +160,6 @@ int main(int argc, char **argv) {
         return Run(argc, argv);
     } catch (const std::exception &error) {
         std::fprintf(stderr, "qrm-devserver: cannot go on: %s\n", error.what());
-        return kExitFailed;
+        return devserver::kFailed;
     }
 }
