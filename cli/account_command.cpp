@@ -103,8 +103,10 @@ void AddPlugins(CLI::App &app, Action &action) {
     auto *const pRun = pPlugins->add_subcommand("run", "Run an action with a made-up server");
     const auto pPlugin = std::make_shared<std::string>();
     const auto pAction = std::make_shared<std::string>();
-    pRun->add_option("PLUGIN", *pPlugin, "disjoin")->required()->check(CLI::IsMember({"disjoin"}));
-    pRun->add_option("ACTION", *pAction, "PRE or POST")
+    pRun->add_option("PLUGIN", *pPlugin, "The event whose plug-ins run")
+        ->required()
+        ->check(CLI::IsMember({"disjoin"}));
+    pRun->add_option("ACTION", *pAction, "Before the event or after it")
         ->required()
         ->check(CLI::IsMember({"PRE", "POST"}));
     pRun->callback([pPlugin, pAction, &action] {

@@ -86,9 +86,13 @@ void AddCall(CLI::App &app, Action &action) {
     const auto pOptions = std::make_shared<Options>();
     pCommand->add_option("API", pOptions->strApi, "Web API, such as ZELO.QRM.RPC")->required();
     pCommand->add_option("METHOD", pOptions->strMethod, "Its method")->required();
-    pCommand->add_option("--version", pOptions->version, "Version of the API (default: 1)");
-    pCommand->add_option("--params", pOptions->strParams,
-                         "Parameters: a JSON object, or @FILE with one (@- for standard input)");
+    pCommand->add_option("--version", pOptions->version, "Version of the API")
+        ->type_name("N")
+        ->capture_default_str();
+    pCommand
+        ->add_option("--params", pOptions->strParams,
+                     "Parameters: a JSON object, or @FILE with one (@- for standard input)")
+        ->type_name("JSON");
     pCommand->add_flag("--cached", pOptions->blCached,
                        "Use the records that this process has loaded before");
     pCommand->callback([pOptions, &action] {
@@ -100,8 +104,10 @@ void AddUpdate(CLI::App &app, Action &action) {
     auto *const pCommand =
         app.add_subcommand("update", "Bring the server's entry for this appliance up to date");
     const auto pOptions = std::make_shared<Options>();
-    pCommand->add_option("--host", pOptions->strHost,
-                         "The address at which the server reaches this appliance");
+    pCommand
+        ->add_option("--host", pOptions->strHost,
+                     "The address at which the server reaches this appliance")
+        ->type_name("HOST");
     pCommand->callback([pOptions, &action] {
         action = [pOptions](Report &report) { return Update(*pOptions, report); };
     });

@@ -2,7 +2,10 @@
 
 #include <charconv>
 
+#include "command_texts.h"
 #include "deadline.h"
+#include "help.h"
+#include "suggestion.h"
 
 namespace qrmctl {
 namespace {
@@ -34,11 +37,10 @@ void AddCommonOptions(CLI::App &app, CommonOptions &options) {
 
 // A misspelt command or option is what the user has to know, not what is missing because of it.
 std::string UsageMessage(const CLI::App *pApp, const CLI::Error &error) {
-    const std::vector<std::string> unknown = pApp->remaining(true);
-    const std::string strWhat =
-        unknown.empty() ? error.what() : "'" + unknown.front() + "' is no command or option here";
-    return "qrmctl: " + Printable(strWhat) +
-           "; 'qrmctl --help' shows the commands, 'qrmctl COMMAND --help' the options of one\n";
+    const std::string strUnknown = suggestion::UnknownWord(*pApp);
+    const std::string strWhat = Printable(strUnknown.empty() ? error.what() : strUnknown);
+    return "qrmctl: " + strWhat + (strWhat.back() == '?' ? " " : "; ") +
+           "'qrmctl --help' shows the commands, 'qrmctl COMMAND --help' the options of one\n";
 }
 
 }  // namespace
@@ -51,6 +53,8 @@ double DeadlineOf(const CLI::App &app, const CommonOptions &options) {
 void AddCommandLine(CLI::App &app, Action &action, CommonOptions &options) {
     app.require_subcommand(1);
     app.failure_message(UsageMessage);
+    app.formatter(std::make_shared<help::Formatter>());
+    app.set_version_flag("--version", "qrmctl " ZELO_VERSION, "Show the version");
     AddTestConnection(app, action);
     AddJoin(app, action);
     AddStatus(app, action);
@@ -67,6 +71,7 @@ void AddCommandLine(CLI::App &app, Action &action, CommonOptions &options) {
     AddPlugins(app, action);
     AddIdle(app, action);
     AddCommonOptions(app, options);
+    AddTexts(app);
 }
 
 }  // namespace qrmctl

@@ -10,6 +10,9 @@
 
 namespace qrmctl {
 
+constexpr const char *kSummary =
+    "Makes this appliance a client of a QRM server, and shows what it is";
+
 struct CommonOptions {
     bool blJson = false;
     bool blVerbose = false;

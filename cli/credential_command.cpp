@@ -115,6 +115,7 @@ void AddChange(CLI::App &parent, Action &action, const char *szName, const char 
     auto *const pCommand = parent.add_subcommand(szName, szDescription);
     const auto pFile = std::make_shared<std::string>();
     pCommand->add_option("FILE", *pFile, "JSON file with the credential, - for standard input")
+        ->type_name("FILE")
         ->required();
     pCommand->callback([pFile, blCreate, &action] {
         action = [pFile, blCreate](Report &report) { return Change(*pFile, blCreate, report); };

@@ -246,12 +246,18 @@ ExitCode GetFile(const Options &options, Report &report) {
 void AddGetFile(CLI::App &app, Action &action) {
     auto *const pCommand = app.add_subcommand("get-file", "Fetch a file from the joined server");
     const auto pOptions = std::make_shared<Options>();
-    pCommand->add_option("PATH", pOptions->strPath, "Where to put the file")->required();
+    pCommand->add_option("PATH", pOptions->strPath, "Where to put the file")
+        ->type_name("FILE")
+        ->required();
     pCommand->add_option("API", pOptions->strApi, "Web API that sends it")->required();
     pCommand->add_option("METHOD", pOptions->strMethod, "Its method")->required();
-    pCommand->add_option("--version", pOptions->version, "Version of the API (default: 1)");
-    pCommand->add_option("--params", pOptions->strParams,
-                         "Parameters: a JSON object, or @FILE with one (@- for standard input)");
+    pCommand->add_option("--version", pOptions->version, "Version of the API")
+        ->type_name("N")
+        ->capture_default_str();
+    pCommand
+        ->add_option("--params", pOptions->strParams,
+                     "Parameters: a JSON object, or @FILE with one (@- for standard input)")
+        ->type_name("JSON");
     pCommand->add_flag("--in-place", pOptions->blInPlace,
                        "Write to PATH itself, which is emptied first");
     pCommand->callback([pOptions, &action] {

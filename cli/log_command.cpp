@@ -22,13 +22,6 @@ struct Options {
     bool blRender = false;
 };
 
-class Usage : public CLI::Formatter {
-  public:
-    std::string make_usage(const CLI::App * /*pApp*/, std::string /*strName*/) const override {
-        return "Usage: qrmctl log [OPTIONS] LEVEL SECTION KEY [PARAM...]\n";
-    }
-};
-
 // An option for each parameter: an option with a list of values would take "[a,b]" for two.
 void AddParams(CLI::App &command, Options &options) {
     constexpr int kMostParams = 32;
@@ -43,7 +36,6 @@ void AddParams(CLI::App &command, Options &options) {
             pParam->group("");
         }
     }
-    command.formatter(std::make_shared<Usage>());
 }
 
 bool ReadLevel(const std::string &strLevel, int &level) {
@@ -126,8 +118,9 @@ void AddLog(CLI::App &app, Action &action) {
         ->required();
     pCommand->add_option("KEY", pOptions->strKey, "The message")->required();
     AddParams(*pCommand, *pOptions);
-    auto *const pExtraInfo = pCommand->add_option("--extra-info", pOptions->strExtraInfo,
-                                                  "Text sent beside the message");
+    auto *const pExtraInfo =
+        pCommand->add_option("--extra-info", pOptions->strExtraInfo, "Text sent beside the message")
+            ->type_name("TEXT");
     pCommand->add_flag("--render", pOptions->blRender,
                        "Show the message in every language and send nothing");
     pCommand->callback([pOptions, pExtraInfo, &action] {

@@ -42,7 +42,7 @@ int TellUsage(const CLI::App &app, const CLI::ParseError &error, bool blJson) {
 }
 
 int Run(int argc, char **argv) {
-    CLI::App app("Makes this appliance a client of a QRM server, and shows what it is.", "qrmctl");
+    CLI::App app(qrmctl::kSummary, "qrmctl");
     qrmctl::Action action;
     qrmctl::CommonOptions options;
     qrmctl::AddCommandLine(app, action, options);

@@ -125,8 +125,8 @@ ExitCode Leave(const LeaveRequest &request, Report &report) {
 }  // namespace
 
 void AddStatus(CLI::App &app, Action &action) {
-    auto *const pCommand = app.add_subcommand(
-        "status", "Judge whether this appliance is joined (exit 0), not (3), or half (4)");
+    auto *const pCommand =
+        app.add_subcommand("status", "Judge whether it is joined (exit 0), not (3) or half (4)");
     const auto pExplain = std::make_shared<bool>(false);
     pCommand->add_flag("--explain", *pExplain, "Show what the judgement rests on");
     pCommand->callback([pExplain, &action] {
@@ -139,7 +139,8 @@ void AddLeave(CLI::App &app, Action &action) {
         app.add_subcommand("leave", "Leave the server, from any half-way state too");
     const auto pRequest = std::make_shared<LeaveRequest>();
     pCommand->add_flag("--rejoin", pRequest->blRejoin, "Leave in order to join again");
-    pCommand->add_option("--from", pRequest->strFrom, "The application that asks for it");
+    pCommand->add_option("--from", pRequest->strFrom, "The application that asks for it")
+        ->type_name("APP");
     pCommand->add_flag("--clear-gluster", pRequest->blClearGluster, "Told to the plug-ins");
     pCommand->callback([pRequest, &action] {
         action = [pRequest](Report &report) { return Leave(*pRequest, report); };

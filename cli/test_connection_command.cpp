@@ -44,10 +44,12 @@ void AddTestConnection(CLI::App &app, Action &action) {
         "test-connection", "Find the first connection at which a server answers");
     const auto pOptions = std::make_shared<Options>();
     pCommand->add_option("--api", pOptions->strApi, "Web API that the server has to serve")
+        ->type_name("NAME")
         ->required();
     pCommand
         ->add_option("CANDIDATES", pOptions->strCandidates,
                      "JSON file with the candidate connections, - for standard input")
+        ->type_name("FILE")
         ->required();
     pCommand->callback([pOptions, &action] {
         action = [pOptions](Report &report) { return TestConnection(*pOptions, report); };

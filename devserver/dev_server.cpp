@@ -7,6 +7,7 @@
 #include <ctime>
 #include <memory>
 
+#include "console_page.h"
 #include "json_text.h"
 
 namespace devserver {
@@ -271,11 +272,20 @@ Reply DevServer::HandleDevelopment(const httplib::Request &request) {
         ForgetRequests();
         return Ok(Json::objectValue);
     }
+    if (strWhat == "DELETE /dev/next") {
+        ForgetAnswers();
+        return Ok(Json::objectValue);
+    }
     if (strWhat == "GET /dev/clients") {
         return JsonReply(200, Clients());
     }
     if (strWhat == "GET /dev/log") {
         return JsonReply(200, Log());
+    }
+    if (request.method == "GET") {
+        if (const std::optional<Reply> file = ConsoleFile(request.path)) {
+            return *file;
+        }
     }
     if (strWhat != "POST /dev/next") {
         return Reply{404, "text/plain", "", nullptr};

@@ -1,7 +1,9 @@
 // The development QRM server as a program: listens, says where in the ports file, and serves until
 // it is told to end (SIGINT or SIGTERM).
 
+#include <fcntl.h>
 #include <pthread.h>
+#include <sys/file.h>
 #include <unistd.h>
 
 #include <CLI/CLI.hpp>
@@ -13,20 +15,16 @@
 #include <fstream>
 #include <iostream>
 
+#include "command_line.h"
+#include "console_page.h"
 #include "dev_server.h"
 #include "json_text.h"
 
 namespace {
 
-constexpr int kExitFailed = 1;
-constexpr int kExitUsage = 2;
 constexpr std::size_t kMaxToken = 4096;
 
-struct Files {
-    std::string token;
-    std::string ports;
-    std::string ca;
-};
+using devserver::Files;
 
 bool Complain(const std::string &strLine) {
     std::cerr << "qrm-devserver: " << strLine << std::endl;
@@ -55,14 +53,34 @@ bool ReadToken(const std::string &strFile, std::string &strToken) {
     return true;
 }
 
-// A reader sees the whole file or none; in its first moment it has another name.
-bool WriteFile(const std::string &strFile, const std::string &strText) {
+// A server that is killed leaves its ports file, and whoever waits for the next server's would read
+// the old ports. The file of a server that runs is locked, and stays.
+bool RemoveOldPorts(const std::string &strFile) {
+    const int fd = open(strFile.c_str(), O_RDONLY | O_NONBLOCK | O_NOFOLLOW | O_CLOEXEC);
+    const bool blInUse = fd >= 0 && flock(fd, LOCK_SH | LOCK_NB) != 0 && errno == EWOULDBLOCK;
+    if (fd >= 0) {
+        close(fd);
+    }
+    if (blInUse) {
+        return Complain("cannot use ports file '" + strFile +
+                        "': another server that runs has it; name another file");
+    }
+    return unlink(strFile.c_str()) == 0 || errno == ENOENT ||
+           Complain("cannot remove old ports file '" + strFile + "': " + std::strerror(errno) +
+                    "; remove it, or name another file");
+}
+
+enum class Lock { kNone, kUntilTheEnd };
+
+// A reader sees the whole file or none; in its first moment it has another name. A lock lasts until
+// the process ends.
+bool WriteFile(const std::string &strFile, const std::string &strText, Lock lock) {
     std::string strTemporary = strFile + ".XXXXXX";
     const int fd = mkstemp(strTemporary.data());
     const bool blWritten = fd >= 0 && write(fd, strText.data(), strText.size()) ==
                                           static_cast<ssize_t>(strText.size());
-    const bool blClosed = fd >= 0 && close(fd) == 0;
-    if (blWritten && blClosed && std::rename(strTemporary.c_str(), strFile.c_str()) == 0) {
+    const bool blReady = fd >= 0 && (lock == Lock::kNone ? close(fd) : flock(fd, LOCK_EX)) == 0;
+    if (blWritten && blReady && std::rename(strTemporary.c_str(), strFile.c_str()) == 0) {
         return true;
     }
     const int error = errno;
@@ -80,14 +98,16 @@ bool Announce(const devserver::DevServer &server, const std::string &strHost, co
     ports["https_port"] = server.HttpsPort();
     json_text::ToString(ports, strPorts);
     // Who waits for the ports file finds the authority's certificate in place.
-    if ((!files.ca.empty() && !WriteFile(files.ca, server.CaPem())) ||
-        (!files.ports.empty() && !WriteFile(files.ports, strPorts + "\n"))) {
+    if ((!files.ca.empty() && !WriteFile(files.ca, server.CaPem(), Lock::kNone)) ||
+        (!files.ports.empty() && !WriteFile(files.ports, strPorts + "\n", Lock::kUntilTheEnd))) {
         return false;
     }
     const bool blColons = strHost.find(':') != std::string::npos;
     const std::string strUrlHost = blColons ? "[" + strHost + "]" : strHost;
     std::cout << "qrm-devserver: http://" << strUrlHost << ":" << server.HttpPort() << " https://"
-              << strUrlHost << ":" << server.HttpsPort() << std::endl;
+              << strUrlHost << ":" << server.HttpsPort()
+              << "\nqrm-devserver: the console is http://" << strUrlHost << ":" << server.HttpPort()
+              << devserver::kConsolePath << std::endl;
     return true;
 }
 
@@ -103,10 +123,10 @@ int Serve(const devserver::Options &options, const Files &files) {
     std::string strReason;
     if (!server.Start(strReason)) {
         Complain(strReason);
-        return kExitFailed;
+        return devserver::kFailed;
     }
     if (!Announce(server, options.host, files)) {
-        return kExitFailed;
+        return devserver::kFailed;
     }
     int signal = 0;
     sigwait(&ends, &signal);
@@ -119,30 +139,18 @@ int Serve(const devserver::Options &options, const Files &files) {
 int Run(int argc, char **argv) {
     devserver::Options options;
     Files files;
-    CLI::App app("A QRM server for development, on loopback", "qrm-devserver");
-    app.failure_message([](const CLI::App *, const CLI::Error &error) {
-        return std::string("qrm-devserver: ") + error.what() +
-               "; 'qrm-devserver --help' shows the options\n";
-    });
-    app.add_option("--token-file", files.token, "File with the access token")->required();
-    app.add_option("--http-port", options.http_port, "Port for HTTP, 0 for a free one")
-        ->check(CLI::Range(0, 65535));
-    app.add_option("--https-port", options.https_port, "Port for HTTPS, 0 for a free one")
-        ->check(CLI::Range(0, 65535));
-    app.add_option("--ports-file", files.ports, "File to write the ports to, as JSON");
-    app.add_option("--ca-file", files.ca, "File to write the authority's certificate to, as PEM");
-    app.add_option("--host", options.host, "Loopback address to listen on")
-        ->check([](const std::string &strHost) {
-            return devserver::IsLoopback(strHost)
-                       ? std::string()
-                       : "'" + strHost + "' is no loopback address; name 127.0.0.1 or ::1";
-        });
+    CLI::App app(devserver::kSummary, "qrm-devserver");
+    devserver::AddCommandLine(app, options, files);
     try {
         app.parse(argc, argv);
     } catch (const CLI::ParseError &error) {
-        return app.exit(error) == EXIT_SUCCESS ? EXIT_SUCCESS : kExitUsage;
+        return app.exit(error) == EXIT_SUCCESS ? EXIT_SUCCESS : devserver::kUsage;
     }
-    return ReadToken(files.token, options.token) ? Serve(options, files) : kExitFailed;
+    if ((!files.ports.empty() && !RemoveOldPorts(files.ports)) ||
+        !ReadToken(files.token, options.token)) {
+        return devserver::kFailed;
+    }
+    return Serve(options, files);
 }
 
 }  // namespace
@@ -152,6 +160,6 @@ int main(int argc, char **argv) {
         return Run(argc, argv);
     } catch (const std::exception &error) {
         std::fprintf(stderr, "qrm-devserver: cannot go on: %s\n", error.what());
-        return kExitFailed;
+        return devserver::kFailed;
     }
 }

@@ -73,8 +73,10 @@ Reply JsonReply(int status, const Json::Value &value) {
 void Send(const Reply &reply, const NextAnswer &answer, const Pause &pause,
           httplib::Response &response) {
     response.status = reply.status;
-    for (const auto &[strName, strValue] : answer.headers) {
-        response.set_header(strName, strValue);
+    for (const auto *pHeaders : {&reply.headers, &answer.headers}) {
+        for (const auto &[strName, strValue] : *pHeaders) {
+            response.set_header(strName, strValue);
+        }
     }
     const auto typeOf = answer.headers.find("Content-Type");
     const std::string strType = typeOf == answer.headers.end() ? reply.strType : typeOf->second;

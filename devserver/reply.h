@@ -6,6 +6,7 @@
 #include <json/value.h>
 
 #include <functional>
+#include <map>
 #include <memory>
 #include <string>
 
@@ -23,6 +24,7 @@ struct Reply {
     std::string strType = "application/json";
     std::string strBody;
     std::shared_ptr<const GeneratedFile> pFile;  // goes out in place of strBody
+    std::map<std::string, std::string> headers = {};
 };
 
 Reply JsonReply(int status, const Json::Value &value);

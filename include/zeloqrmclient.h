@@ -23,6 +23,7 @@
 
 #include <string>
 
+// Marks what the shared library exports.
 #define ZELOQRM_API __attribute__((visibility("default")))
 
 // The platform's text containers (text_containers.h).
@@ -80,6 +81,8 @@ ZELOQRM_API bool ZELOQRMClientGetServerCredential(Json::Value &out);
 
 // Reads the credential like ZELOQRMClientGetServerCredential and its session: sets "application" to
 // "ZELO.QRM", "access_token" as far as it is stored, and "csrf_token" when it is not empty.
+//
+// out: null or an object; anything else fails.
 //
 // Returns true when there are a credential and a session. Returns false otherwise; when only the
 // session is missing, out holds the members of the credential.
@@ -207,10 +210,10 @@ ZELOQRM_API int ZELOQRMClientSendWebapi(Json::Value &resp, const std::string &ap
 // arrives.
 //
 // path: the destination. Its directory is created as needed (mode 0755); a path without one stands
-// in the current directory. Either "/" or "\" ends the directory.
+// in the current directory. A slash or a backslash ends the directory.
 // api, ver, method: the method.
 // params: its parameters, an object or null. When there is a file at the path, its MD5 digest is
-// added as "md5", 32 digits, and stays there afterwards.
+// added as "md5", 32 digits, and stays there afterwards: a null becomes an object.
 //
 // Returns 0 when the file has been fetched, and also when the server answers that the caller's copy
 // is current: the file is then empty, as in the next case. Returns -1 otherwise. The file at the
@@ -226,6 +229,9 @@ ZELOQRM_API int ZELOQRMClientGetFile(const std::string &path, const std::string 
 // The MD5 digest of a file as text: 32 lower-case hexadecimal digits and a line feed, cut to
 // size - 1 characters and zero-terminated. A buffer of 33 bytes takes the digits alone.
 //
+// path: the file; links are followed.
+// buffer, size: the caller's buffer, and its size in bytes.
+//
 // Returns 0 when the file could be read, else -1, with the buffer as it was. Only a regular file
 // has a digest: a pipe or a device may never end.
 ZELOQRM_API int GetFileMd5String(const char *path, char *buffer, int size);
@@ -238,14 +244,21 @@ ZELOQRM_API int GetFileMd5String(const char *path, char *buffer, int size);
 // library itself writes the key "status" (see ZELOQRMClientSendWebapi). The file is shared by all
 // processes and empty after a restart of the appliance.
 
-// Reads a key. Returns true, with the text (cut to 1023 bytes, empty for a key that is not there)
-// in value; false, with value as it was, when there is no file yet or it cannot be read. Logs
-// nothing.
+// Reads a key.
+//
+// key: its name.
+// value: receives the text, cut to 1023 bytes; empty for a key that is not there.
+//
+// Returns true when the file was read; false, with value as it was, when there is no file yet or it
+// cannot be read. Logs nothing.
 ZELOQRM_API bool ZELOQRMClientGetInfo(const std::string &key, std::string &value);
 
-// Writes a key, holding "/tmp/qrm_client.info.lock". Returns true when it is written; false when
-// the lock cannot be had, the file cannot be written, or a key or value cannot stand in it (a line
-// feed in either, "=" in the key). Logs nothing.
+// Writes a key, holding "/tmp/qrm_client.info.lock", which is waited for.
+//
+// key, value: the key and its new text; no line feed in either, no "=" in the key.
+//
+// Returns true when it is written; false when the lock cannot be had, the file cannot be written,
+// or a key or value cannot stand in it. Logs nothing.
 ZELOQRM_API bool ZELOQRMClientSetInfo(const std::string &key, const std::string &value);
 
 // ------------------------------------------------------------------------------------------------
@@ -302,7 +315,17 @@ ZELOQRM_API int ZELOQRMClientStatus(void);
 // run in the caller's thread, each within the platform's time limit.
 ZELOQRM_API bool ZELOQRMClientDeleteServer(bool blRejoin, const std::string &strFrom,
                                            bool blClearGluster);
+
+// The same; blClearGluster is false.
+//
+// blRejoin, strFrom: as above.
+//
+// Returns what the one above returns.
 ZELOQRM_API bool ZELOQRMClientDeleteServer(bool blRejoin, const std::string &strFrom);
+
+// The same, not for a re-join and with no application that asks.
+//
+// Returns what the one above returns.
 ZELOQRM_API bool ZELOQRMClientDeleteServer(void);
 
 // ------------------------------------------------------------------------------------------------
@@ -311,38 +334,51 @@ ZELOQRM_API bool ZELOQRMClientDeleteServer(void);
 
 // The server that a change of membership is about. Texts are zero-terminated.
 struct __tag_ZELO_QRM_SERVER_INFO__ {
-    long lPort;
-    char szHost[1024];
-    char szProtocol[1024];
-    char szSn[128];       // the serial number recorded with the server's credential
-    int iRejoin;          // 1: the appliance leaves in order to join again
-    int iFrom;            // 1: the admin center application asked for the change
-    bool blClearGluster;  // the caller's request, passed on
+    long lPort;             // the server's port
+    char szHost[1024];      // its name or address
+    char szProtocol[1024];  // "https", "http" or "fld"
+    char szSn[128];         // the serial number recorded with the server's credential
+    int iRejoin;            // 1: the appliance leaves in order to join again
+    int iFrom;              // 1: the admin center application asked for the change
+    bool blClearGluster;    // the caller's request, passed on
 };
 
 // A plug-in that is made ready. Its owner is the caller, for the length of one change.
 struct __tag_qrmclient_plugin_env__ {
     int nResult;  // told to the plug-in as RESULT; the caller sets it before an action
     const __tag_ZELO_QRM_SERVER_INFO__ *pServerInfo;  // not owned; valid until the release
-    YLIBPLUGIN *pHandle;
+    YLIBPLUGIN *pHandle;  // the platform's; null while no plug-in is ready
 };
 
-// Makes the plug-in szPlugin (such as "qrm_client/disjoin") of the family "qrm_client" ready:
-// nResult becomes 0. Returns 0 on success, -1 on failure (a null argument sets the platform's last
-// error to 0x0D00). Call ZELOQRMClientPluginExit in either case.
+// Makes a plug-in of the family "qrm_client" ready: nResult becomes 0. No program runs yet.
+//
+// pstEnvVar: the caller's, filled in here; call ZELOQRMClientPluginExit for it in either case.
+// szPlugin: the plug-in, such as "qrm_client/disjoin".
+// pServerInfo: what the programs are told; the caller's, it has to live until the release.
+//
+// Returns 0 on success, -1 with a log line on failure; a null argument sets the platform's last
+// error to 0x0D00.
 ZELOQRM_API int ZELOQRMClientPluginInit(__tag_qrmclient_plugin_env__ *pstEnvVar,
                                         const char *szPlugin,
                                         const __tag_ZELO_QRM_SERVER_INFO__ *pServerInfo);
 
 // Runs an action in the caller's thread with the arguments RESULT, HOST, PROTOCOL, PORT, SN,
-// REJOIN, FROM and CLEAR_GLUSTER, each cut to 31 bytes, never
-// inside a UTF-8 character. Returns the platform's result,
-// negative when a plug-in failed; -1 when the action could not be prepared, without a log line
-// unless the server info is missing.
+// REJOIN, FROM and CLEAR_GLUSTER, each cut to 31 bytes, never inside a UTF-8 character. It waits
+// for each program, which has the platform's time limit.
+//
+// action: SDK_PLUGIN_ACTION_PRE before the change, SDK_PLUGIN_ACTION_POST after it.
+// pstEnvVar: made ready by ZELOQRMClientPluginInit.
+//
+// Returns the platform's result, negative when a plug-in failed; -1 when the action could not be
+// prepared, without a log line unless the server info is missing.
 ZELOQRM_API int ZELOQRMClientPlugin(_tag_sdk_plugin_action_ action,
                                     __tag_qrmclient_plugin_env__ *pstEnvVar);
 
-// Releases the plug-in. Returns 0; -1 for a null argument.
+// Releases the plug-in. One that is not ready is no error.
+//
+// pstEnvVar: what ZELOQRMClientPluginInit was given; its pHandle becomes null.
+//
+// Returns 0; -1 with a log line for a null argument.
 ZELOQRM_API int ZELOQRMClientPluginExit(__tag_qrmclient_plugin_env__ *pstEnvVar);
 
 // ------------------------------------------------------------------------------------------------
@@ -363,14 +399,19 @@ ZELOQRM_API int ZELOQRMClientPluginExit(__tag_qrmclient_plugin_env__ *pstEnvVar)
 ZELOQRM_API bool ZELOQRMClientCreateServerUser(void);
 
 // Deletes the account, holding "/tmp/userlock", then reloads the service of type 8 and removes
-// "/usr/zelo/etc/QRM/" with all that is in it. Returns true on success, and at once when there is
-// no such account (the directory is then left alone); false with a log line otherwise.
+// "/usr/zelo/etc/QRM/" with all that is in it.
+//
+// Returns true on success, and at once when there is no such account (the directory is then left
+// alone); false with a log line otherwise.
 ZELOQRM_API bool ZELOQRMClientDeleteServerUser(void);
 
 // Shows or hides a user's welcome pages: sets "welcome_nvo40_hide" and "welcome_nvo50_hide" of
 // "ZELO.PKV.App.WelcomeApp.Instance" in the file "usersettings" of the user's preference directory.
 // Everything else in that file stays. One that is no JSON object is replaced, and so is one beyond
 // what is read: 64 MiB, 1000 levels, two million values, numbers that a double holds.
+//
+// szUser: the user's name.
+// blShow: true shows the pages, false hides them.
 //
 // Returns true when the file has been replaced, as a whole; false with a log line, and the file as
 // it was, otherwise. Two calls for one user at once: the later one wins.
@@ -380,18 +421,28 @@ ZELOQRM_API bool ZELOQRMUserWelcomPage(const char *szUser, bool blShow);
 // Log
 // ------------------------------------------------------------------------------------------------
 
+// A level of log entries.
 struct QRMCLIENT_LOG_LEVEL {
-    int level;  // a syslog severity, 0 the most severe; negative only in the last entry
-    std::string name;
+    int level;         // a syslog severity, 0 the most severe; negative only in the last entry
+    std::string name;  // what the server calls it, such as "warning"
 };
 
 // The eight levels, "emerg" (0) to "debug" (7), and an entry with level -1 and an empty name that
 // ends a scan. Filled when the library is loaded, never changed; any thread may read it.
 extern ZELOQRM_API const QRMCLIENT_LOG_LEVEL gZELOQRMClientLogLevelTable[9];
 
-// The name of a level; "info" for any other number. The level of a name, compared exactly; 6 for
-// any other name. Neither fails or logs.
+// The name of a level. Never fails, logs nothing.
+//
+// level: 0 to 7.
+//
+// Returns its name; "info" for any other number.
 ZELOQRM_API std::string ZELOQRMClientLogLevelIntToStr(int level);
+
+// The level of a name. Never fails, logs nothing.
+//
+// name: compared exactly.
+//
+// Returns 0 to 7; 6 for any other name.
 ZELOQRM_API int ZELOQRMClientLogLevelStrToInt(const std::string &name);
 
 // Pushes an entry to the server's log: "push" of "ZELO.QRM.RPC.Log", with the time, the level's
@@ -399,9 +450,9 @@ ZELOQRM_API int ZELOQRMClientLogLevelStrToInt(const std::string &name);
 //
 // level: 0 to 7; any other is sent as "info".
 // szSection, szKey: the message in the interface strings files; without a section (null) szKey is
-// the message itself. szKey is required. pslParams, or up to three texts of which null ones are
-// left out: what fills the message's markers
-// "{0}", "{1}" and so on, see ConvertLog. Null for none. The list stays the caller's.
+// the message itself. szKey is required.
+// pslParams: what fills the message's markers "{0}", "{1}" and so on, see ConvertLog; null for
+// none. The list stays the caller's.
 // szExtraInfo: sent as "extra_info"; null for none.
 //
 // Returns 0 when the server has confirmed the entry ("success" is boolean true), else -1 with a log
@@ -409,11 +460,21 @@ ZELOQRM_API int ZELOQRMClientLogLevelStrToInt(const std::string &name);
 // it does. Files read: "/usr/zelo/zeloman/webman/texts/<language>/strings".
 ZELOQRM_API int ZELOQRMClientLog(int level, const char *szSection, const char *szKey,
                                  YLIBSZLIST *pslParams, const char *szExtraInfo);
+
+// The same with up to three texts for the markers, and without "extra_info".
+//
+// level, szSection, szKey: as above.
+// szParam1, szParam2, szParam3: what fills the markers; a null one is left out.
+//
+// Returns what the one above returns.
 ZELOQRM_API int ZELOQRMClientLog(int level, const char *szSection, const char *szKey,
                                  const char *szParam1, const char *szParam2, const char *szParam3);
 
 // Renders a message in the twenty languages of the interface.
 //
+// szSection, szKey: the message in the interface strings files; without a section (null) szKey is
+// the message itself.
+// pslParams: what fills the message's markers; null for none. The list stays the caller's.
 // out: null or an object; receives one text for each language code, "chs" to "trk". A language
 // whose strings file does not have the message gets the English one, parameters included.
 //
@@ -427,17 +488,36 @@ ZELOQRM_API int ZELOQRMClientLog(int level, const char *szSection, const char *s
 ZELOQRM_API int ConvertLog(const char *szSection, const char *szKey, YLIBSZLIST *pslParams,
                            Json::Value &out);
 
-// Writes the text of the list at the index, its references expanded from the strings file, to
-// szOut, a buffer of cbOut bytes, cut to fit. What a text brings in is expanded too, the first form
-// before the second; at most 1,024 replacements of each form are made, so that texts that name each
-// other come to an end. A replacement that does not fit ends the expansion of its form.
+// Writes a text of a list to a buffer, its references expanded from a strings file. What a text
+// brings in is expanded too, the first form before the second; at most 1,024 replacements of each
+// form are made, so that texts that name each other come to an end. A replacement that does not fit
+// ends the expansion of its form. Any thread may call it.
+//
+// pslParams, index: the list, which stays the caller's, and which of its texts.
+// szStringsFile: the path of the strings file.
+// szOut, cbOut: the buffer, and its size in bytes; the text is cut to fit and zero-terminated.
 ZELOQRM_API void ParamGet(YLIBSZLIST *pslParams, int index, const char *szStringsFile, char *szOut,
                           int cbOut);
 
-// Finds the first reference of either form in a text. Returns 0, with its section and key (and for
-// the second form the whole token) in the buffers, each of limit bytes; -1 when the text from the
-// first "{" or "_T(" on is no reference that fits. A token that does not fit is logged.
+// Finds the first reference of the form "{section:key}" in a text.
+//
+// szText: the text.
+// szSection, szKey: receive its parts.
+// limit: the size of each of the buffers in bytes.
+//
+// Returns 0 when there is one; -1 when the text from the first "{" on is no reference that fits. A
+// null buffer is logged.
 ZELOQRM_API int CheckSectionKey_tpl1(const char *szText, char *szSection, char *szKey, int limit);
+
+// Finds the first reference of the form "_T(section,key)" in a text.
+//
+// szText: the text.
+// szSection, szKey: receive its parts, without the blanks and quotes around them.
+// szToken: receives the whole reference.
+// limit: the size of each of the buffers in bytes.
+//
+// Returns 0 when there is one; -1 when the text from the first "_T(" on is no reference that fits.
+// A token that does not fit, and a null buffer, are logged.
 ZELOQRM_API int CheckSectionKey_tpl2(const char *szText, char *szSection, char *szKey,
                                      char *szToken, int limit);
 
@@ -450,12 +530,18 @@ ZELOQRM_API int CheckSectionKey_tpl2(const char *szText, char *szSection, char *
 // every later reader gets that time, not the one now in force. Records of processes that have ended
 // go when they are met; a process id that the system uses again cannot be told apart.
 //
+// idleTime: receives the minutes; 0: the disks never sleep. On failure it may hold them already.
+//
 // Returns 0 on success, -1 with a log line otherwise. Holds "/tmp/qrm_idle_time.lock", waiting for
 // it at most 30 s.
 ZELOQRM_API int ZELOQRMIdleTimeGet(unsigned long &idleTime);
 
-// Sets the disks' idle time and drops the caller's record, in the same way. When the record cannot
-// be removed the idle time is not changed.
+// Sets the disks' idle time and drops the caller's record of "/tmp/qrm_idle_time", under the same
+// lock. When the record cannot be removed the idle time is not changed.
+//
+// idleTime: minutes; 0: the disks never sleep.
+//
+// Returns 0 on success, -1 with a log line otherwise.
 ZELOQRM_API int ZELOQRMIdleTimeSet(unsigned long idleTime);
 
 #endif

@@ -6,6 +6,7 @@
 #ifndef ZELO_PLATFORM_API_H
 #define ZELO_PLATFORM_API_H
 
+// Exports an operation from the platform library.
 #define ZELO_PLATFORM_API __attribute__((visibility("default")))
 
 #endif

@@ -138,6 +138,7 @@ ZELO_PLATFORM_API int ZELOCredSessItemSetID(ZELO_CRED_SESS *pSess, long id);
 ZELO_PLATFORM_API int ZELOCredSessItemSetAccessToken(ZELO_CRED_SESS *pSess, const char *szToken);
 ZELO_PLATFORM_API int ZELOCredSessItemSetCsrfToken(ZELO_CRED_SESS *pSess, const char *szToken);
 
+// Getters, as of a credential.
 ZELO_PLATFORM_API int ZELOCredSessItemGetAccessToken(char *szToken, int cbToken,
                                                      const ZELO_CRED_SESS *pSess);
 ZELO_PLATFORM_API int ZELOCredSessItemGetCsrfToken(char *szToken, int cbToken,

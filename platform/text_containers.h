@@ -18,15 +18,17 @@
 // port's.
 
 struct YLIBSZLIST_ITEMS;
+// A list of texts.
 struct YLIBSZLIST {
-    int nItem;  // how many texts it holds
-    YLIBSZLIST_ITEMS *pItems;
+    int nItem;                 // how many texts it holds
+    YLIBSZLIST_ITEMS *pItems;  // the port's
 };
 
 struct YLIBSZHASH_PAIRS;
+// Pairs of texts.
 struct YLIBSZHASH {
-    int nItem;  // how many pairs it holds
-    YLIBSZHASH_PAIRS *pPairs;
+    int nItem;                 // how many pairs it holds
+    YLIBSZHASH_PAIRS *pPairs;  // the port's
 };
 
 extern "C" {

@@ -45,7 +45,7 @@ struct ZELO_USER {
 // takes over the list that was there, to be released in the same way, once. Exchanging the two
 // pointers does both. Null stands for no members.
 struct ZELO_GROUP {
-    char szName[256];
+    char szName[256];  // as of a user
     gid_t gid;
     char **ppszMembers;
 };

@@ -21,8 +21,8 @@
 // Filled with zeros by its owner before ZeloCgiInit; what stands in it after that is the port's,
 // and it is not copied until ZeloCgiFree.
 struct ZELO_CGI_CONTEXT {
-    int blReady;
-    void *pPort;
+    int blReady;  // not 0 when the context is ready
+    void *pPort;  // the port's
 };
 
 extern "C" {

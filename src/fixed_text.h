@@ -60,6 +60,9 @@ class FixedText {
 
     std::size_t FormatV(const char *szFormat, va_list args) __attribute__((format(printf, 2, 0))) {
         const int cb = std::vsnprintf(m_sz, N, szFormat, args);
+        if (cb >= Size()) {
+            DropPartialCharacter(m_sz);
+        }
         return cb < 0 ? 0 : static_cast<std::size_t>(cb);
     }
 

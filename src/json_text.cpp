@@ -3,12 +3,14 @@
 #include <fcntl.h>
 #include <json/reader.h>
 #include <json/writer.h>
+#include <openssl/asn1.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
+#include <string_view>
 
 #include "descriptor.h"
 
@@ -81,6 +83,75 @@ bool HasTooManyValues(const std::string &strText) {
     return false;
 }
 
+// The bytes of the character at the place; 0 when they are none.
+int CharacterLength(std::string_view text, std::size_t at) {
+    constexpr std::size_t kLongest = 4;
+    const std::string_view bytes = text.substr(at, kLongest);
+    unsigned long character = 0;
+    const int cb = UTF8_getc(reinterpret_cast<const unsigned char *>(bytes.data()),
+                             static_cast<int>(bytes.size()), &character);
+    return std::max(cb, 0);
+}
+
+bool IsUtf8(std::string_view text) {
+    std::size_t at = 0;
+    while (at < text.size()) {
+        const int cb = (text[at] & 0x80) == 0 ? 1 : CharacterLength(text, at);
+        if (cb == 0) {
+            return false;
+        }
+        at += static_cast<std::size_t>(cb);
+    }
+    return true;
+}
+
+std::string AsUtf8(std::string_view text) {
+    constexpr std::string_view kReplacement = "\xEF\xBF\xBD";
+    std::string strText;
+    while (!text.empty()) {
+        const int cb = CharacterLength(text, 0);
+        strText += cb == 0 ? kReplacement : text.substr(0, static_cast<std::size_t>(cb));
+        text.remove_prefix(static_cast<std::size_t>(std::max(cb, 1)));
+    }
+    return strText;
+}
+
+std::string_view TextOf(const Json::Value &value) {
+    const char *pBegin = nullptr;
+    const char *pEnd = nullptr;
+    const bool blText = value.isString() && value.getString(&pBegin, &pEnd);
+    return blText ? std::string_view(pBegin, static_cast<std::size_t>(pEnd - pBegin))
+                  : std::string_view();
+}
+
+// JsonCpp's writer takes what follows a byte that begins no character for a part of it.
+bool IsWritable(const Json::Value &value) {
+    if (!value.isArray() && !value.isObject()) {
+        return IsUtf8(TextOf(value));
+    }
+    for (auto member = value.begin(); member != value.end(); ++member) {
+        if ((value.isObject() && !IsUtf8(member.name())) || !IsWritable(*member)) {
+            return false;
+        }
+    }
+    return true;
+}
+
+Json::Value Writable(const Json::Value &value) {
+    if (value.isString()) {
+        return AsUtf8(TextOf(value));
+    }
+    if (!value.isArray() && !value.isObject()) {
+        return value;
+    }
+    Json::Value writable(value.type());
+    for (auto member = value.begin(); member != value.end(); ++member) {
+        (value.isObject() ? writable[AsUtf8(member.name())] : writable.append(Json::Value())) =
+            Writable(*member);
+    }
+    return writable;
+}
+
 void SetError(std::string *pstrError, const std::string &strError) {
     if (pstrError != nullptr) {
         *pstrError = strError;
@@ -94,10 +165,10 @@ bool ToString(const Json::Value &value, std::string &strText) {
         return false;
     }
     try {
-        Json::StreamWriterBuilder builder;
-        builder["indentation"] = "";
-        builder["commentStyle"] = "None";
-        strText = Json::writeString(builder, value);
+        // Takes a fifth of the time of the writer that is configured by a JSON value of its own.
+        Json::FastWriter writer;
+        writer.omitEndingLineFeed();
+        strText = writer.write(IsWritable(value) ? value : Writable(value));
         return true;
     } catch (const Json::Exception &) {
         return false;

@@ -42,12 +42,14 @@ class MovingHandle {
   public:
     MovingHandle() = default;
     explicit MovingHandle(Record *pRecord) : m_pRecord(pRecord) {}
-    ~MovingHandle() { pfnFree(m_pRecord); }
+    ~MovingHandle() { Reset(nullptr); }
     MovingHandle(const MovingHandle &) = delete;
     MovingHandle &operator=(const MovingHandle &) = delete;
 
     void Reset(Record *pRecord) {
-        pfnFree(m_pRecord);
+        if (m_pRecord != nullptr) {
+            pfnFree(m_pRecord);
+        }
         m_pRecord = pRecord;
     }
     Record *Get() const { return m_pRecord; }

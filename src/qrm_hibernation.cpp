@@ -66,8 +66,8 @@ bool IsAlive(const char *szKey) {
 
 // The value of the first record of a live process; the records before it go. Without one the
 // platform's own.
-bool ReadRecords(unsigned long &idleTime) {
-    HashHandle pairs(YLIBCSzHashAlloc(kHashSize));
+bool ReadRecords(HashHandle &pairs, unsigned long &idleTime) {
+    pairs.Reset(YLIBCSzHashAlloc(kHashSize));
     if (pairs.Get() == nullptr) {
         ZELO_LOG("Failed to YLIBCSzHashAlloc");
         return false;
@@ -101,7 +101,9 @@ int Get(unsigned long &idleTime) {
     if (!lock.Take()) {
         return -1;
     }
-    const bool blRead = access(kFile, F_OK) == 0 ? ReadRecords(idleTime) : ReadPlatform(idleTime);
+    HashHandle pairs;
+    const bool blRead =
+        access(kFile, F_OK) == 0 ? ReadRecords(pairs, idleTime) : ReadPlatform(idleTime);
     if (!blRead) {
         return -1;
     }

@@ -66,8 +66,10 @@ TextCopy Copy(const char *szText) {
 
 // "{section:key}": everything between the marks counts, blanks too.
 int FindPlaceholder(const char *szText, char *szSection, char *szKey, int limit) {
-    if (szSection == nullptr || szKey == nullptr) {
-        ZELO_LOG_NULL_ARGUMENT(szSection == nullptr ? "__null != szSection" : "__null != szKey");
+    if (szText == nullptr || szSection == nullptr || szKey == nullptr) {
+        ZELO_LOG_NULL_ARGUMENT(szText == nullptr      ? "__null != szText"
+                               : szSection == nullptr ? "__null != szSection"
+                                                      : "__null != szKey");
         return -1;
     }
     const TextCopy copy = Copy(szText);
@@ -110,8 +112,8 @@ int FindToken(const char *szText, char *szSection, char *szKey, char *szToken, i
     *szClose = '\0';
     char *szRest = szOpen + std::strlen(kOpen);
     const char *szSectionPart = YLIBCStrTokIndex(&szRest, ",");
-    if (szSectionPart == nullptr || szRest == nullptr ||
-        YLIBCStrTrim(szSectionPart, szSection, kTrimmed) <= 0) {
+    if (szSectionPart == nullptr || YLIBCStrTrim(szSectionPart, szSection, kTrimmed) <= 0 ||
+        szRest == nullptr) {
         return -1;
     }
     return YLIBCStrTrim(szRest, szKey, kTrimmed) > 0 ? 0 : -1;
@@ -159,7 +161,11 @@ void Expand(bool (*pfnNext)(const char *, Reference &), const char *szStringsFil
 }
 
 void GetParam(YLIBSZLIST *pslParams, int index, const char *szStringsFile, char *szOut, int cbOut) {
-    if (szOut == nullptr || cbOut <= 0) {
+    if (szOut == nullptr) {
+        ZELO_LOG_NULL_ARGUMENT("__null != szOut");
+        return;
+    }
+    if (cbOut <= 0) {
         return;
     }
     const char *szParam = YLIBCSzListGet(pslParams, index);

@@ -9,7 +9,7 @@
 #include "membership_state.h"
 #include "zeloqrmclient.h"
 
-devserver::DevServer *joined::Joined::s_pServer = nullptr;
+DevServerProcess *joined::Joined::s_pServer = nullptr;
 
 namespace {
 

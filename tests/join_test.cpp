@@ -7,7 +7,7 @@
 #include <filesystem>
 #include <fstream>
 
-#include "dev_server.h"
+#include "dev_server_process.h"
 #include "json_text.h"
 #include "stored.h"
 #include "torture.h"
@@ -42,7 +42,7 @@ std::string HostName() {
 class Join : public testing::Test {
   protected:
     static void SetUpTestSuite() {
-        s_pServer = new devserver::DevServer([] {
+        s_pServer = new DevServerProcess([] {
             devserver::Options options;
             options.token = kToken;
             return options;
@@ -90,10 +90,10 @@ class Join : public testing::Test {
         return strAll;
     }
 
-    static devserver::DevServer *s_pServer;
+    static DevServerProcess *s_pServer;
 };
 
-devserver::DevServer *Join::s_pServer = nullptr;
+DevServerProcess *Join::s_pServer = nullptr;
 
 TEST_F(Join, TheFirstAnsweringConnectionWins) {
     const int http = s_pServer->HttpPort();

@@ -10,7 +10,7 @@
 #include <fstream>
 #include <string>
 
-#include "dev_server.h"
+#include "dev_server_process.h"
 #include "seam.h"
 #include "stored.h"
 
@@ -46,7 +46,7 @@ class Joined : public testing::Test {
     static void SetUpTestSuite() {
         devserver::Options options;
         options.token = kToken;
-        s_pServer = new devserver::DevServer(options);
+        s_pServer = new DevServerProcess(options);
         std::string strReason;
         ASSERT_TRUE(s_pServer->Start(strReason)) << strReason;
         std::filesystem::create_directories(std::filesystem::path(kCaFile).parent_path());
@@ -87,7 +87,7 @@ class Joined : public testing::Test {
                " notified=" + std::to_string(CountLines(kJournal));
     }
 
-    static devserver::DevServer *s_pServer;
+    static DevServerProcess *s_pServer;
 };
 
 }  // namespace joined

@@ -8,15 +8,12 @@
 
 #include <algorithm>
 #include <atomic>
-#include <chrono>
 #include <filesystem>
 #include <fstream>
-#include <random>
 #include <set>
 #include <sstream>
 
 #include "children.h"
-#include "file_lock.h"
 #include "last_error.h"
 
 namespace {
@@ -32,13 +29,11 @@ extern "C" __attribute__((visibility("default"))) int fsync(int fd) {
 namespace {
 
 namespace fs = std::filesystem;
-using Clock = std::chrono::steady_clock;
 using Set = std::set<std::string>;
 using std::string_literals::operator""s;
 
 constexpr const char *kFolder = "/tmp/shared";
 constexpr const char *kFile = "/tmp/shared/a.conf";
-constexpr const char *kLock = "/tmp/shared/a.lock";
 constexpr const char *kTemporary = "/tmp/shared/.a.conf.zelo-new";
 constexpr const char *kVictim = "/tmp/victim.conf";
 
@@ -84,13 +79,6 @@ std::string Value(const char *szPath, const char *szKey) {
 
 int SetValue(const char *szPath, const std::string &strKey, const std::string &strValue) {
     return YLIBCFileSetKeyValue(szPath, strKey.c_str(), strValue.c_str(), 0);
-}
-
-bool SetLocked(const std::string &strKey, const std::string &strValue) {
-    int lock = -1;
-    const bool blSet =
-        YLIBCFileLockByFile(kLock, 0, &lock) == 1 && SetValue(kFile, strKey, strValue) == 0;
-    return YLIBCFileUnlockByFile(lock) == 0 && blSet;
 }
 
 // Sets keys in so many processes at once; false when one of them has failed.
@@ -333,12 +321,6 @@ TEST_F(KeyValueFile, ElsewhereLinksAreFollowedAndStay) {
     }
 }
 
-TEST_F(KeyValueFile, EightProcessesUnderTheLockLoseNoKey) {
-    EXPECT_TRUE(SetInProcesses(8, 1000, [](const auto &strKey) { return SetLocked(strKey, "v"); }));
-    EXPECT_EQ(Lines(kFile).size(), 8000U);
-    EXPECT_EQ(Names(kFolder), (Set{"a.conf", "a.lock"}));
-}
-
 TEST_F(KeyValueFile, WritersOfThePlatformsSettingsExcludeEachOther) {
     Set names = Names("/etc");
     const std::size_t linesBefore = Lines("/etc/zeloinfo.conf").size();
@@ -364,41 +346,6 @@ TEST_F(KeyValueFile, WritersWithoutALockLeaveWholeFiles) {
     EXPECT_EQ(status, 0);
     EXPECT_NE(Value(kFile, "k"), "0");
     EXPECT_EQ(Names(kFolder), Set{"a.conf"});
-}
-
-TEST_F(KeyValueFile, AKilledWriterLeavesTheOldFileOrTheNewOneAndNoLock) {
-    std::string strRest;
-    for (int i = 0; i < 10000; ++i) {
-        strRest += "line" + std::to_string(i) + "=\"some value\"\n";
-    }
-    Write(kFile, "k=0\n" + strRest);
-    std::mt19937 random(1);
-    const auto end = Clock::now() + std::chrono::seconds(2);
-    for (int round = 1; Clock::now() < end; ++round) {
-        const std::string strRound = std::to_string(round) + '.';
-        const children::Signal begun;
-        const pid_t pid = children::Start([&] {
-            bool blAll = SetLocked("k", strRound + '0') && begun.Give();
-            for (int i = 1; blAll; ++i) {
-                blAll = SetLocked("k", strRound + std::to_string(i));
-            }
-            return blAll;
-        });
-        ASSERT_TRUE(begun.Await());
-        const auto moment = Clock::now() + std::chrono::microseconds(random() % 4000);
-        while (Clock::now() < moment) {
-        }
-        children::Kill(pid);
-        int lock = -1;
-        ASSERT_EQ(YLIBCFileLockTimeByFile(kLock, 0, 0, &lock), 1);
-        EXPECT_EQ(YLIBCFileUnlockByFile(lock), 0);
-        const std::string strContent = Content(kFile);
-        EXPECT_EQ(strContent.rfind("k=\"" + strRound, 0), 0U);
-        ASSERT_EQ(strContent.substr(strContent.find('\n') + 1), strRest);
-        EXPECT_LE(Names(kFolder).size(), 3U);
-    }
-    EXPECT_TRUE(SetLocked("k", "last"));
-    EXPECT_EQ(Names(kFolder), (Set{"a.conf", "a.lock"}));
 }
 
 }  // namespace

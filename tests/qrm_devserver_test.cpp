@@ -40,10 +40,14 @@ TEST_F(QrmDevserver, ServesWhatItsFilesNameUntilItIsToldToEnd) {
                               "--https-port", strHttps, "--token-file", "token"});
         EXPECT_EQ(joined.status, 0) << joined.strErr;
         EXPECT_EQ(run_program::Run({QRMCTL, "leave"}).status, 0);
-        const Outcome second = run_program::Run(
-            {DEVSERVER, "--token-file", "token", "--http-port", strHttp, "--ports-file", "ports"});
+        const Outcome second =
+            run_program::Run({DEVSERVER, "--token-file", "token", "--http-port", strHttp});
         EXPECT_EQ(second.status, 1);
         EXPECT_NE(second.strErr.find("port " + strHttp), std::string::npos) << second.strErr;
+        const Outcome third =
+            run_program::Run({DEVSERVER, "--token-file", "token", "--ports-file", "ports"});
+        EXPECT_EQ(third.status, 1);
+        EXPECT_NE(third.strErr.find("'ports'"), std::string::npos) << third.strErr;
 
         EXPECT_TRUE(std::filesystem::exists("ports"));
         server.Signal(signal);
@@ -55,6 +59,20 @@ TEST_F(QrmDevserver, ServesWhatItsFilesNameUntilItIsToldToEnd) {
         }
         EXPECT_FALSE(std::filesystem::exists("ports"));
     }
+}
+
+TEST_F(QrmDevserver, RemovesThePortsOfAKilledServerBeforeItListens) {
+    run_program::Program killed({DEVSERVER, "--token-file", "token", "--ports-file", "ports"});
+    ASSERT_TRUE(run_program::Until([] { return std::filesystem::exists("ports"); }));
+    killed.Signal(SIGKILL);
+    killed.Wait();
+    ASSERT_TRUE(std::filesystem::exists("ports"));
+
+    // This one never gets as far as listening.
+    const Outcome next =
+        run_program::Run({DEVSERVER, "--token-file", "missing", "--ports-file", "ports"});
+    EXPECT_EQ(next.status, 1);
+    EXPECT_FALSE(std::filesystem::exists("ports"));
 }
 
 TEST_F(QrmDevserver, SaysWhatItCannotUse) {

@@ -6,7 +6,7 @@
 #include "json_text.h"
 #include "run_program.h"
 
-devserver::DevServer *joined::Joined::s_pServer = nullptr;
+DevServerProcess *joined::Joined::s_pServer = nullptr;
 
 namespace {
 

@@ -11,7 +11,7 @@
 #include "process.h"
 #include "run_program.h"
 
-devserver::DevServer *joined::Joined::s_pServer = nullptr;
+DevServerProcess *joined::Joined::s_pServer = nullptr;
 
 namespace {
 
@@ -25,7 +25,7 @@ constexpr const char *kPath = "/tmp/files/file";
 // What a command may wait for. Each is held until it is destroyed.
 class Silence {
   public:
-    explicit Silence(devserver::DevServer &server) {
+    explicit Silence(const DevServerProcess &server) {
         devserver::NextAnswer silent;
         silent.delay_ms = 600'000;
         for (const char *szApi :

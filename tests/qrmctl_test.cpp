@@ -4,8 +4,9 @@
 
 #include <filesystem>
 #include <fstream>
+#include <sstream>
 
-#include "dev_server.h"
+#include "dev_server_process.h"
 #include "json_text.h"
 #include "run_program.h"
 #include "stored.h"
@@ -37,7 +38,7 @@ class Qrmctl : public testing::Test {
     static void SetUpTestSuite() {
         devserver::Options options;
         options.token = kToken;
-        s_pServer = new devserver::DevServer(options);
+        s_pServer = new DevServerProcess(options);
         std::string strReason;
         ASSERT_TRUE(s_pServer->Start(strReason)) << strReason;
         s_strHttp = std::to_string(s_pServer->HttpPort());
@@ -102,12 +103,12 @@ class Qrmctl : public testing::Test {
         return strAll;
     }
 
-    static devserver::DevServer *s_pServer;
+    static DevServerProcess *s_pServer;
     static std::string s_strHttp;
     static std::string s_strHttps;
 };
 
-devserver::DevServer *Qrmctl::s_pServer = nullptr;
+DevServerProcess *Qrmctl::s_pServer = nullptr;
 std::string Qrmctl::s_strHttp;
 std::string Qrmctl::s_strHttps;
 
@@ -133,6 +134,48 @@ TEST_F(Qrmctl, WrongUsageIsToldToPeopleAndPrograms) {
         const Json::Value result = RunForJson(row.arguments, 2);
         EXPECT_EQ(result["error_id"], "usage");
         EXPECT_EQ(outcome.strErr, "qrmctl: " + result["error"].asString() + '\n');
+    }
+}
+
+TEST_F(Qrmctl, AMisspeltWordIsToldWithTheOneThatWasMeant) {
+    const struct {
+        Arguments arguments;
+        const char *szSaid;
+    } rows[] = {{{"stats"}, "'stats' is no command of 'qrmctl'; did you mean 'status'?"},
+                {{"jion"}, "did you mean 'join'?"},
+                {{"--jsno", "status"}, "'--jsno' is no option of 'qrmctl'; did you mean '--json'?"},
+                {{"cred"}, "did you mean 'credential'?"},
+                {{"credential", "shwo"}, "of 'qrmctl credential'; did you mean 'show'?"},
+                {{"join", "--sever=h"}, "of 'qrmctl join'; did you mean '--server'?"},
+                {{"credential", "show", "--with"}, "did you mean '--with-token'?"},
+                {{"xq"}, "'xq' is no command of 'qrmctl'; 'qrmctl --help'"},
+                {{"status", "-x"}, "'-x' is no option of 'qrmctl status'; 'qrmctl --help'"},
+                {{"leave", "now"}, "'now' is one argument too many"}};
+    for (const auto &row : rows) {
+        const Outcome outcome = Run(row.arguments);
+        EXPECT_EQ(outcome.status, 2);
+        EXPECT_TRUE(Holds(outcome.strErr, row.szSaid)) << outcome.strErr;
+    }
+}
+
+// How many lines a command's help has; none is wider than a screen.
+int HelpLines(Arguments command) {
+    command.insert(command.begin(), QRMCTL);
+    command.emplace_back("--help");
+    std::istringstream help(run_program::Run(command).strOut);
+    int lines = 0;
+    for (std::string strLine; std::getline(help, strLine); ++lines) {
+        EXPECT_LE(strLine.size(), 80U) << strLine;
+    }
+    return lines;
+}
+
+TEST_F(Qrmctl, HelpFitsAScreen) {
+    const int lines = HelpLines({});
+    EXPECT_LE(lines, 24);
+    EXPECT_GT(lines, 15) << "every command is in it";
+    for (const char *szCommand : {"join", "call", "log", "credential", "get-file"}) {
+        EXPECT_GT(HelpLines({szCommand}), 5);
     }
 }
 

@@ -12,7 +12,7 @@
 #include "torture.h"
 #include "zeloqrmclient.h"
 
-devserver::DevServer *joined::Joined::s_pServer = nullptr;
+DevServerProcess *joined::Joined::s_pServer = nullptr;
 
 namespace {
 
@@ -523,6 +523,31 @@ TEST_F(SendLog, TheServerRefusesWhatIsNoEntry) {
     EXPECT_EQ(entries.All().size(), 1000U);
     EXPECT_EQ(entries.All()[0]["happen_time"], 1);
     EXPECT_EQ(entries.All()[0].size(), 4U);
+}
+
+TEST(JsonText, WhatIsNoUtf8GoesOutAsReplacementCharacters) {
+    const std::pair<const char *, const char *> texts[] = {
+        {"caf\xE9 \"x\"", R"(["caf\ufffd \"x\""])"},
+        {"\xC3"
+         "A",
+         R"(["\ufffdA"])"},
+        {"\xF0\"abc", R"(["\ufffd\"abc"])"},
+        {"\xED\xA0\x80", R"(["\ufffd\ufffd\ufffd"])"},  // half of a surrogate pair
+        {"\xC0\xAF", R"(["\ufffd\ufffd"])"},            // longer than it may be
+        {"é\xF0\x9F\x98\x80", R"(["\u00e9\ud83d\ude00"])"},
+    };
+    for (const auto &[szText, szWritten] : texts) {
+        Json::Value list(Json::arrayValue);
+        list.append(szText);
+        std::string strWritten;
+        EXPECT_TRUE(json_text::ToString(list, strWritten));
+        EXPECT_EQ(strWritten, szWritten);
+    }
+    Json::Value object;
+    object["\xFF"]["b"] = "c\xFF";
+    std::string strWritten;
+    EXPECT_TRUE(json_text::ToString(object, strWritten));
+    EXPECT_EQ(strWritten, R"({"\ufffd":{"b":"c\ufffd"}})");
 }
 
 }  // namespace

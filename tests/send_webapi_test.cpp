@@ -6,8 +6,12 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <chrono>
+#include <random>
 
+#include "children.h"
+#include "file_lock.h"
 #include "joined.h"
 #include "json_text.h"
 #include "last_error.h"
@@ -15,7 +19,7 @@
 #include "torture.h"
 #include "zeloqrmclient.h"
 
-devserver::DevServer *joined::Joined::s_pServer = nullptr;
+DevServerProcess *joined::Joined::s_pServer = nullptr;
 
 namespace {
 
@@ -276,7 +280,7 @@ TEST_F(SendWebapi, PlainHttpAsksForProtectedParameters) {
 
 TEST_F(SendWebapi, TheTokensGoToTheServerAloneAndAsHeaders) {
     EXPECT_EQ(Call(), "0");
-    devserver::DevServer other{devserver::Options()};
+    DevServerProcess other{devserver::Options()};
     std::string strReason;
     ASSERT_TRUE(other.Start(strReason)) << strReason;
     devserver::NextAnswer redirect;
@@ -314,7 +318,7 @@ TEST_F(SendWebapi, NoServerKeepsACallForEver) {
     endless.endless = true;
     devserver::NextAnswer cut;
     cut.cut_after = 5;
-    std::vector<pid_t> children;
+    std::vector<pid_t> calls;
     const char *const methods[] = {"silent", "slow", "endless", "cut", "silent-file", "slow-file"};
     devserver::NextAnswer answers[] = {silent, slow, endless, cut, silent, slow};
     for (std::size_t i = 0; i < std::size(methods); ++i) {
@@ -323,10 +327,7 @@ TEST_F(SendWebapi, NoServerKeepsACallForEver) {
         s_pServer->AnswerNext(kApi, answers[i]);
     }
     for (const char *szMethod : methods) {
-        std::fflush(nullptr);
-        const pid_t pid = fork();
-        ASSERT_GE(pid, 0);
-        if (pid == 0) {
+        calls.push_back(children::Start([szMethod] {
             const auto start = std::chrono::steady_clock::now();
             // A file may be endless; silent and slow are no better than in a call.
             const std::string strMethod = szMethod;
@@ -335,17 +336,12 @@ TEST_F(SendWebapi, NoServerKeepsACallForEver) {
             const int result =
                 blFile ? ZELOQRMClientGetFile("/tmp/" + strMethod, kApi, 1, strMethod, params)
                        : std::stoi(Call(false, szMethod));
-            const bool blFailed = result == -1;
-            const auto taken = std::chrono::steady_clock::now() - start;
-            _exit(blFailed && taken < std::chrono::seconds(45) ? 0 : 1);
-        }
-        children.push_back(pid);
+            return result == -1 &&
+                   std::chrono::steady_clock::now() - start < std::chrono::seconds(45);
+        }));
     }
-    for (pid_t pid : children) {
-        int status = -1;
-        waitpid(pid, &status, 0);
-        EXPECT_EQ(status, 0);
-    }
+    EXPECT_EQ(static_cast<std::size_t>(std::count_if(calls.begin(), calls.end(), children::Ended)),
+              std::size(methods));
 }
 
 // --- Client info update -------------------------------------------------------------------------
@@ -620,25 +616,60 @@ TEST_F(SendWebapi, KeysOfTheInfoFileAreReadAsTheyWereWritten) {
 TEST_F(SendWebapi, WritersOfTheInfoFileLoseNothingOfEachOther) {
     constexpr int kProcesses = 8;
     constexpr int kKeys = 1000;
-    std::vector<pid_t> children;
+    std::vector<pid_t> writers;
     for (int i = 0; i < kProcesses; ++i) {
-        const pid_t pid = fork();
-        ASSERT_GE(pid, 0);
-        if (pid == 0) {
+        writers.push_back(children::Start([i] {
             bool blAll = true;
             for (int key = 0; key < kKeys; ++key) {
                 blAll = ZELOQRMClientSetInfo(std::to_string(i * kKeys + key), "v") && blAll;
             }
-            _exit(blAll ? 0 : 1);
-        }
-        children.push_back(pid);
+            return blAll;
+        }));
     }
-    for (pid_t pid : children) {
-        int status = -1;
-        waitpid(pid, &status, 0);
-        EXPECT_EQ(status, 0);
-    }
+    EXPECT_EQ(std::count_if(writers.begin(), writers.end(), children::Ended), kProcesses);
     EXPECT_EQ(joined::CountLines(joined::kInfoFile), kProcesses * kKeys);
+}
+
+TEST_F(SendWebapi, AKilledWriterLeavesTheOldInfoFileOrTheNewOneAndNoLock) {
+    using Clock = std::chrono::steady_clock;
+    const auto filesInTmp = [] {
+        const std::filesystem::directory_iterator files("/tmp");
+        return std::distance(begin(files), end(files));
+    };
+    std::string strRest;
+    for (int i = 0; i < 10000; ++i) {
+        strRest += "line" + std::to_string(i) + "=\"some value\"\n";
+    }
+    std::ofstream(joined::kInfoFile) << "k=0\n" << strRest;
+    EXPECT_TRUE(ZELOQRMClientSetInfo("k", "first"));
+    const auto filesBefore = filesInTmp();
+    std::mt19937 random(1);
+    const auto end = Clock::now() + std::chrono::seconds(2);
+    for (int round = 1; Clock::now() < end; ++round) {
+        const std::string strRound = std::to_string(round) + '.';
+        const children::Signal begun;
+        const pid_t pid = children::Start([&] {
+            bool blAll = ZELOQRMClientSetInfo("k", strRound + '0') && begun.Give();
+            for (int i = 1; blAll; ++i) {
+                blAll = ZELOQRMClientSetInfo("k", strRound + std::to_string(i));
+            }
+            return blAll;
+        });
+        ASSERT_TRUE(begun.Await());
+        const auto moment = Clock::now() + std::chrono::microseconds(random() % 4000);
+        while (Clock::now() < moment) {
+        }
+        children::Kill(pid);
+        int lock = -1;
+        ASSERT_EQ(YLIBCFileLockTimeByFile("/tmp/qrm_client.info.lock", 0, 0, &lock), 1);
+        EXPECT_EQ(YLIBCFileUnlockByFile(lock), 0);
+        const std::string strContent = FileText(joined::kInfoFile);
+        EXPECT_EQ(strContent.rfind("k=\"" + strRound, 0), 0U);
+        ASSERT_EQ(strContent.substr(strContent.find('\n') + 1), strRest);
+        EXPECT_LE(filesInTmp(), filesBefore + 1) << "what one leaves, the next one takes";
+    }
+    EXPECT_TRUE(ZELOQRMClientSetInfo("k", "last"));
+    EXPECT_EQ(filesInTmp(), filesBefore);
 }
 
 TEST_F(SendWebapi, NotificationsNameTheServer) {

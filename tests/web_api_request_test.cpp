@@ -10,7 +10,7 @@
 #include <memory>
 #include <set>
 
-#include "dev_server.h"
+#include "dev_server_process.h"
 #include "last_error.h"
 #include "web_api_request.h"
 
@@ -45,7 +45,7 @@ class Request : public testing::Test {
         Write(kConfig, "");
     }
     void Start(const devserver::Options &options) {
-        m_pServer = std::make_unique<devserver::DevServer>(options);
+        m_pServer = std::make_unique<DevServerProcess>(options);
         std::string strReason;
         ASSERT_TRUE(m_pServer->Start(strReason)) << strReason;
     }
@@ -64,7 +64,7 @@ class Request : public testing::Test {
         m_pServer->AnswerNext(kApi, answer);
     }
 
-    std::unique_ptr<devserver::DevServer> m_pServer;
+    std::unique_ptr<DevServerProcess> m_pServer;
 };
 
 TEST_F(Request, OnlyAVerifiedServerIsSpokenTo) {
@@ -155,13 +155,14 @@ TEST_F(Request, UnusableAnswersCountAsNone) {
     redirect.headers["Location"] = "/qrm/discover?api=ZELO.QRM.RPC";
     devserver::NextAnswer cut;
     cut.cut_after = 5;
+    devserver::NextAnswer endless;
+    endless.endless = true;
     for (const devserver::NextAnswer &answer :
          {body("<html>"), body(""), body("[]"), body("7"), body(R"({"success":"yes"})"),
           body(R"({"success":true,"data":[]})"), body(R"({"success":true,"data":{"path":1}})"),
           path("relative"), path(""), path("/a b"), path("/a?b"), path("/a\\r\\nX: y"),
-          path("/" + std::string(2000, 'a')), body(std::string(17 << 20, ' ')),
-          body(std::string(2000, '[')), body(R"({"success":true,"data":{"path":"/x"}})", 500),
-          redirect, cut}) {
+          path("/" + std::string(2000, 'a')), endless, body(std::string(2000, '[')),
+          body(R"({"success":true,"data":{"path":"/x"}})", 500), redirect, cut}) {
         AnswerDiscovery(answer);
         EXPECT_EQ(Http(), "") << answer.body.value_or("").substr(0, 60);
     }

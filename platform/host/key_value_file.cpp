@@ -38,6 +38,10 @@ std::string_view Trim(std::string_view text) {
 // The text up to the closing quote. What follows that quote does not count; without one the value
 // ends with the line.
 std::string Unquote(std::string_view quoted) {
+    const std::string_view plain = quoted.substr(1, quoted.find('"', 1) - 1);
+    if (plain.find('\\') == std::string_view::npos) {
+        return std::string(plain);
+    }
     std::string strValue;
     for (std::size_t i = 1; i < quoted.size() && quoted[i] != '"'; ++i) {
         if (quoted[i] == '\\' && i + 1 < quoted.size()) {
@@ -205,6 +209,8 @@ int ReadPairs(const char *szPath, YLIBSZHASH **ppHash) {
     // Of several lines with a key the first one holds: what it has set is not set again.
     YLIBSZHASH &hash = **ppHash;
     std::vector<bool> blOldSet(static_cast<std::size_t>(hash.nItem), false);
+    constexpr std::size_t kUsualLine = 16;
+    host::MakeRoomForKeys(hash, strText.size() / kUsualLine);
     int keys = 0;
     Line line;
     for (std::string_view rest = strText; TakeLine(rest, line);) {

@@ -125,31 +125,23 @@ void FillBuckets(Directory &directory) {
     }
 }
 
-DirectoryHandle Build(int fd) {
-    const auto pDirectory = std::make_shared<Directory>();
-    bool blSettled = false;
-    if (!ReadState(fd, pDirectory->file, blSettled)) {
-        return nullptr;
-    }
-    pDirectory->end = pDirectory->file.st_size;
-    auto &entries = pDirectory->entries;
-    const auto add = [&](off_t begin, std::string_view name) {
-        if (entries.size() == kMaxEntries || begin > std::numeric_limits<std::uint32_t>::max()) {
-            pDirectory->end = begin;
+// Adds the sections from the directory's end on, up to one with the hash and no further.
+bool ReadOn(int fd, std::uint32_t hash, Directory &directory) {
+    auto &entries = directory.entries;
+    const std::size_t known = entries.size();
+    const off_t begin = std::exchange(directory.end, directory.file.st_size);
+    const auto add = [&](off_t at, std::string_view name) {
+        directory.blFull =
+            entries.size() == kMaxEntries || at > std::numeric_limits<std::uint32_t>::max();
+        // Where the wanted section ends is known when the next one begins.
+        if (directory.blFull || (entries.size() > known && entries.back().hash == hash)) {
+            directory.end = at;
             return false;
         }
-        entries.push_back({Hash(name), static_cast<std::uint32_t>(begin), kNoEntry});
+        entries.push_back({Hash(name), static_cast<std::uint32_t>(at), kNoEntry});
         return true;
     };
-    if (!WalkSections(fd, 0, pDirectory->end, add)) {
-        return nullptr;
-    }
-    entries.shrink_to_fit();
-    FillBuckets(*pDirectory);
-    if (blSettled) {
-        Keep(pDirectory);
-    }
-    return pDirectory;
+    return WalkSections(fd, begin, directory.file.st_size, add);
 }
 
 std::shared_ptr<const std::string> FindTextLocked(const Directory &directory, std::size_t index) {
@@ -163,6 +155,26 @@ std::shared_ptr<const std::string> FindTextLocked(const Directory &directory, st
 
 std::size_t Size(const KeptText &kept) {
     return kept.pText->size() + kTextOverhead;
+}
+
+// Drops the oldest texts that a directory, and what is to be added to it, leave no room for.
+void DropTexts(const Directory &directory, std::size_t cbAdded) {
+    auto &texts = directory.texts;
+    std::size_t cb = sizeof(Directory) + directory.entries.size() * sizeof(Entry) + cbAdded;
+    for (const KeptText &kept : texts) {
+        cb += Size(kept);
+    }
+    auto keepFrom = texts.begin();
+    for (; keepFrom != texts.end() && cb > kMaxBytes; ++keepFrom) {
+        cb -= Size(*keepFrom);
+    }
+    texts.erase(texts.begin(), keepFrom);
+}
+
+// What is known of the file already.
+std::shared_ptr<Directory> Copy(const Directory &directory) {
+    const std::lock_guard<std::mutex> lock(TheTable().mutex);
+    return std::make_shared<Directory>(directory);
 }
 
 }  // namespace
@@ -193,8 +205,30 @@ DirectoryHandle Get(int fd) {
     if (fstat(fd, &state) != 0 || !S_ISREG(state.st_mode)) {
         return nullptr;
     }
-    auto pDirectory = Find(state);
-    return pDirectory != nullptr ? pDirectory : Build(fd);
+    if (auto pKept = Find(state)) {
+        return pKept;
+    }
+    const auto pDirectory = std::make_shared<Directory>();
+    pDirectory->file = state;
+    FillBuckets(*pDirectory);
+    return pDirectory;
+}
+
+DirectoryHandle Extend(int fd, const Directory &directory, std::string_view section) {
+    struct stat state = {};
+    bool blSettled = false;
+    const auto pDirectory = Copy(directory);
+    if (!ReadState(fd, state, blSettled) || !IsUnchanged(state, pDirectory->file) ||
+        !ReadOn(fd, Hash(section), *pDirectory)) {
+        return nullptr;
+    }
+    pDirectory->entries.shrink_to_fit();
+    FillBuckets(*pDirectory);
+    DropTexts(*pDirectory, 0);
+    if (blSettled) {
+        Keep(pDirectory);
+    }
+    return pDirectory;
 }
 
 void Forget(const Directory &directory) {
@@ -217,18 +251,9 @@ void KeepText(const Directory &directory, std::size_t index, std::string_view te
     if (FindTextLocked(directory, index) != nullptr) {
         return;  // another thread was faster
     }
-    auto &texts = directory.texts;
-    std::size_t cb = sizeof(Directory) + directory.entries.size() * sizeof(Entry) + Size(kept);
-    for (const KeptText &other : texts) {
-        cb += Size(other);
-    }
-    auto keepFrom = texts.begin();
-    for (; keepFrom != texts.end() && cb > kMaxBytes; ++keepFrom) {
-        cb -= Size(*keepFrom);
-    }
-    texts.erase(texts.begin(), keepFrom);
-    if (cb <= kMaxBytes) {
-        texts.push_back(std::move(kept));
+    DropTexts(directory, Size(kept));
+    if (sizeof(Directory) + directory.entries.size() * sizeof(Entry) + Size(kept) <= kMaxBytes) {
+        directory.texts.push_back(std::move(kept));
     }
 }
 

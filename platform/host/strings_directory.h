@@ -2,8 +2,8 @@
 //
 // A process keeps the directories of the files that it reads, and in each the text of the sections
 // read last, so that looking a key up reads one section, or asks only whether the file is still the
-// same. A directory takes 64 KiB at most; sections behind those that fit into it are searched for
-// each time.
+// same. A directory grows with what is looked up: a file is read only as far as it has to be. It
+// takes 64 KiB at most; sections behind those that fit into it are searched for each time.
 
 #ifndef ZELO_HOST_STRINGS_DIRECTORY_H
 #define ZELO_HOST_STRINGS_DIRECTORY_H
@@ -41,6 +41,7 @@ struct Directory {
     struct stat file = {};       // the state of the file that the directory describes
     std::vector<Entry> entries;  // in the file's order
     off_t end = 0;               // sections that begin here or later are not in the directory
+    bool blFull = false;         // and do not fit into it
 
     // The first entry of each bucket; a hash belongs to the bucket of its remainder.
     std::array<std::uint16_t, kBuckets> buckets = {};
@@ -55,9 +56,13 @@ std::uint32_t Hash(std::string_view name);
 // The kept directory of the file in the given state; null when there is none.
 DirectoryHandle Find(const struct stat &state);
 
-// The directory, kept or new, of the file as it is now. Null when it is no regular file or cannot
-// be read to its end.
+// The directory of the file as it is now: the kept one, or one that is still empty. Null when it is
+// no regular file.
 DirectoryHandle Get(int fd);
+
+// The directory with the next section of the name, and those before it; with all sections, or as
+// many as fit, when there is none. Null when the file changed meanwhile or cannot be read so far.
+DirectoryHandle Extend(int fd, const Directory &directory, std::string_view section);
 
 // Forgets a kept directory that was found wrong.
 void Forget(const Directory &directory);

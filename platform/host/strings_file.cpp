@@ -32,6 +32,7 @@ enum class Result {
     kFound,
     kAbsent,
     kUnread,  // the file has to be opened to know
+    kBeyond,  // the directory does not reach so far yet
     kChanged  // the file is not what the directory describes
 };
 
@@ -138,6 +139,9 @@ Result Search(const Question &question, const directory::Directory &directory,
     if (directory.end == directory.file.st_size) {
         return Result::kAbsent;
     }
+    if (!directory.blFull) {
+        return Result::kBeyond;
+    }
     return question.fd < 0 ? Result::kUnread
                            : SearchRest(question, directory.end, directory.file.st_size, strValue);
 }
@@ -154,11 +158,15 @@ Result SearchKept(const char *szPath, const Question &question, std::string &str
 
 Result SearchFile(const Question &question, std::string &strValue) {
     for (int attempt = 0; attempt < kAttempts; ++attempt) {
-        const auto pDirectory = directory::Get(question.fd);
+        auto pDirectory = directory::Get(question.fd);
+        Result result = Result::kBeyond;
+        while (pDirectory != nullptr &&
+               (result = Search(question, *pDirectory, strValue)) == Result::kBeyond) {
+            pDirectory = directory::Extend(question.fd, *pDirectory, question.section);
+        }
         if (pDirectory == nullptr) {
             continue;
         }
-        const Result result = Search(question, *pDirectory, strValue);
         if (result != Result::kChanged) {
             return result;
         }

@@ -27,9 +27,11 @@ struct YLIBSZLIST_ITEMS {
 
 struct YLIBSZHASH_PAIRS {
     struct Pair {
+        Pair(std::string_view key, std::size_t keyHash) : strKey(key), hash(keyHash) {}
+
         std::string strKey;
         std::string strValue;
-        std::size_t hash = 0;
+        std::size_t hash;
     };
     YLIBSZHASH record = {0, this};
     std::deque<Pair> inOrder;  // of the keys' coming; what a deque holds never moves
@@ -138,14 +140,18 @@ std::uint32_t &SlotOf(YLIBSZHASH_PAIRS &pairs, std::string_view key, std::size_t
     return pairs.slots[at];
 }
 
-// Makes room for one more key.
-void GrowSlots(YLIBSZHASH_PAIRS &pairs) {
+// Makes room for more keys.
+void GrowSlots(YLIBSZHASH_PAIRS &pairs, std::size_t more) {
     constexpr std::size_t kFirstSlots = 64;
     const auto keys = static_cast<std::size_t>(pairs.record.nItem);
-    if (2 * (keys + 1) <= pairs.slots.size()) {
+    if (2 * (keys + more) <= pairs.slots.size()) {
         return;
     }
-    std::vector<std::uint32_t> slots(std::max(kFirstSlots, 2 * pairs.slots.size()), 0);
+    std::size_t count = std::max(kFirstSlots, pairs.slots.size());
+    while (count < 2 * (keys + more)) {
+        count *= 2;
+    }
+    std::vector<std::uint32_t> slots(count, 0);
     pairs.slots.swap(slots);
     for (std::size_t i = 0; i < keys; ++i) {
         const YLIBSZHASH_PAIRS::Pair &pair = pairs.inOrder[i];
@@ -184,16 +190,21 @@ const char *YLIBCSzListGet(const YLIBSZLIST *pslList, int index) {
 
 // --- Hashes -------------------------------------------------------------------------------------
 
+void host::MakeRoomForKeys(YLIBSZHASH &hash, std::size_t more) {
+    GrowSlots(*hash.pPairs, more);
+}
+
 host::PlaceInHash host::FindOrAddKey(YLIBSZHASH &hash, std::string_view key) {
     YLIBSZHASH_PAIRS &pairs = *hash.pPairs;
-    GrowSlots(pairs);
+    GrowSlots(pairs, 1);
     const std::size_t keyHash = std::hash<std::string_view>()(key);
     std::uint32_t &slot = SlotOf(pairs, key, keyHash);
-    if (slot == 0) {
-        pairs.inOrder.push_back({std::string(key), {}, keyHash});
-        slot = static_cast<std::uint32_t>(++hash.nItem);
+    if (slot != 0) {
+        return {slot - 1, pairs.inOrder[slot - 1].strValue};
     }
-    return {slot - 1, pairs.inOrder[slot - 1].strValue};
+    std::string &strValue = pairs.inOrder.emplace_back(key, keyHash).strValue;
+    slot = static_cast<std::uint32_t>(++hash.nItem);
+    return {slot - 1, strValue};
 }
 
 YLIBSZHASH *YLIBCSzHashAlloc(int cbInitial) {

@@ -1,0 +1,107 @@
+#include "dev_server_process.h"
+
+#include <gtest/gtest.h>
+#include <httplib.h>
+#include <json/writer.h>
+#include <sys/prctl.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <csignal>
+
+#include "json_text.h"
+
+DevServerProcess::~DevServerProcess() {
+    if (m_pid > 0) {
+        kill(m_pid, SIGKILL);
+        waitpid(m_pid, nullptr, 0);
+    }
+}
+
+// In the child process: says the ports and the authority's certificate, or why there are none.
+void DevServerProcess::Serve(int fd) const {
+    prctl(PR_SET_PDEATHSIG, SIGKILL);
+    devserver::DevServer server(m_options);
+    std::string strText;
+    const bool blStarted = server.Start(strText);
+    if (blStarted) {
+        strText = server.CaPem();
+    }
+    const Ports ports{server.HttpPort(), server.HttpsPort()};
+    if (write(fd, &blStarted, sizeof(blStarted)) < 0 || write(fd, &ports, sizeof(ports)) < 0 ||
+        write(fd, strText.data(), strText.size()) < 0) {
+        _exit(1);
+    }
+    close(fd);
+    for (;;) {
+        pause();
+    }
+}
+
+bool DevServerProcess::Start(std::string &strReason) {
+    int fds[2] = {-1, -1};
+    if (pipe2(fds, O_CLOEXEC) != 0 || (m_pid = fork()) < 0) {
+        strReason = "no process for the development server";
+        return false;
+    }
+    if (m_pid == 0) {
+        close(fds[0]);
+        Serve(fds[1]);
+    }
+    close(fds[1]);
+    bool blStarted = false;
+    std::string strText;
+    char sz[4096];
+    ssize_t cb = read(fds[0], &blStarted, sizeof(blStarted));
+    cb = read(fds[0], &m_ports, sizeof(m_ports));
+    while ((cb = read(fds[0], sz, sizeof(sz))) > 0) {
+        strText.append(sz, static_cast<std::size_t>(cb));
+    }
+    close(fds[0]);
+    (blStarted ? m_strCaPem : strReason) = strText;
+    return blStarted;
+}
+
+Json::Value DevServerProcess::Ask(const std::string &strMethod, const std::string &strPath,
+                                  const std::string &strBody) const {
+    httplib::Client client("127.0.0.1", m_ports.http);
+    httplib::Request request;
+    request.method = strMethod;
+    request.path = strPath;
+    request.body = strBody;
+    Json::Value reply;
+    const httplib::Result result = client.send(request);
+    EXPECT_TRUE(result && result->status == 200 && json_text::FromString(result->body, reply))
+        << strMethod << ' ' << strPath << ": " << (result ? result->body : "no reply");
+    return reply;
+}
+
+void DevServerProcess::AnswerNext(const std::string &strApi,
+                                  const devserver::NextAnswer &answer) const {
+    Json::Value next;
+    next["api"] = strApi;
+    next["method"] = answer.method;
+    next["delay_ms"] = answer.delay_ms;
+    next["bytes_per_s"] = answer.bytes_per_s;
+    next["endless"] = answer.endless;
+    next["times"] = answer.times;
+    next["headers"] = Json::objectValue;
+    for (const auto &[strName, strValue] : answer.headers) {
+        next["headers"][strName] = strValue;
+    }
+    if (answer.status) {
+        next["status"] = *answer.status;
+    }
+    if (answer.body) {
+        next["body"] = *answer.body;
+    }
+    if (answer.error_code) {
+        next["error_code"] = *answer.error_code;
+    }
+    if (answer.cut_after) {
+        next["cut_after"] = static_cast<Json::UInt64>(*answer.cut_after);
+    }
+    Json::StreamWriterBuilder builder;
+    builder["emitUTF8"] = true;  // a body may be no text at all
+    Ask("POST", "/dev/next", Json::writeString(builder, next));
+}
