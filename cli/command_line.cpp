@@ -41,6 +41,7 @@ void AddCommandLine(CLI::App &app, Action &action, CommonOptions &options) {
     AddWelcome(app, action);
     AddPlugins(app, action);
     AddIdle(app, action);
+    AddDoctor(app, action);
     AddCommonOptions(app, options);
 }
 
