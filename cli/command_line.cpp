@@ -42,6 +42,7 @@ void AddCommandLine(CLI::App &app, Action &action, CommonOptions &options) {
     AddPlugins(app, action);
     AddIdle(app, action);
     AddDoctor(app, action);
+    AddSupport(app, action);
     AddCommonOptions(app, options);
 }
 

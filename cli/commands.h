@@ -29,6 +29,7 @@ void AddPlugins(CLI::App &app, Action &action);
 void AddLog(CLI::App &app, Action &action);
 void AddIdle(CLI::App &app, Action &action);
 void AddDoctor(CLI::App &app, Action &action);
+void AddSupport(CLI::App &app, Action &action);
 
 }  // namespace qrmctl
 
