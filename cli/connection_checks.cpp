@@ -88,8 +88,8 @@ class Story {
 
 std::vector<const char *> Names(const Way &way) {
     if (way.IsRelayed()) {
-        return {"relay", "name_resolution", "tcp",  "tunnel", "authorities",
-                "tls",   "certificate",     "http", "clock",  "api"};
+        return {"relay", "name_resolution", "tcp",  "authorities", "tunnel",
+                "tls",   "certificate",     "http", "clock",       "api"};
     }
     if (way.IsSecure()) {
         return {"name_resolution", "tcp",  "authorities", "tls",
