@@ -8,6 +8,7 @@
 
 #include <algorithm>
 #include <array>
+#include <cstdlib>
 #include <memory>
 #include <new>
 
@@ -182,6 +183,20 @@ Url BuildUrl(const Way &way, Extent extent, const char *szPath, const std::strin
     return pUrl;
 }
 
+// The proxy that libcurl would take from the environment for the way; empty for none.
+const char *EnvironmentProxy(const Way &way) {
+    const std::array<const char *, 4> names = {way.IsSecure() ? "https_proxy" : "http_proxy",
+                                               way.IsSecure() ? "HTTPS_PROXY" : "http_proxy",
+                                               "all_proxy", "ALL_PROXY"};
+    for (const char *szName : names) {
+        const char *szProxy = std::getenv(szName);
+        if (szProxy != nullptr) {
+            return szProxy;
+        }
+    }
+    return "";
+}
+
 void SetWay(CURL *pEasy, const Way &way, Extent extent) {
     if (way.IsRelayed()) {
         curl_easy_setopt(pEasy, CURLOPT_PROXY, ("http://" + RelayAddress()).c_str());
@@ -190,6 +205,9 @@ void SetWay(CURL *pEasy, const Way &way, Extent extent) {
         curl_easy_setopt(pEasy, CURLOPT_SUPPRESS_CONNECT_HEADERS, 1L);
     } else if (YLIBCFileCheckKeyValue(kConfigFile, "use_proxy_environment", "yes", 0) != 1) {
         curl_easy_setopt(pEasy, CURLOPT_PROXY, "");
+    } else if (extent == Extent::kConnect) {
+        // Its URL has another scheme than the way, and thus another variable.
+        curl_easy_setopt(pEasy, CURLOPT_PROXY, EnvironmentProxy(way));
     }
 }
 

@@ -234,8 +234,7 @@ TEST_F(Doctor, NamesTheStepThatFailsAndWhatMendsIt) {
          [&] { return fs::remove(kCaFile), https(); }},
         {"oof-----", kCaFile, good, [&] { return Write(kCaFile, "no certificate"), https(); }},
         {"oooowo-o", "2 days left", ending, https},
-        {"oooooowo", "the server's clock is 36", good,
-         [&] { return TellTime(now - kHour), https(); }},
+        {"oooooowo", " s behind", good, [&] { return TellTime(now - kHour), https(); }},
         {"ooooof--", "status 500", good, [&] { return AnswerDiscovery(fault), https(); }},
         {"oooooo-f", "error code 102", good, [&] { return AnswerDiscovery(unknown), https(); }},
         {"oowo-o", "nothing is encrypted", good,
@@ -401,13 +400,15 @@ TEST_F(Support, NoSecretLeavesTheAppliance) {
         EXPECT_FALSE(Holds(strAll, strSecret)) << strSecret;
     }
     for (const char *szPart :
-         {"0123456789", "9876543210", "n0body-knows", "re1ay-pw", "other: x", "MTIzNDU2Nzg5"}) {
+         {"0123456789", "9876543210", "n0body-knows", "re1ay-pw", "MTIzNDU2Nzg5"}) {
         EXPECT_FALSE(Holds(strAll, szPart)) << szPart;
     }
     // What is no secret is still there.
-    const std::string strKept = Unpacked("log.txt");
-    EXPECT_EQ(std::count(strKept.begin(), strKept.end(), '\n'), std::size(secrets) + 1) << strKept;
-    EXPECT_TRUE(Holds(strKept, "qrmctl: said <[redacted]> so\n"));
+    std::string strKept;
+    for (std::size_t i = 0; i < std::size(secrets); ++i) {
+        strKept += "qrmctl: said <[redacted]> so\n";
+    }
+    EXPECT_EQ(Unpacked("log.txt"), strKept + "qrmctl: Authorization:[redacted]\n");
     EXPECT_TRUE(Holds(Unpacked("notifications.jsonl"), R"("tag":"T")"));
     EXPECT_TRUE(Holds(Unpacked("client_info.txt"), "url=\"http://[redacted]@h/\""));
     EXPECT_TRUE(Holds(Unpacked("configuration.txt"), "[redacted]@relay:80"));
