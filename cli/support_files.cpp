@@ -70,11 +70,11 @@ std::string LastLines(const std::string &strText, std::size_t count,
     return strLast;
 }
 
-// While it lives, what the program prints goes into a text.
+// While it lives, what the program prints goes into texts.
 class CapturedOutput {
   public:
     CapturedOutput()
-        : m_pOut(std::cout.rdbuf(m_text.rdbuf())), m_pErr(std::cerr.rdbuf(m_text.rdbuf())) {}
+        : m_pOut(std::cout.rdbuf(m_out.rdbuf())), m_pErr(std::cerr.rdbuf(m_err.rdbuf())) {}
     ~CapturedOutput() {
         std::cout.rdbuf(m_pOut);
         std::cerr.rdbuf(m_pErr);
@@ -82,10 +82,12 @@ class CapturedOutput {
     CapturedOutput(const CapturedOutput &) = delete;
     CapturedOutput &operator=(const CapturedOutput &) = delete;
 
-    std::string Text() const { return m_text.str(); }
+    std::string Out() const { return m_out.str(); }
+    std::string Err() const { return m_err.str(); }
 
   private:
-    std::ostringstream m_text;
+    std::ostringstream m_out;
+    std::ostringstream m_err;
     std::streambuf *m_pOut;
     std::streambuf *m_pErr;
 };
@@ -100,7 +102,9 @@ std::string OutputOf(const std::string &strCommand) {
     Report report(options.blJson);
     const CapturedOutput output;
     const ExitCode code = action(report);
-    return output.Text() + (options.blJson ? "" : "exit status: " + std::to_string(code) + '\n');
+    return options.blJson
+               ? output.Out()
+               : output.Out() + output.Err() + "exit status: " + std::to_string(code) + '\n';
 }
 
 // --- Texts --------------------------------------------------------------------------------------

@@ -419,7 +419,9 @@ TEST_F(Support, NoSecretLeavesTheAppliance) {
     EXPECT_TRUE(Holds(Unpacked("doctor.txt"), "error code 105"));
     for (const char *szName : {"doctor.json", "status.json"}) {
         Json::Value value;
-        EXPECT_TRUE(json_text::FromString(Unpacked(szName), value)) << szName;
+        const std::string strText = Unpacked(szName);
+        EXPECT_TRUE(json_text::FromString(strText, value)) << szName;
+        EXPECT_EQ(strText.find('\n') + 1, strText.size()) << strText;
     }
 }
 
