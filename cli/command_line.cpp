@@ -70,6 +70,8 @@ void AddCommandLine(CLI::App &app, Action &action, CommonOptions &options) {
     AddWelcome(app, action);
     AddPlugins(app, action);
     AddIdle(app, action);
+    AddDoctor(app, action);
+    AddSupport(app, action);
     AddCommonOptions(app, options);
     AddTexts(app);
 }

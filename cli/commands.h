@@ -28,6 +28,8 @@ void AddWelcome(CLI::App &app, Action &action);
 void AddPlugins(CLI::App &app, Action &action);
 void AddLog(CLI::App &app, Action &action);
 void AddIdle(CLI::App &app, Action &action);
+void AddDoctor(CLI::App &app, Action &action);
+void AddSupport(CLI::App &app, Action &action);
 
 }  // namespace qrmctl
 

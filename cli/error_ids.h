@@ -20,10 +20,12 @@ enum ExitCode {
 enum class ErrorId {
     kAccountNotCreated,
     kAccountNotDeleted,
+    kArchiveNotWritten,
     kBadDestination,
     kBadInput,
     kBusy,
     kCaUnreadable,
+    kCheckFailed,
     kCredentialNotChanged,
     kCredentialNotRemoved,
     kCredentialNotStored,

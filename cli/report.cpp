@@ -1,14 +1,17 @@
 #include "report.h"
 
 #include <json/writer.h>
+#include <openssl/x509.h>
 
 #include <algorithm>
+#include <array>
 #include <cstdio>
 #include <iostream>
+#include <memory>
 
+#include "certificate_authorities.h"
 #include "deadline.h"
 #include "json_text.h"
-#include "web_api_request.h"
 
 namespace qrmctl {
 
@@ -108,11 +111,15 @@ ExitCode Report::Fail(ErrorId id, const std::string &strError) {
 
 // A sentence about a certificate authority that cannot be read; empty when all can.
 static std::string AuthorityFlaw() {
-    std::string strFile;
-    return ZELO::CredRequestUtil::FindUnreadableAuthority(strFile)
-               ? "cannot read certificates from '" + strFile +
-                     "', so that no server is trusted over https: mend or remove it"
-               : std::string();
+    std::array<char, 4096> place = {};
+    const std::unique_ptr<X509_STORE, void (*)(X509_STORE *)> pStore(X509_STORE_new(),
+                                                                     X509_STORE_free);
+    if (ZELOCertAddAuthorities(pStore.get(), place.data(), static_cast<int>(place.size())) == 0 ||
+        place[0] == '\0') {
+        return {};
+    }
+    return std::string("cannot read certificates from '") + place.data() +
+           "', so that no server is trusted over https: mend or remove it";
 }
 
 void Report::WarnOfAuthority() {

@@ -80,11 +80,6 @@ typedef bool (*ProgressObserver)(void *pContext, long long cbWritten, long long 
 // Sets the observer of the calling thread's requests; null for none, as at the start of a thread.
 ZELO_PLATFORM_API void SetProgressObserver(ProgressObserver pfnObserver, void *pContext);
 
-// Whether one of the appliance's own certificate authorities cannot be read, which makes every
-// exchange over HTTPS fail; strFile names it then: a file, or the folder that they are in. Asks
-// nobody.
-ZELO_PLATFORM_API bool FindUnreadableAuthority(std::string &strFile);
-
 }  // namespace CredRequestUtil
 
 // One call of a Web API method.

@@ -13,6 +13,10 @@
 #include <string>
 #include <system_error>
 
+#include "../certificate_authorities.h"
+#include "last_error.h"
+#include "text_buffer.h"
+
 namespace host {
 namespace {
 
@@ -26,10 +30,6 @@ struct FreeBio {
 };
 struct FreeCertificate {
     void operator()(X509 *pCertificate) const { X509_free(pCertificate); }
-};
-
-struct FreeStore {
-    void operator()(X509_STORE *pStore) const { X509_STORE_free(pStore); }
 };
 
 bool IsPemName(const fs::path &path) {
@@ -57,15 +57,15 @@ bool AddFile(X509_STORE *pStore, const std::string &strPath) {
     }
 }
 
-// Adds every file of the folder. Returns what cannot be read, empty when there is nothing.
-std::string AddFolder(X509_STORE *pStore) {
+// Adds the folder's certificates; on failure strPath says what cannot be read.
+bool AddFolder(X509_STORE *pStore, std::string &strPath) {
     std::error_code error;
     fs::directory_iterator entries(kFolder, error);
     if (error == std::errc::no_such_file_or_directory) {
-        return {};
+        return true;
     }
     bool blAll = !error;
-    std::string strPath = kFolder;
+    strPath = kFolder;
     for (; blAll && entries != fs::directory_iterator(); entries.increment(error)) {
         if (IsPemName(entries->path())) {
             strPath = entries->path().string();
@@ -74,26 +74,19 @@ std::string AddFolder(X509_STORE *pStore) {
         blAll = blAll && !error;
     }
     ERR_clear_error();
-    return blAll ? std::string() : strPath;
+    return blAll;
 }
 
 }  // namespace
 
 bool AddApplianceCa(X509_STORE *pStore) {
-    const std::string strUnreadable = AddFolder(pStore);
-    if (!strUnreadable.empty()) {
+    std::string strPath;
+    const bool blAll = AddFolder(pStore, strPath);
+    if (!blAll) {
         syslog(LOG_ERR, "%s:%d cannot read certificates from '%s': mend or remove it", kFile,
-               __LINE__, strUnreadable.c_str());
+               __LINE__, strPath.c_str());
     }
-    return strUnreadable.empty();
-}
-
-std::string UnreadableCa() {
-    const std::unique_ptr<X509_STORE, FreeStore> pStore(X509_STORE_new());
-    if (pStore == nullptr) {
-        throw std::bad_alloc();
-    }
-    return AddFolder(pStore.get());
+    return blAll;
 }
 
 CaState CaState::Now() {
@@ -130,3 +123,19 @@ CaState::Version CaState::Look(const std::string &strPath) {
 }
 
 }  // namespace host
+
+int ZELOCertAddAuthorities(struct x509_store_st *pStore, char *szPlace, int cbPlace) {
+    if (pStore == nullptr || szPlace == nullptr || cbPlace <= 0) {
+        return host::Fail(YLIBC_ERR_INVALID_ARGUMENT, host::kFile, __LINE__);
+    }
+    try {
+        std::string strPath;
+        if (host::AddFolder(pStore, strPath)) {
+            return 0;
+        }
+        host::CopyWholeCharacters(strPath, szPlace, cbPlace);
+        return host::Fail(YLIBC_ERR_FILE, host::kFile, __LINE__);
+    } catch (const std::bad_alloc &) {
+        return host::Fail(YLIBC_ERR_OUT_OF_MEMORY, host::kFile, __LINE__);
+    }
+}

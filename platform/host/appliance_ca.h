@@ -19,9 +19,6 @@ namespace host {
 // less than the operator meant is an error too.
 bool AddApplianceCa(X509_STORE *pStore);
 
-// The file, or the folder, that AddApplianceCa would fail for; empty when there is none.
-std::string UnreadableCa();
-
 // One state of the folder. It ends when a file comes, goes, is replaced or written to.
 class CaState {
   public:

@@ -11,7 +11,6 @@
 #include <new>
 #include <utility>
 
-#include "appliance_ca.h"
 #include "credential_record.h"
 #include "http_exchange.h"
 #include "json_text.h"
@@ -294,13 +293,6 @@ bool CredRequestUtil::SetWebAPIURL(const ZELO_CRED *pCred, const std::string &ap
 
 void CredRequestUtil::SetProgressObserver(ProgressObserver pfnObserver, void *pContext) {
     t_observer = {pfnObserver, pContext};
-}
-
-bool CredRequestUtil::FindUnreadableAuthority(std::string &strFile) {
-    return NoThrow(false, [&] {
-        strFile = host::UnreadableCa();
-        return !strFile.empty();
-    });
 }
 
 CredRequest *CredRequest::CreateWebAPIRequest(const ZELO_CRED *pCred, const ZELO_CRED_SESS *pSess,

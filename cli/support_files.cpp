@@ -1,0 +1,327 @@
+#include "support_files.h"
+
+#include <curl/curl.h>
+#include <fcntl.h>
+#include <json/version.h>
+#include <openssl/crypto.h>
+#include <sqlite3.h>
+#include <sys/stat.h>
+#include <sys/utsname.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <array>
+#include <ctime>
+#include <filesystem>
+#include <iostream>
+#include <sstream>
+
+#include "command_line.h"
+#include "connection_checks.h"
+#include "fixed_text.h"
+#include "key_value_file.h"
+#include "membership.h"
+#include "platform_handles.h"
+#include "redaction.h"
+
+namespace qrmctl {
+namespace {
+
+namespace fs = std::filesystem;
+
+constexpr off_t kMaxTail = off_t{1024} * 1024;
+constexpr std::size_t kNotifications = 50;
+constexpr std::size_t kLogLines = 200;
+constexpr int kMaxListed = 500;
+
+// --- Reading ------------------------------------------------------------------------------------
+
+// The end of a regular file; empty when there is none. Nothing is followed or waited for: a name in
+// "/tmp" may be a trap.
+std::string Tail(const char *szPath) {
+    const int fd = open(szPath, O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC);
+    struct stat status = {};
+    std::string strText;
+    if (fd >= 0 && fstat(fd, &status) == 0 && S_ISREG(status.st_mode)) {
+        const off_t begin = std::max(off_t{0}, status.st_size - kMaxTail);
+        strText.resize(static_cast<std::size_t>(status.st_size - begin));
+        const ssize_t cb = pread(fd, strText.data(), strText.size(), begin);
+        strText.resize(cb < 0 ? 0 : static_cast<std::size_t>(cb));
+    }
+    if (fd >= 0) {
+        close(fd);
+    }
+    return strText;
+}
+
+std::string LastLines(const std::string &strText, std::size_t count,
+                      bool (*pfnKeep)(const std::string &)) {
+    std::vector<std::string> lines;
+    std::istringstream stream(strText);
+    for (std::string strLine; std::getline(stream, strLine);) {
+        if (pfnKeep == nullptr || pfnKeep(strLine)) {
+            lines.push_back(strLine);
+        }
+    }
+    std::string strLast;
+    for (std::size_t i = lines.size() - std::min(count, lines.size()); i < lines.size(); ++i) {
+        strLast += lines[i] + '\n';
+    }
+    return strLast;
+}
+
+// While it lives, what the program prints goes into texts.
+class CapturedOutput {
+  public:
+    CapturedOutput()
+        : m_pOut(std::cout.rdbuf(m_out.rdbuf())), m_pErr(std::cerr.rdbuf(m_err.rdbuf())) {}
+    ~CapturedOutput() {
+        std::cout.rdbuf(m_pOut);
+        std::cerr.rdbuf(m_pErr);
+    }
+    CapturedOutput(const CapturedOutput &) = delete;
+    CapturedOutput &operator=(const CapturedOutput &) = delete;
+
+    std::string Out() const { return m_out.str(); }
+    std::string Err() const { return m_err.str(); }
+
+  private:
+    std::ostringstream m_out;
+    std::ostringstream m_err;
+    std::streambuf *m_pOut;
+    std::streambuf *m_pErr;
+};
+
+// What a command prints, as if it had been typed.
+std::string OutputOf(const std::string &strCommand) {
+    CLI::App app;
+    Action action;
+    CommonOptions options;
+    AddCommandLine(app, action, options);
+    app.parse(strCommand);
+    Report report(options.blJson);
+    const CapturedOutput output;
+    const ExitCode code = action(report);
+    return options.blJson
+               ? output.Out()
+               : output.Out() + output.Err() + "exit status: " + std::to_string(code) + '\n';
+}
+
+// --- Texts --------------------------------------------------------------------------------------
+
+std::string Versions() {
+    utsname kernel = {};
+    uname(&kernel);
+    FixedText<256> system;
+    for (const char *szFile : {"/usr/lib/os-release", "/etc/os-release"}) {
+        if (system.Empty()) {
+            YLIBCFileGetKeyValue(szFile, "PRETTY_NAME", system.Buffer(), FixedText<256>::Size(), 0);
+        }
+    }
+    return std::string("libzeloqrmclient, qrmctl: ") + ZELO_VERSION +
+           "\nsystem: " + (system.Empty() ? "unknown" : system.sz()) +
+           "\nkernel: " + kernel.sysname + ' ' + kernel.release + ' ' + kernel.machine +
+           "\nlibcurl: " + curl_version() + "\nOpenSSL: " + OpenSSL_version(OPENSSL_VERSION) +
+           "\nSQLite: " + sqlite3_libversion() + "\nJsonCpp: " + JSONCPP_VERSION_STRING +
+           "\ncollected: " + TimeText(std::time(nullptr)) + '\n';
+}
+
+struct Setting {
+    const char *szFile;
+    const char *szKey;
+};
+
+// What the library and the platform look up; nothing else of the files is anybody's business.
+constexpr std::array<Setting, 16> kSettings = {{
+    {kConfigFile, "join_nvo_qrm"},
+    {kConfigFile, "admin_port"},
+    {kConfigFile, "secure_admin_port"},
+    {kConfigFile, "runHTTPS"},
+    {kConfigFile, "language"},
+    {kConfigFile, "farlink_relay"},
+    {kConfigFile, "use_proxy_environment"},
+    {kConfigFile, "exec_timeout"},
+    {kConfigFile, "plugin_timeout"},
+    {kConfigFile, "max_users"},
+    {kConfigFile, "extra_admin_QRM"},
+    {"/etc.defaults/zeloinfo.conf", "upnpmodelname"},
+    {"/etc.defaults/VERSION", "majorversion"},
+    {"/etc.defaults/VERSION", "minorversion"},
+    {"/etc.defaults/VERSION", "buildnumber"},
+    {"/etc.defaults/VERSION", "smallfixnumber"},
+}};
+
+std::string Configuration() {
+    std::string strAll;
+    for (const Setting &setting : kSettings) {
+        FixedText<1024> value;
+        const int cb = YLIBCFileGetKeyValue(setting.szFile, setting.szKey, value.Buffer(),
+                                            FixedText<1024>::Size(), 0);
+        // What stands before an "@" in the relay's address authenticates there.
+        std::string strValue = value.sz();
+        const std::size_t sign = strValue.rfind('@');
+        if (sign != std::string::npos) {
+            strValue.replace(0, sign, kRedacted);
+        }
+        strAll += std::string(setting.szFile) + ": " + setting.szKey + '=' +
+                  (cb < 0    ? "(the file cannot be read)"
+                   : cb == 0 ? "(not set)"
+                             : '"' + strValue + '"') +
+                  '\n';
+    }
+    return strAll;
+}
+
+std::string ClientInfo() {
+    constexpr int kHashSize = 512;
+    HashHandle hash(YLIBCSzHashAlloc(kHashSize));
+    if (YLIBCFileGetPair("/tmp/qrm_client.info", hash.Address()) < 0) {
+        return "There is no client info file, or it cannot be read.\n";
+    }
+    std::string strAll;
+    for (int i = 0; YLIBCSzHashKeyAt(hash.Get(), i) != nullptr; ++i) {
+        strAll += std::string(YLIBCSzHashKeyAt(hash.Get(), i)) + "=\"" +
+                  YLIBCSzHashValueAt(hash.Get(), i) + "\"\n";
+    }
+    return strAll;
+}
+
+bool IsOurLine(const std::string &strLine) {
+    constexpr std::array<const char *, 8> kParts = {"qrm",           "zelo",
+                                                    "http_exchange", "web_api_request",
+                                                    "appliance_ca",  "sqlite_database",
+                                                    "notification",  "key_value_file"};
+    return std::any_of(kParts.begin(), kParts.end(), [&](const char *szPart) {
+        return strLine.find(szPart) != std::string::npos;
+    });
+}
+
+std::string LogLines() {
+    std::string strAll;
+    for (const char *szLog : {"/var/log/messages", "/var/log/syslog"}) {
+        strAll += LastLines(Tail(szLog), kLogLines, IsOurLine);
+    }
+    return strAll.empty() ? "Neither /var/log/messages nor /var/log/syslog has a line of ours.\n"
+                          : strAll;
+}
+
+// One line such as "-rw------- 0:0 8192 2030-05-14T09:26:53Z /path".
+void ListOne(const fs::path &path, std::string &strAll) {
+    struct stat status = {};
+    if (lstat(path.c_str(), &status) != 0) {
+        strAll += "(none) " + path.string() + '\n';
+        return;
+    }
+    constexpr const char *kRights = "rwxrwxrwx";
+    std::string strMode(1, S_ISDIR(status.st_mode)   ? 'd'
+                           : S_ISLNK(status.st_mode) ? 'l'
+                           : S_ISREG(status.st_mode) ? '-'
+                                                     : '?');
+    for (unsigned int i = 0; i < 9; ++i) {
+        strMode += (status.st_mode & (0400U >> i)) != 0 ? kRights[i] : '-';
+    }
+    std::error_code ignored;
+    strAll +=
+        strMode + ' ' + std::to_string(status.st_uid) + ':' + std::to_string(status.st_gid) + ' ' +
+        std::to_string(status.st_size) + ' ' + TimeText(status.st_mtime) + ' ' + path.string() +
+        (S_ISLNK(status.st_mode) ? " -> " + fs::read_symlink(path, ignored).string() : "") + '\n';
+}
+
+std::string Files() {
+    constexpr std::array<const char *, 21> kPaths = {"/usr/zelo/etc/credentials",
+                                                     "/usr/zelo/etc/sessions",
+                                                     "/usr/zelo/etc/ssl/ca.d",
+                                                     "/usr/zelo/etc/plugins",
+                                                     "/usr/zelo/etc/notify.d",
+                                                     "/usr/zelo/etc/rc.d",
+                                                     "/usr/zelo/etc/service.d",
+                                                     "/usr/zelo/etc/QRM",
+                                                     "/etc/zeloinfo.conf",
+                                                     "/etc/.zeloinfo.conf.lock",
+                                                     "/etc.defaults",
+                                                     "/tmp/qrm_client.info",
+                                                     "/tmp/qrm_client.info.lock",
+                                                     "/tmp/qrmclientconnectfailed",
+                                                     "/tmp/qrmctl.membership.lock",
+                                                     "/tmp/qrm_idle_time",
+                                                     "/tmp/qrm_idle_time.lock",
+                                                     "/tmp/userlock",
+                                                     "/var/run/zelocache.pid",
+                                                     "/var/log/notifications.jsonl",
+                                                     "/var/log/notifications.jsonl.1"};
+    std::string strAll;
+    int count = 0;
+    for (const char *szPath : kPaths) {
+        ListOne(szPath, strAll);
+        std::error_code error;
+        for (fs::recursive_directory_iterator entry(szPath, error), end;
+             !error && entry != end && count < kMaxListed; entry.increment(error), ++count) {
+            ListOne(entry->path(), strAll);
+        }
+    }
+    return strAll + (count < kMaxListed ? "" : "(and more)\n");
+}
+
+constexpr const char *kReadme =
+    "What qrmctl support collected on an appliance that is a client of a QRM server.\n"
+    "\n"
+    "versions.txt         the library, the system and the libraries below\n"
+    "status.txt, .json    qrmctl status --explain\n"
+    "doctor.txt, .json    qrmctl doctor, with the stored connection\n"
+    "configuration.txt    the settings that the client and its platform look up\n"
+    "client_info.txt      the client info file\n"
+    "notifications.jsonl  the last 50 notifications\n"
+    "log.txt              the last lines of the system's log that concern the client\n"
+    "files.txt            mode, owner, size and time of the client's files\n"
+    "\n"
+    "Every access and csrf token of the credential store was searched for in all of them, plain,\n"
+    "escaped and in Base64, and replaced by [redacted]. So was, in texts of other programs, what\n"
+    "follows a name with token, passw, secret, key, cred, cookie or authorization in it, and\n"
+    "passwords in URLs. Host names, addresses and the serial number are still there: look the\n"
+    "files through before you pass them on.\n";
+
+constexpr const char *kLeftOut =
+    "Left out: the credential store cannot be read, so it is not known what would have to be\n"
+    "redacted here.\n";
+
+// A password of the configuration may turn up elsewhere.
+void AddConfigured(Redaction &redaction) {
+    constexpr int kHashSize = 4096;
+    HashHandle hash(YLIBCSzHashAlloc(kHashSize));
+    static_cast<void>(YLIBCFileGetPair(kConfigFile, hash.Address()));
+    for (int i = 0; YLIBCSzHashKeyAt(hash.Get(), i) != nullptr; ++i) {
+        if (IsSecretName(YLIBCSzHashKeyAt(hash.Get(), i))) {
+            redaction.Add(YLIBCSzHashValueAt(hash.Get(), i));
+        }
+    }
+}
+
+}  // namespace
+
+std::vector<SupportFile> CollectSupportFiles() {
+    Redaction redaction;
+    const bool blKnown = redaction.AddStored();
+    AddConfigured(redaction);
+    const auto ofOthers = [blKnown](const std::string &strText) {
+        return blKnown ? MaskNamed(strText) : std::string(kLeftOut);
+    };
+    std::vector<SupportFile> files = {
+        {"README.txt", kReadme},
+        {"versions.txt", Versions()},
+        {"status.txt", OutputOf("status --explain")},
+        {"status.json", OutputOf("status --explain --json")},
+        {"doctor.txt", OutputOf("doctor")},
+        {"doctor.json", OutputOf("doctor --json")},
+        {"configuration.txt", Configuration()},
+        {"client_info.txt", ofOthers(ClientInfo())},
+        {"notifications.jsonl",
+         ofOthers(LastLines(Tail("/var/log/notifications.jsonl"), kNotifications, nullptr))},
+        {"log.txt", ofOthers(LogLines())},
+        {"files.txt", Files()}};
+    for (SupportFile &file : files) {
+        file.strText = redaction.Redact(file.strText);
+    }
+    return files;
+}
+
+}  // namespace qrmctl

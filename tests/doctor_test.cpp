@@ -1,0 +1,454 @@
+// qrmctl doctor and support as their user runs them, against servers that have something wrong.
+
+#include <gtest/gtest.h>
+#include <netinet/in.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <filesystem>
+#include <fstream>
+#include <functional>
+#include <map>
+
+#include "dev_server.h"
+#include "json_text.h"
+#include "run_program.h"
+#include "stored.h"
+
+namespace {
+
+namespace fs = std::filesystem;
+using run_program::Outcome;
+using Arguments = std::vector<std::string>;
+using devserver::kDay;
+using devserver::kHour;
+
+// Its characters are escaped in JSON and in URLs, and its Base64 code differs between alphabets.
+constexpr const char *kToken = "s3c/ret\"~~?>+0123456789";
+constexpr const char *kCsrf = "csrf-9876543210";
+constexpr const char *kApi = "ZELO.QRM.RPC";
+constexpr const char *kCaFile = "/usr/zelo/etc/ssl/ca.d/server.pem";
+constexpr const char *kConfig = "/etc/zeloinfo.conf";
+constexpr const char *kMarker = "/tmp/qrmclientconnectfailed";
+constexpr const char *kInfoFile = "/tmp/qrm_client.info";
+constexpr const char *kJournal = "/var/log/notifications.jsonl";
+
+void Write(const std::string &strFile, const std::string &strText) {
+    fs::remove(strFile);
+    std::ofstream(strFile) << strText;
+}
+
+std::string Read(const std::string &strFile) {
+    std::ifstream file(strFile, std::ios::binary);
+    return {std::istreambuf_iterator<char>(file), std::istreambuf_iterator<char>()};
+}
+
+bool Holds(const std::string &strText, const std::string &strPart) {
+    return strText.find(strPart) != std::string::npos;
+}
+
+// A moment as a Date header has it.
+std::string HttpDate(std::time_t time) {
+    char sz[64] = {};
+    std::strftime(sz, sizeof(sz), "%a, %d %b %Y %H:%M:%S GMT", std::gmtime(&time));
+    return sz;
+}
+
+// Every file of the appliance: name, mode, times and content.
+std::map<std::string, std::string> Everything() {
+    std::map<std::string, std::string> files;
+    const auto add = [&](const fs::path &path) {
+        struct stat status = {};
+        lstat(path.c_str(), &status);
+        const bool blFile = S_ISREG(status.st_mode);
+        files[path] = std::to_string(status.st_mode) +
+                      (blFile ? ' ' + std::to_string(status.st_mtim.tv_sec) + '.' +
+                                    std::to_string(status.st_mtim.tv_nsec) + ' ' + Read(path)
+                              : "");
+    };
+    for (const char *szFolder : {"/etc", "/tmp"}) {
+        for (const auto &entry : fs::directory_iterator(szFolder)) {
+            add(entry.path());
+        }
+    }
+    for (const char *szFolder : {"/usr/zelo/etc", "/var", "/etc.defaults"}) {
+        for (const auto &entry : fs::recursive_directory_iterator(szFolder)) {
+            add(entry.path());
+        }
+    }
+    return files;
+}
+
+// A port that takes connections and never says a word.
+class SilentPort {
+  public:
+    SilentPort() : m_fd(socket(AF_INET, SOCK_STREAM, 0)) {
+        sockaddr_in address = {};
+        socklen_t cb = sizeof(address);
+        address.sin_family = AF_INET;
+        address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+        bind(m_fd, reinterpret_cast<sockaddr *>(&address), cb);
+        listen(m_fd, 8);
+        getsockname(m_fd, reinterpret_cast<sockaddr *>(&address), &cb);
+        m_port = ntohs(address.sin_port);
+    }
+    ~SilentPort() { close(m_fd); }
+    SilentPort(const SilentPort &) = delete;
+    SilentPort &operator=(const SilentPort &) = delete;
+
+    int Port() const { return m_port; }
+
+  private:
+    int m_fd;
+    int m_port = 0;
+};
+
+class Doctor : public testing::Test {
+  protected:
+    void SetUp() override {
+        stored::Clear();
+        fs::remove_all(stored::kFolder);
+        fs::create_directories(fs::path(kCaFile).parent_path());
+        Write(kConfig, "");
+        Write(kMarker, "");
+        Start({});
+    }
+    void Start(const devserver::CertificateRequest &certificate) {
+        devserver::Options options;
+        options.token = kToken;
+        options.certificate = certificate;
+        m_pServer = std::make_unique<devserver::DevServer>(options);
+        std::string strReason;
+        ASSERT_TRUE(m_pServer->Start(strReason)) << strReason;
+        Write(kCaFile, m_pServer->CaPem());
+    }
+    void AnswerDiscovery(devserver::NextAnswer answer) {
+        answer.method = "discover";
+        answer.times = 9;
+        m_pServer->AnswerNext(kApi, answer);
+    }
+    void TellTime(std::time_t time) {
+        devserver::NextAnswer answer;
+        answer.headers["Date"] = HttpDate(time);
+        AnswerDiscovery(answer);
+    }
+    void Store(const char *szProtocol = "https", const char *szToken = kToken) {
+        const int port =
+            std::string(szProtocol) == "http" ? m_pServer->HttpPort() : m_pServer->HttpsPort();
+        stored::AddSession(
+            stored::AddCredential("ZELO.QRM", "localhost", nullptr, szProtocol, port), szToken,
+            kCsrf);
+    }
+    // It says no token, and nothing on the appliance changes.
+    static Json::Value Run(Arguments arguments, int status) {
+        arguments.insert(arguments.begin(), {QRMCTL, "doctor", "--json"});
+        const auto before = Everything();
+        const Outcome outcome = run_program::Run(arguments);
+        EXPECT_EQ(Everything(), before);
+        EXPECT_EQ(outcome.status, status) << outcome.strOut << outcome.strErr;
+        EXPECT_FALSE(Holds(outcome.strOut + outcome.strErr, "0123456789"));
+        Json::Value result;
+        EXPECT_TRUE(json_text::FromString(outcome.strOut, result)) << outcome.strOut;
+        return result;
+    }
+    static Arguments Server(const std::string &strHost, int httpPort, int httpsPort) {
+        return {"--server",     strHost,
+                "--http-port",  std::to_string(httpPort),
+                "--https-port", std::to_string(httpsPort)};
+    }
+    // The outcomes as letters, such as "oowf-".
+    static std::string Outcomes(const Json::Value &checks) {
+        std::string strAll;
+        for (const Json::Value &check : checks) {
+            const std::string strOutcome = check["outcome"].asString();
+            strAll += strOutcome == "skipped" ? '-' : strOutcome[0];
+            EXPECT_EQ(check["remedy"].isNull(), strOutcome == "ok") << json_text::ToLogText(check);
+        }
+        return strAll;
+    }
+    // The server's requests that came with a token.
+    int TokensSeen() const {
+        const Json::Value requests = m_pServer->Requests();
+        return static_cast<int>(
+            std::count_if(requests.begin(), requests.end(), [](const Json::Value &request) {
+                return request["headers"].isMember("Authorization");
+            }));
+    }
+
+    std::unique_ptr<devserver::DevServer> m_pServer;
+};
+
+TEST_F(Doctor, NamesTheStepThatFailsAndWhatMendsIt) {
+    const SilentPort silent;
+    const std::time_t now = std::time(nullptr);
+    const devserver::CertificateRequest good;
+    devserver::CertificateRequest otherName;
+    otherName.names = {"other.example"};
+    devserver::CertificateRequest expired;
+    expired.not_before = now - 30 * kDay;
+    expired.not_after = now - kDay;
+    devserver::CertificateRequest early;
+    early.not_before = now + kDay;
+    devserver::CertificateRequest ending;
+    ending.not_after = now + 3 * kDay;
+    const auto https = [this] { return Server("localhost", 0, m_pServer->HttpsPort()); };
+    const auto relayed = [this] {
+        Write("/tmp/list", R"([{"host":"localhost","http_port":0,"farlink_direct":true,)"
+                           R"("https_port":)" +
+                               std::to_string(m_pServer->HttpsPort()) + "}]");
+        return Arguments{"--candidates", "/tmp/list"};
+    };
+    devserver::NextAnswer fault;
+    fault.status = 500;
+    devserver::NextAnswer unknown;
+    unknown.error_code = 102;
+    // The checks: name_resolution, tcp, authorities, tls, certificate, http, clock, api; over a
+    // relay also "relay" at the front and "tunnel" before tls; over http name_resolution, tcp, tls,
+    // http, clock, api.
+    const struct {
+        const char *szOutcomes;
+        const char *szSaid;
+        devserver::CertificateRequest certificate;
+        std::function<Arguments()> Prepare;
+    } rows[] = {
+        {"oooooooo", "chain and host name verified", good, [&] { return TellTime(now), https(); }},
+        {"oooooo-o", "is at /qrm/rpc", good, https},
+        {"f-------", "'name.invalid' has no address", good,
+         [&] { return Server("name.invalid", 0, 443); }},
+        {"of------", "check the port", good, [&] { return Server("localhost", 0, 1); }},
+        {"ooof----", "does not answer", good,
+         [&] { return Server("localhost", 0, silent.Port()); }},
+        {"ooof----", "HTTPS port", good,
+         [&] { return Server("localhost", 0, m_pServer->HttpPort()); }},
+        {"oooof-o-", "the clock is not the suspect", expired,
+         [&] { return TellTime(now), https(); }},
+        {"oooof-f-", "this appliance's clock is the suspect", expired,
+         [&] { return TellTime(now - 2 * kDay), https(); }},
+        {"oooof-f-", "this appliance's clock is the suspect", early,
+         [&] { return TellTime(now + 2 * kDay), https(); }},
+        {"oooof-w-", "the server tells no time", expired, https},
+        {"oooof---", "does not name 'localhost'", otherName, https},
+        {"oooof---", "the issuer is not trusted", good,
+         [&] { return fs::remove(kCaFile), https(); }},
+        {"oof-----", kCaFile, good, [&] { return Write(kCaFile, "no certificate"), https(); }},
+        {"oooowo-o", "2 days left", ending, https},
+        {"oooooowo", " s behind", good, [&] { return TellTime(now - kHour), https(); }},
+        {"ooooof--", "status 500", good, [&] { return AnswerDiscovery(fault), https(); }},
+        {"oooooo-f", "error code 102", good, [&] { return AnswerDiscovery(unknown), https(); }},
+        {"oowo-o", "nothing is encrypted", good,
+         [&] { return Server("localhost", m_pServer->HttpPort(), 0); }},
+        {"f---------", "set farlink_relay", good, relayed},
+        {"oooof-----", "the relay refuses with status 4", good,
+         [&] {
+             Write(kConfig,
+                   "farlink_relay=\"localhost:" + std::to_string(m_pServer->HttpPort()) + "\"\n");
+             return relayed();
+         }},
+    };
+    for (const auto &row : rows) {
+        SCOPED_TRACE(std::string(row.szOutcomes) + ' ' + row.szSaid);
+        SetUp();
+        Start(row.certificate);
+        const Arguments arguments = row.Prepare();
+        const bool blUsable = std::string(row.szOutcomes).back() == 'o';
+        const Json::Value result = Run(arguments, blUsable ? 0 : 1);
+        const Json::Value &connection = result["connections"][0];
+        EXPECT_EQ(Outcomes(connection["checks"]), row.szOutcomes)
+            << json_text::ToLogText(connection);
+        EXPECT_TRUE(Holds(json_text::ToLogText(connection), row.szSaid))
+            << json_text::ToLogText(connection);
+        EXPECT_EQ(connection["usable"], blUsable);
+        EXPECT_EQ(Outcomes(result["credential_checks"]), "o-");
+    }
+}
+
+TEST_F(Doctor, JudgesWhatIsStoredAndShowsTheTokenToItsServerAlone) {
+    const auto elsewhere = [](int port) { return Server("localhost", 0, port); };
+    devserver::DevServer other{devserver::Options()};
+    std::string strReason;
+    ASSERT_TRUE(other.Start(strReason)) << strReason;
+    const struct {
+        const char *szOutcomes;  // credential, token
+        const char *szSaid;
+        int status;
+        int tokens;  // how often the stored server sees it
+        std::function<Arguments()> Prepare;
+    } rows[] = {
+        {"oo", "the server accepts it", 0, 1, [&] { return Store(), Arguments(); }},
+        {"of", "it is wrong (error code 105)", 1, 1,
+         [&] { return Store("https", "wrong"), Arguments(); }},
+        {"o-", "not joined", 1, 0, [] { return Arguments(); }},
+        {"f-", "qrmctl join", 1, 0,
+         [] { return Write(kConfig, "join_nvo_qrm=\"yes\"\n"), Arguments(); }},
+        {"f-", "damaged", 1, 0,
+         [&] { return Store(), Write(stored::kDatabase, std::string(99, 'x')), Arguments(); }},
+        {"f-", "without an access token", 1, 0,
+         [&] {
+             stored::AddCredential("ZELO.QRM", "localhost", nullptr, "https",
+                                   m_pServer->HttpsPort());
+             return Arguments();
+         }},
+        {"o-", "not sent over plain HTTP", 0, 0, [&] { return Store("http"), Arguments(); }},
+        {"o-", "cannot be reached", 1, 0,
+         [&] { return Store(), fs::remove(kCaFile), Arguments(); }},
+        // The other server is not trusted.
+        {"oo", "the server accepts it", 1, 1,
+         [&] { return Store(), elsewhere(other.HttpsPort()); }},
+        {"of", "the stored server does not answer", 1, 0,
+         [&] { return Store(), fs::remove(kCaFile), elsewhere(other.HttpsPort()); }},
+    };
+    for (const auto &row : rows) {
+        SCOPED_TRACE(row.szSaid);
+        SetUp();
+        const Json::Value checks = Run(row.Prepare(), row.status)["credential_checks"];
+        EXPECT_EQ(Outcomes(checks), row.szOutcomes);
+        EXPECT_TRUE(Holds(json_text::ToLogText(checks), row.szSaid))
+            << json_text::ToLogText(checks);
+        EXPECT_EQ(TokensSeen(), row.tokens);
+    }
+    EXPECT_EQ(other.Requests().size(), 0U);
+}
+
+TEST_F(Doctor, TextTellsTheSameAsJson) {
+    Store();
+    Write("/tmp/list", R"([{"host":"localhost","http_port":0,"https_port":)" +
+                           std::to_string(m_pServer->HttpsPort()) +
+                           R"(},{"host":"localhost","http_port":0,"https_port":1}])");
+    const Outcome outcome = run_program::Run({QRMCTL, "doctor", "--candidates", "/tmp/list"});
+    EXPECT_EQ(outcome.status, 0) << "one way is enough";
+    for (const char *szPart : {"https://localhost:1\n", "failed", "remedy: check the port",
+                               "mend 'tcp' first\n", "A server can be used.\n"}) {
+        EXPECT_TRUE(Holds(outcome.strOut, szPart)) << outcome.strOut;
+    }
+}
+
+// --- support ------------------------------------------------------------------------------------
+
+class Support : public Doctor {
+  protected:
+    static Outcome Run(const Arguments &options = {}) {
+        Arguments command = {QRMCTL, "support", "/tmp/folder/archive"};
+        command.insert(command.end(), options.begin(), options.end());
+        return run_program::Run(command);
+    }
+    void SetUp() override {
+        Doctor::SetUp();
+        fs::remove_all("/tmp/folder");
+        fs::remove_all("/tmp/unpacked");
+        fs::create_directory("/tmp/folder");
+        fs::create_directory("/tmp/unpacked");
+    }
+    static void Unpack() {
+        EXPECT_EQ(run_program::Run(
+                      {"/bin/tar", "-xzf", "/tmp/folder/archive", "--directory=/tmp/unpacked"})
+                      .status,
+                  0);
+    }
+    static std::string Unpacked(const std::string &strName) {
+        return Read("/tmp/unpacked/qrmctl-support/" + strName);
+    }
+};
+
+TEST_F(Support, NoSecretLeavesTheAppliance) {
+    Store();
+    devserver::NextAnswer echo;
+    echo.method = "info";
+    echo.times = 9;
+    echo.body = std::string(R"({"success":false,"error":{"code":105},"got":)") +
+                json_text::ToLogText(kToken) + '}';
+    m_pServer->AnswerNext(kApi, echo);
+
+    // Each line of the journal and the log has a secret, written in another way.
+    const std::string secrets[] = {
+        kToken,
+        kCsrf,
+        R"(s3c\/ret\"~~?>+0123456789)",
+        R"(s3c\\\/ret\\\"~~?>+0123456789)",
+        R"(\u00733c\u002Fret\u0022~~\u003f>+0123456789)",
+        "s3c%2Fret%22~~%3f%3E%2B0123456789",
+        "s3c%252fret%2522~~?%253E%252B0123456789",
+        "czNjL3JldCJ+fj8+KzAxMjM0NTY3ODk=",          // Base64
+        "QmVhcmVyIHMzYy9yZXQifn4/PiswMTIzNDU2Nzg5",  // of "Bearer " and the token
+        "eHMzYy9yZXQifn4_PiswMTIzNDU2Nzg5eA",        // of x, the token, x; for URLs
+        "eHhzM2MvcmV0In5-Pz4rMDEyMzQ1Njc4OQ",        // of xx and the token; for URLs
+        "acc0unt-pw",
+    };
+    std::string strLog;
+    std::string strJournal;
+    for (const std::string &strSecret : secrets) {
+        strLog += "qrmctl: said <" + strSecret + "> so\n";
+        Json::Value entry;
+        entry["text"] = "said <" + strSecret + ">";
+        strJournal += json_text::ToLogText(entry) + '\n';
+    }
+    Write(kConfig, "admin_password=\"acc0unt-pw\"\nfarlink_relay=\"me:re1ay-pw@relay:80\"\n");
+    Write("/var/log/messages", strLog + "qrmctl: Authorization: Bearer n0body-knows\nother: x\n");
+    Write(kJournal, strJournal + R"({"tag":"T","variables":{"%TOKEN%":"n0body-knows"}})" + '\n');
+    Write(kInfoFile, "user_passwd=\"n0body-knows\"\nurl=\"http://me:n0body-knows@h/\"\n");
+
+    const Outcome outcome = Run();
+    ASSERT_EQ(outcome.status, 0) << outcome.strErr;
+    Unpack();
+    std::string strAll =
+        run_program::Run({"/bin/gzip", "-dc", "/tmp/folder/archive"}).strOut + outcome.strOut;
+    for (const auto &entry : fs::directory_iterator("/tmp/unpacked/qrmctl-support")) {
+        strAll += Read(entry.path());
+    }
+    for (const std::string &strSecret : secrets) {
+        EXPECT_FALSE(Holds(strAll, strSecret)) << strSecret;
+    }
+    for (const char *szPart :
+         {"0123456789", "9876543210", "n0body-knows", "re1ay-pw", "MTIzNDU2Nzg5"}) {
+        EXPECT_FALSE(Holds(strAll, szPart)) << szPart;
+    }
+    // What is no secret is still there.
+    std::string strKept;
+    for (std::size_t i = 0; i < std::size(secrets); ++i) {
+        strKept += "qrmctl: said <[redacted]> so\n";
+    }
+    EXPECT_EQ(Unpacked("log.txt"), strKept + "qrmctl: Authorization:[redacted]\n");
+    EXPECT_TRUE(Holds(Unpacked("notifications.jsonl"), R"("tag":"T")"));
+    EXPECT_TRUE(Holds(Unpacked("client_info.txt"), "url=\"http://[redacted]@h/\""));
+    EXPECT_TRUE(Holds(Unpacked("configuration.txt"), "[redacted]@relay:80"));
+    EXPECT_TRUE(Holds(Unpacked("files.txt"), std::string("-rw------- 0:0 ")));
+    EXPECT_TRUE(Holds(Unpacked("versions.txt"), "SQLite: "));
+    EXPECT_TRUE(Holds(Unpacked("README.txt"), "configuration.txt"));
+    EXPECT_TRUE(Holds(Unpacked("status.txt"), "server credential"));
+    EXPECT_TRUE(Holds(Unpacked("doctor.txt"), "error code 105"));
+    for (const char *szName : {"doctor.json", "status.json"}) {
+        Json::Value value;
+        const std::string strText = Unpacked(szName);
+        EXPECT_TRUE(json_text::FromString(strText, value)) << szName;
+        EXPECT_EQ(strText.find('\n') + 1, strText.size()) << strText;
+    }
+}
+
+TEST_F(Support, WhatMayHoldUnknownTokensIsLeftOut) {
+    Store();
+    Write(stored::kDatabase, std::string(99, 'x'));
+    Write(kJournal, std::string(R"({"text":"s3cret-of-old"})") + '\n');
+    Write("/var/log/messages", "qrmctl: s3cret-of-old\n");
+    EXPECT_EQ(Run().status, 0);
+    Unpack();
+    for (const char *szName : {"notifications.jsonl", "log.txt", "client_info.txt"}) {
+        EXPECT_TRUE(Holds(Unpacked(szName), "Left out")) << szName;
+    }
+}
+
+TEST_F(Support, AnArchiveReplacesAFileOnlyWhenTold) {
+    Write("/tmp/folder/archive", "mine");
+    EXPECT_TRUE(Holds(Run().strErr, "--force"));
+    EXPECT_EQ(Read("/tmp/folder/archive"), "mine");
+    EXPECT_EQ(Run({"--force"}).status, 0);
+    Unpack();
+    EXPECT_NE(Unpacked("README.txt"), "");
+    struct stat status = {};
+    stat("/tmp/folder/archive", &status);
+    EXPECT_EQ(status.st_mode & 07777, 0600U);
+    EXPECT_EQ(std::distance(fs::directory_iterator("/tmp/folder"), fs::directory_iterator()), 1);
+    EXPECT_EQ(run_program::Run({QRMCTL, "support", "/tmp/folder/absent/archive"}).status, 1);
+}
+
+}  // namespace
