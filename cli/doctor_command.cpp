@@ -170,8 +170,8 @@ ExitCode Doctor(const Options &options, Report &report) {
 }  // namespace
 
 void AddDoctor(CLI::App &app, Action &action) {
-    auto *const pCommand = app.add_subcommand(
-        "doctor", "Check every step on the way to a server, and what is stored; changes nothing");
+    auto *const pCommand =
+        app.add_subcommand("doctor", "Check each step on the way to a server, changing nothing");
     const auto pOptions = std::make_shared<Options>();
     auto *const pCandidates =
         pCommand->add_option("--candidates", pOptions->strCandidates,

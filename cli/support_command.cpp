@@ -134,8 +134,8 @@ ExitCode Support(const std::string &strFile, bool blForce, Report &report) {
 }  // namespace
 
 void AddSupport(CLI::App &app, Action &action) {
-    auto *const pCommand = app.add_subcommand(
-        "support", "Write an archive (tar.gz) for support, with every secret taken out");
+    auto *const pCommand =
+        app.add_subcommand("support", "Write an archive for support, without any secret");
     const auto pFile = std::make_shared<std::string>();
     const auto pForce = std::make_shared<bool>(false);
     pCommand->add_option("FILE", *pFile, "The archive")->required();
