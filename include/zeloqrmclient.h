@@ -56,9 +56,10 @@ struct YLIBSZLIST;
 // is optional and stored as JSON text ("null" when it is absent). Owner becomes the user id 1024,
 // create and modify time become now.
 //
-// Returns true when both records are stored. Returns false when a member is missing or of another
-// type, or the credential could not be saved: nothing is stored. Returns false as well when the
-// session could not be saved: the credential then stays stored, without a session.
+// Returns true when both records are stored. Returns false when a member is missing, one of the
+// credential's is of another type, or the credential could not be saved: nothing is stored. Returns
+// false as well when "access_token" is no text or the session could not be saved: the credential
+// then stays stored, without a session.
 //
 // A credential that exists already is left alone and stays in force.
 ZELOQRM_API bool ZELOQRMClientCreateServerCredential(const Json::Value &cred);
@@ -92,7 +93,9 @@ ZELOQRM_API bool ZELOQRMClientGetServerCredentialWithToken(Json::Value &out);
 //
 // cred: an object with "application". Optional: "protocol", "host", "port", "access_token" and
 // "sn", each of which replaces the stored value; "sn" becomes a member of the extra information,
-// whose other members stay. Times, owner and csrf token stay as they are. cred is not changed.
+// whose other members stay. Extra information that is no JSON object, or is longer than 1023 bytes,
+// stays as it is: "sn" is then left out. Times, owner and csrf token stay as they are. cred is not
+// changed.
 //
 // Returns true when both records are saved. Returns false when there is no such credential or it
 // has no session, when a member is of another type, or when a save fails. Everything is checked and
@@ -122,7 +125,12 @@ ZELOQRM_API bool ZELOQRMClientUpdateServerCredential(Json::Value &cred);
 // set in it. On failure it is not touched.
 //
 // Returns true when a server answered. Returns false otherwise, without a log line. Nothing is
-// stored. An unanswered attempt takes up to the platform's connect limit.
+// stored. An unanswered attempt takes up to the platform's connect limit of 10 s, one at which a
+// server is silent 30 s.
+//
+// Files read: the certificates in "/usr/zelo/etc/ssl/ca.d/", for the secure attempts, besides the
+// system's; "/etc/zeloinfo.conf" (farlink_relay, for the relay; use_proxy_environment, where the
+// environment names a proxy).
 ZELOQRM_API bool ZELOQRMClientTestConnect(const Json::Value &serverConn, const std::string &api,
                                           Json::Value &out);
 
@@ -152,8 +160,8 @@ ZELOQRM_API bool ZELOQRMClientTestConnect(const Json::Value &serverConn, const s
 // the credential's id.
 //
 // Files read: "/etc/zeloinfo.conf" (admin_port, secure_admin_port, runHTTPS),
-// "/etc.defaults/zeloinfo.conf" (upnpmodelname), "/etc.defaults/VERSION". Files written: the
-// platform's credential store.
+// "/etc.defaults/zeloinfo.conf" (upnpmodelname), "/etc.defaults/VERSION", and what
+// ZELOQRMClientTestConnect reads. Files written: the platform's credential store.
 ZELOQRM_API int ZELOQRMClientSendCreateClient(const Json::Value &joinInfo);
 
 // Brings the joined server's entry for this appliance up to date: sends "update" of
@@ -200,8 +208,9 @@ ZELOQRM_API int ZELOQRMClientSendSetClient(const Json::Value &info);
 // that is silent is given up after 30 s, one that cannot be connected to after 10 s. A failed call
 // may run the notification's hooks, 10 s each.
 //
-// Files: the platform's credential store (read); "/tmp/qrm_client.info" with its lock;
-// "/tmp/qrmclientconnectfailed", whose time is that of the latest notification.
+// Files: the platform's credential store and what ZELOQRMClientTestConnect reads (read);
+// "/tmp/qrm_client.info" with its lock; "/tmp/qrmclientconnectfailed", whose time is that of the
+// latest notification.
 ZELOQRM_API int ZELOQRMClientSendWebapi(Json::Value &resp, const std::string &api, int ver,
                                         const std::string &method, const Json::Value &params,
                                         bool useCache);
@@ -222,7 +231,7 @@ ZELOQRM_API int ZELOQRMClientSendWebapi(Json::Value &resp, const std::string &ap
 //
 // Calls may overlap, but not for one path. There is no limit on the size, nor on the time as long
 // as the transfer moves: a server that never ends fills the disk, which is a failure. Files: the
-// path; the platform's credential store (read).
+// path; the platform's credential store and what ZELOQRMClientTestConnect reads (read).
 ZELOQRM_API int ZELOQRMClientGetFile(const std::string &path, const std::string &api, int ver,
                                      const std::string &method, Json::Value &params);
 
@@ -253,7 +262,7 @@ ZELOQRM_API int GetFileMd5String(const char *path, char *buffer, int size);
 // cannot be read. Logs nothing.
 ZELOQRM_API bool ZELOQRMClientGetInfo(const std::string &key, std::string &value);
 
-// Writes a key, holding "/tmp/qrm_client.info.lock", which is waited for.
+// Writes a key, holding "/tmp/qrm_client.info.lock", which is waited for, 30 s at most.
 //
 // key, value: the key and its new text; no line feed in either, no "=" in the key.
 //
@@ -289,6 +298,9 @@ ZELOQRM_API void SendNotification(const char *szTag, YLIBSZHASH **ppHash);
 // Returns 1 when the flag is "yes" and all agree; 0 when it is anything else and all agree, or when
 // it cannot be read; -1 at the first one that disagrees, which is logged and ends the look. Nothing
 // is changed. The cache daemon's script "/usr/zelo/etc/rc.d/S99zelocache.sh" is run with "status".
+//
+// Time: milliseconds as a rule. A store that another program holds is waited for, 10 s for each of
+// two looks, and a script that hangs 60 s: a web page asks in a thread or a process of its own.
 ZELOQRM_API int ZELOQRMClientStatus(void);
 
 // Leaves the server: takes away what joining left behind, also from a half-joined appliance. Does
@@ -310,6 +322,9 @@ ZELOQRM_API int ZELOQRMClientStatus(void);
 //
 // Leaving is local: the server is not told. One record of each application is removed; where
 // several are stored, leaving again removes the next.
+//
+// Files: "/etc/zeloinfo.conf" (join_nvo_qrm, nvo_qrm_self_join); the platform's credential store,
+// web sessions and account files; what ZELOQRMClientStatus and ZELOQRMClientDeleteServerUser touch.
 //
 // Threads: join, leave and status are not ordered against each other; callers see to that. Plug-ins
 // run in the caller's thread, each within the platform's time limit.
@@ -396,13 +411,18 @@ ZELOQRM_API int ZELOQRMClientPluginExit(__tag_qrmclient_plugin_env__ *pstEnvVar)
 // The password, 101 characters, comes from rand() and is kept nowhere. The generator is the
 // caller's to seed: call srand() with a number from the kernel's generator before. It is no
 // stronger than that seed, 32 bits. rand() is shared by the process's threads.
+//
+// Files: the platform's account files, under the system's lock, which is waited for; the new
+// account's preferences; "/usr/zelo/etc/QRM/".
 ZELOQRM_API bool ZELOQRMClientCreateServerUser(void);
 
 // Deletes the account, holding "/tmp/userlock", then reloads the service of type 8 and removes
 // "/usr/zelo/etc/QRM/" with all that is in it.
 //
 // Returns true on success, and at once when there is no such account (the directory is then left
-// alone); false with a log line otherwise.
+// alone); false with a log line otherwise. The lock is waited for, 30 s at most.
+//
+// Files: the platform's account files; "/tmp/userlock"; "/usr/zelo/etc/QRM/".
 ZELOQRM_API bool ZELOQRMClientDeleteServerUser(void);
 
 // Shows or hides a user's welcome pages: sets "welcome_nvo40_hide" and "welcome_nvo50_hide" of
