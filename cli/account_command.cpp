@@ -66,50 +66,44 @@ ExitCode RunPlugins(const std::string &strAction, Report &report) {
                       : report.Done();
 }
 
-void AddWelcomeChange(CLI::App &parent, Action &action, const char *szName, bool blShow) {
-    auto *const pCommand = parent.add_subcommand(
-        szName, blShow ? "Show a user the welcome pages" : "Hide them from a user");
+void AddWelcomeChange(CommandHandle parent, Action &action, const char *szName, bool blShow) {
+    const CommandHandle command =
+        parent.Add(szName, blShow ? "Show a user the welcome pages" : "Hide them from a user");
     const auto pUser = std::make_shared<std::string>();
-    pCommand->add_option("USER", *pUser, "The user's name")->required();
-    pCommand->callback([pUser, blShow, &action] {
+    command.Text("USER", *pUser, "The user's name").Required();
+    command.RunsWhenChosen([pUser, blShow, &action] {
         action = [pUser, blShow](Report &report) { return Welcome(*pUser, blShow, report); };
     });
 }
 
 }  // namespace
 
-void AddAccount(CLI::App &app, Action &action) {
-    auto *const pAccount =
-        app.add_subcommand("account", "Create or delete the server's account on this appliance");
-    pAccount->require_subcommand(1);
-    pAccount->add_subcommand("create", "Create the account, or refresh it")->callback([&action] {
+void AddAccount(CommandHandle program, Action &action) {
+    const CommandHandle account =
+        program.Add("account", "Create or delete the server's account on this appliance");
+    account.RequireCommand();
+    account.Add("create", "Create the account, or refresh it").RunsWhenChosen([&action] {
         action = Create;
     });
-    pAccount->add_subcommand("delete", "Delete the account")->callback([&action] {
-        action = Delete;
-    });
+    account.Add("delete", "Delete the account").RunsWhenChosen([&action] { action = Delete; });
 }
 
-void AddWelcome(CLI::App &app, Action &action) {
-    auto *const pWelcome = app.add_subcommand("welcome", "Show or hide a user's welcome pages");
-    pWelcome->require_subcommand(1);
-    AddWelcomeChange(*pWelcome, action, "show", true);
-    AddWelcomeChange(*pWelcome, action, "hide", false);
+void AddWelcome(CommandHandle program, Action &action) {
+    const CommandHandle welcome = program.Add("welcome", "Show or hide a user's welcome pages");
+    welcome.RequireCommand();
+    AddWelcomeChange(welcome, action, "show", true);
+    AddWelcomeChange(welcome, action, "hide", false);
 }
 
-void AddPlugins(CLI::App &app, Action &action) {
-    auto *const pPlugins = app.add_subcommand("plugins", "Try plug-ins");
-    pPlugins->require_subcommand(1);
-    auto *const pRun = pPlugins->add_subcommand("run", "Run an action with a made-up server");
+void AddPlugins(CommandHandle program, Action &action) {
+    const CommandHandle plugins = program.Add("plugins", "Try plug-ins");
+    plugins.RequireCommand();
+    const CommandHandle run = plugins.Add("run", "Run an action with a made-up server");
     const auto pPlugin = std::make_shared<std::string>();
     const auto pAction = std::make_shared<std::string>();
-    pRun->add_option("PLUGIN", *pPlugin, "The event whose plug-ins run")
-        ->required()
-        ->check(CLI::IsMember({"disjoin"}));
-    pRun->add_option("ACTION", *pAction, "Before the event or after it")
-        ->required()
-        ->check(CLI::IsMember({"PRE", "POST"}));
-    pRun->callback([pPlugin, pAction, &action] {
+    run.Text("PLUGIN", *pPlugin, "The event whose plug-ins run").Required().OneOf({"disjoin"});
+    run.Text("ACTION", *pAction, "Before the event or after it").Required().OneOf({"PRE", "POST"});
+    run.RunsWhenChosen([pPlugin, pAction, &action] {
         action = [pAction](Report &report) { return RunPlugins(*pAction, report); };
     });
 }

@@ -81,34 +81,33 @@ ExitCode Update(const Options &options, Report &report) {
 
 }  // namespace
 
-void AddCall(CLI::App &app, Action &action) {
-    auto *const pCommand = app.add_subcommand("call", "Call a Web API of the joined server");
+void AddCall(CommandHandle program, Action &action) {
+    const CommandHandle command = program.Add("call", "Call a Web API of the joined server");
     const auto pOptions = std::make_shared<Options>();
-    pCommand->add_option("API", pOptions->strApi, "Web API, such as ZELO.QRM.RPC")->required();
-    pCommand->add_option("METHOD", pOptions->strMethod, "Its method")->required();
-    pCommand->add_option("--version", pOptions->version, "Version of the API")
-        ->type_name("N")
-        ->capture_default_str();
-    pCommand
-        ->add_option("--params", pOptions->strParams,
-                     "Parameters: a JSON object, or @FILE with one (@- for standard input)")
-        ->type_name("JSON");
-    pCommand->add_flag("--cached", pOptions->blCached,
-                       "Use the records that this process has loaded before");
-    pCommand->callback([pOptions, &action] {
+    command.Text("API", pOptions->strApi, "Web API, such as ZELO.QRM.RPC").Required();
+    command.Text("METHOD", pOptions->strMethod, "Its method").Required();
+    command.Number("--version", pOptions->version, "Version of the API")
+        .ValueName("N")
+        .ShowsDefault();
+    command
+        .Text("--params", pOptions->strParams,
+              "Parameters: a JSON object, or @FILE with one (@- for standard input)")
+        .ValueName("JSON");
+    command.Flag("--cached", pOptions->blCached,
+                 "Use the records that this process has loaded before");
+    command.RunsWhenChosen([pOptions, &action] {
         action = [pOptions](Report &report) { return Call(*pOptions, report); };
     });
 }
 
-void AddUpdate(CLI::App &app, Action &action) {
-    auto *const pCommand =
-        app.add_subcommand("update", "Bring the server's entry for this appliance up to date");
+void AddUpdate(CommandHandle program, Action &action) {
+    const CommandHandle command =
+        program.Add("update", "Bring the server's entry for this appliance up to date");
     const auto pOptions = std::make_shared<Options>();
-    pCommand
-        ->add_option("--host", pOptions->strHost,
-                     "The address at which the server reaches this appliance")
-        ->type_name("HOST");
-    pCommand->callback([pOptions, &action] {
+    command
+        .Text("--host", pOptions->strHost, "The address at which the server reaches this appliance")
+        .ValueName("HOST");
+    command.RunsWhenChosen([pOptions, &action] {
         action = [pOptions](Report &report) { return Update(*pOptions, report); };
     });
 }

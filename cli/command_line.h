@@ -4,14 +4,13 @@
 #ifndef QRMCTL_COMMAND_LINE_H
 #define QRMCTL_COMMAND_LINE_H
 
-#include <CLI/CLI.hpp>
-
 #include "commands.h"
 
 namespace qrmctl {
 
 constexpr const char *kSummary =
     "Makes this appliance a client of a QRM server, and shows what it is";
+constexpr const char *kVersion = "qrmctl " ZELO_VERSION;
 
 struct CommonOptions {
     bool blJson = false;
@@ -21,10 +20,10 @@ struct CommonOptions {
 
 // Adds everything to the program. The action and the options are set when the line is parsed; both
 // have to outlive the program.
-// The deadline of the command that was chosen, in seconds; 0 for none.
-double DeadlineOf(const CLI::App &app, const CommonOptions &options);
+void AddCommandLine(CommandHandle program, Action &action, CommonOptions &options);
 
-void AddCommandLine(CLI::App &app, Action &action, CommonOptions &options);
+// The deadline of the command that was chosen, in seconds; 0 for none.
+double DeadlineOf(CommandHandle program, const CommonOptions &options);
 
 }  // namespace qrmctl
 

@@ -73,11 +73,9 @@ constexpr Text kTexts[] = {
 
 }  // namespace
 
-void AddTexts(CLI::App &app) {
+void AddTexts(command::CommandHandle program) {
     for (const Text &text : kTexts) {
-        CLI::App *pCommand = app.get_subcommand(text.szCommand);
-        pCommand->description(pCommand->get_description() + "\n" + text.szText);
-        pCommand->footer(text.szExamples);
+        program.Command(text.szCommand).Explain(text.szText, text.szExamples);
     }
 }
 

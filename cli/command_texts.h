@@ -4,16 +4,15 @@
 #ifndef QRMCTL_COMMAND_TEXTS_H
 #define QRMCTL_COMMAND_TEXTS_H
 
-#include <CLI/CLI.hpp>
 #include <vector>
 
-#include "option_table.h"
+#include "command.h"
 
 namespace qrmctl {
 
 // Gives each command that there is a text for its text and its examples. Throws when a text is for
 // no command, so that none outlives its command.
-void AddTexts(CLI::App &app);
+void AddTexts(command::CommandHandle program);
 
 const std::vector<option_table::ExitStatus> &ExitStatuses();
 

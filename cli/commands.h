@@ -4,32 +4,35 @@
 #ifndef QRMCTL_COMMANDS_H
 #define QRMCTL_COMMANDS_H
 
-#include <CLI/CLI.hpp>
 #include <functional>
 
+#include "command.h"
 #include "report.h"
 
 namespace qrmctl {
 
+using command::CommandHandle;
+using command::OptionHandle;
+
 using Action = std::function<ExitCode(Report &)>;
 
-void AddTestConnection(CLI::App &app, Action &action);
-void AddJoin(CLI::App &app, Action &action);
-void AddCredential(CLI::App &app, Action &action);
-void AddCall(CLI::App &app, Action &action);
-void AddUpdate(CLI::App &app, Action &action);
-void AddGetFile(CLI::App &app, Action &action);
-void AddInfo(CLI::App &app, Action &action);
-void AddNotify(CLI::App &app, Action &action);
-void AddStatus(CLI::App &app, Action &action);
-void AddLeave(CLI::App &app, Action &action);
-void AddAccount(CLI::App &app, Action &action);
-void AddWelcome(CLI::App &app, Action &action);
-void AddPlugins(CLI::App &app, Action &action);
-void AddLog(CLI::App &app, Action &action);
-void AddIdle(CLI::App &app, Action &action);
-void AddDoctor(CLI::App &app, Action &action);
-void AddSupport(CLI::App &app, Action &action);
+void AddTestConnection(CommandHandle program, Action &action);
+void AddJoin(CommandHandle program, Action &action);
+void AddCredential(CommandHandle program, Action &action);
+void AddCall(CommandHandle program, Action &action);
+void AddUpdate(CommandHandle program, Action &action);
+void AddGetFile(CommandHandle program, Action &action);
+void AddInfo(CommandHandle program, Action &action);
+void AddNotify(CommandHandle program, Action &action);
+void AddStatus(CommandHandle program, Action &action);
+void AddLeave(CommandHandle program, Action &action);
+void AddAccount(CommandHandle program, Action &action);
+void AddWelcome(CommandHandle program, Action &action);
+void AddPlugins(CommandHandle program, Action &action);
+void AddLog(CommandHandle program, Action &action);
+void AddIdle(CommandHandle program, Action &action);
+void AddDoctor(CommandHandle program, Action &action);
+void AddSupport(CommandHandle program, Action &action);
 
 }  // namespace qrmctl
 

@@ -110,34 +110,34 @@ ExitCode Delete(Report &report) {
     return report.Done();
 }
 
-void AddChange(CLI::App &parent, Action &action, const char *szName, const char *szDescription,
+void AddChange(CommandHandle parent, Action &action, const char *szName, const char *szDescription,
                bool blCreate) {
-    auto *const pCommand = parent.add_subcommand(szName, szDescription);
+    const CommandHandle command = parent.Add(szName, szDescription);
     const auto pFile = std::make_shared<std::string>();
-    pCommand->add_option("FILE", *pFile, "JSON file with the credential, - for standard input")
-        ->type_name("FILE")
-        ->required();
-    pCommand->callback([pFile, blCreate, &action] {
+    command.Text("FILE", *pFile, "JSON file with the credential, - for standard input")
+        .ValueName("FILE")
+        .Required();
+    command.RunsWhenChosen([pFile, blCreate, &action] {
         action = [pFile, blCreate](Report &report) { return Change(*pFile, blCreate, report); };
     });
 }
 
 }  // namespace
 
-void AddCredential(CLI::App &app, Action &action) {
-    auto *const pCredential =
-        app.add_subcommand("credential", "Show or change the stored server credential");
-    pCredential->require_subcommand(1);
+void AddCredential(CommandHandle program, Action &action) {
+    const CommandHandle credential =
+        program.Add("credential", "Show or change the stored server credential");
+    credential.RequireCommand();
 
-    auto *const pShow = pCredential->add_subcommand("show", "Show the server credential");
+    const CommandHandle show = credential.Add("show", "Show the server credential");
     const auto pWithToken = std::make_shared<bool>(false);
-    pShow->add_flag("--with-token", *pWithToken, "Show the tokens too");
-    pShow->callback([pWithToken, &action] {
+    show.Flag("--with-token", *pWithToken, "Show the tokens too");
+    show.RunsWhenChosen([pWithToken, &action] {
         action = [pWithToken](Report &report) { return Show(*pWithToken, report); };
     });
-    AddChange(*pCredential, action, "create", "Store a server credential and its session", true);
-    AddChange(*pCredential, action, "update", "Change the stored server credential", false);
-    pCredential->add_subcommand("delete", "Remove the server credential")->callback([&action] {
+    AddChange(credential, action, "create", "Store a server credential and its session", true);
+    AddChange(credential, action, "update", "Change the stored server credential", false);
+    credential.Add("delete", "Remove the server credential").RunsWhenChosen([&action] {
         action = Delete;
     });
 }

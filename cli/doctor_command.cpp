@@ -169,26 +169,25 @@ ExitCode Doctor(const Options &options, Report &report) {
 
 }  // namespace
 
-void AddDoctor(CLI::App &app, Action &action) {
-    auto *const pCommand =
-        app.add_subcommand("doctor", "Check each step on the way to a server, changing nothing");
+void AddDoctor(CommandHandle program, Action &action) {
+    const CommandHandle command =
+        program.Add("doctor", "Check each step on the way to a server, changing nothing");
     const auto pOptions = std::make_shared<Options>();
-    auto *const pCandidates =
-        pCommand->add_option("--candidates", pOptions->strCandidates,
-                             "JSON file with the candidate connections, - for standard input");
-    auto *const pServer =
-        pCommand->add_option("--server", pOptions->strServer,
-                             "The server's name or address (default: the stored connection)");
-    auto *const pHttp =
-        pCommand->add_option("--http-port", pOptions->httpPort, "Its port for plain HTTP")
-            ->check(CLI::Range(0, 65535));
-    auto *const pHttps =
-        pCommand->add_option("--https-port", pOptions->httpsPort, "Its port for HTTPS")
-            ->check(CLI::Range(0, 65535));
-    pServer->excludes(pCandidates)->needs(pHttp)->needs(pHttps);
-    pHttp->needs(pServer);
-    pHttps->needs(pServer);
-    pCommand->callback([pOptions, &action] {
+    const OptionHandle candidates =
+        command.Text("--candidates", pOptions->strCandidates,
+                     "JSON file with the candidate connections, - for standard input");
+    const OptionHandle server =
+        command.Text("--server", pOptions->strServer,
+                     "The server's name or address (default: the stored connection)");
+    const OptionHandle http =
+        command.Number("--http-port", pOptions->httpPort, "Its port for plain HTTP")
+            .Between(0, 65535);
+    const OptionHandle https =
+        command.Number("--https-port", pOptions->httpsPort, "Its port for HTTPS").Between(0, 65535);
+    server.Excludes(candidates).Needs(http).Needs(https);
+    http.Needs(server);
+    https.Needs(server);
+    command.RunsWhenChosen([pOptions, &action] {
         action = [pOptions](Report &report) { return Doctor(*pOptions, report); };
     });
 }

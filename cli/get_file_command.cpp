@@ -243,24 +243,21 @@ ExitCode GetFile(const Options &options, Report &report) {
 
 }  // namespace
 
-void AddGetFile(CLI::App &app, Action &action) {
-    auto *const pCommand = app.add_subcommand("get-file", "Fetch a file from the joined server");
+void AddGetFile(CommandHandle program, Action &action) {
+    const CommandHandle command = program.Add("get-file", "Fetch a file from the joined server");
     const auto pOptions = std::make_shared<Options>();
-    pCommand->add_option("PATH", pOptions->strPath, "Where to put the file")
-        ->type_name("FILE")
-        ->required();
-    pCommand->add_option("API", pOptions->strApi, "Web API that sends it")->required();
-    pCommand->add_option("METHOD", pOptions->strMethod, "Its method")->required();
-    pCommand->add_option("--version", pOptions->version, "Version of the API")
-        ->type_name("N")
-        ->capture_default_str();
-    pCommand
-        ->add_option("--params", pOptions->strParams,
-                     "Parameters: a JSON object, or @FILE with one (@- for standard input)")
-        ->type_name("JSON");
-    pCommand->add_flag("--in-place", pOptions->blInPlace,
-                       "Write to PATH itself, which is emptied first");
-    pCommand->callback([pOptions, &action] {
+    command.Text("PATH", pOptions->strPath, "Where to put the file").ValueName("FILE").Required();
+    command.Text("API", pOptions->strApi, "Web API that sends it").Required();
+    command.Text("METHOD", pOptions->strMethod, "Its method").Required();
+    command.Number("--version", pOptions->version, "Version of the API")
+        .ValueName("N")
+        .ShowsDefault();
+    command
+        .Text("--params", pOptions->strParams,
+              "Parameters: a JSON object, or @FILE with one (@- for standard input)")
+        .ValueName("JSON");
+    command.Flag("--in-place", pOptions->blInPlace, "Write to PATH itself, which is emptied first");
+    command.RunsWhenChosen([pOptions, &action] {
         action = [pOptions](Report &report) { return GetFile(*pOptions, report); };
     });
 }

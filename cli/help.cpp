@@ -3,7 +3,7 @@
 #include <algorithm>
 #include <vector>
 
-#include "option_table.h"
+#include "words.h"
 
 namespace help {
 namespace {
@@ -35,7 +35,7 @@ std::string Wrapped(const std::vector<std::string> &words, std::size_t column, s
 }
 
 std::string Wrapped(const std::string &strText, std::size_t column, std::size_t indent) {
-    return Wrapped(CLI::detail::split(strText, ' '), column, indent);
+    return Wrapped(words::Split(strText, ' '), column, indent);
 }
 
 struct Row {
@@ -67,7 +67,7 @@ std::string Rows(const char *szTitle, const std::vector<Option> &options) {
     for (const Option &option : options) {
         std::string strText = option.strDescription;
         if (!option.choices.empty()) {
-            strText += ": " + CLI::detail::join(option.choices, ", ");
+            strText += ": " + words::Joined(option.choices, ", ");
         }
         rows.push_back({option.Label(), strText});
     }
@@ -88,21 +88,19 @@ std::string OptionNames(const Command &command) {
     for (const Option &option : command.options) {
         labels.push_back(option.names.back());
     }
-    return Wrapped("Options: " + CLI::detail::join(labels, ", ") + ". '" + command.strName +
+    return Wrapped("Options: " + words::Joined(labels, ", ") + ". '" + command.strName +
                        " COMMAND --help' says more of each command.",
                    0, 0);
 }
 
 }  // namespace
 
-std::string Formatter::make_help(const CLI::App *pApp, std::string /*strName*/,
-                                 CLI::AppFormatMode /*mode*/) const {
-    const Command command = option_table::Read(*pApp);
+std::string Text(const Command &command) {
     const std::string strUsage = "Usage: " + command.strName + " ";
     const std::string strTop = strUsage +
                                Wrapped(command.Usage(), strUsage.size(), strUsage.size()) +
                                Wrapped(command.strSummary + ".", 0, 0);
-    if (pApp->get_parent() == nullptr && !command.commands.empty()) {
+    if (command.IsProgram() && !command.commands.empty()) {
         return strTop + Commands(command) + OptionNames(command);
     }
     const std::string strText = command.strText.empty() ? "" : Wrapped(command.strText, 0, 0);

@@ -3,17 +3,14 @@
 #ifndef ZELO_HELP_H
 #define ZELO_HELP_H
 
-#include <CLI/CLI.hpp>
 #include <string>
+
+#include "option_table.h"
 
 namespace help {
 
-// To be given to a program before its commands are added to it, which take it over.
-class Formatter : public CLI::FormatterBase {
-  public:
-    std::string make_help(const CLI::App *pApp, std::string strName,
-                          CLI::AppFormatMode mode) const override;
-};
+// The help of a program or of one of its commands.
+std::string Text(const option_table::Command &command);
 
 }  // namespace help
 

@@ -9,7 +9,7 @@
 namespace qrmctl {
 namespace {
 
-// The whole text as a number. CLI11 itself takes "-1" for the largest one.
+// The whole text as a number. The parser itself takes "-1" for the largest one.
 bool ReadNumber(const std::string &strText, unsigned long &number) {
     const char *szEnd = strText.data() + strText.size();
     const auto [szRest, error] = std::from_chars(strText.data(), szEnd, number);
@@ -40,24 +40,27 @@ ExitCode Set(unsigned long idleTime, Report &report) {
 
 }  // namespace
 
-void AddIdle(CLI::App &app, Action &action) {
-    auto *const pIdle = app.add_subcommand("idle", "Read or set the disks' idle time");
-    pIdle->require_subcommand(1);
-    pIdle->add_subcommand("get", "Show the idle time in force, in minutes; 0: never")
-        ->callback([&action] { action = Get; });
-    auto *const pSet = pIdle->add_subcommand("set", "Set the idle time");
-    const auto pTime = std::make_shared<unsigned long>(0);
-    pSet->add_option_function<std::string>(
-            "MINUTES",
-            [pTime](const std::string &strMinutes) {
-                if (!ReadNumber(strMinutes, *pTime)) {
-                    throw CLI::ValidationError("MINUTES", "'" + strMinutes + "' is no number");
-                }
-            },
-            "Minutes without use before the disks sleep; 0: never")
-        ->required();
-    pSet->callback(
-        [pTime, &action] { action = [pTime](Report &report) { return Set(*pTime, report); }; });
+void AddIdle(CommandHandle program, Action &action) {
+    const CommandHandle idle = program.Add("idle", "Read or set the disks' idle time");
+    idle.RequireCommand();
+    idle.Add("get", "Show the idle time in force, in minutes; 0: never").RunsWhenChosen([&action] {
+        action = Get;
+    });
+    const CommandHandle set = idle.Add("set", "Set the idle time");
+    const auto pMinutes = std::make_shared<std::string>();
+    set.Text("MINUTES", *pMinutes, "Minutes without use before the disks sleep; 0: never")
+        .Required()
+        .Checked([](const std::string &strMinutes) {
+            unsigned long minutes = 0;
+            return ReadNumber(strMinutes, minutes) ? "" : "'" + strMinutes + "' is no number";
+        });
+    set.RunsWhenChosen([pMinutes, &action] {
+        action = [pMinutes](Report &report) {
+            unsigned long minutes = 0;
+            ReadNumber(*pMinutes, minutes);
+            return Set(minutes, report);
+        };
+    });
 }
 
 }  // namespace qrmctl

@@ -88,34 +88,34 @@ ExitCode Notify(const std::string &strTag, const std::vector<std::string> &varia
 
 }  // namespace
 
-void AddInfo(CLI::App &app, Action &action) {
-    auto *const pInfo =
-        app.add_subcommand("info", "Read or write the client info file, such as its key 'status'");
-    pInfo->require_subcommand(1);
+void AddInfo(CommandHandle program, Action &action) {
+    const CommandHandle info =
+        program.Add("info", "Read or write the client info file, such as its key 'status'");
+    info.RequireCommand();
     const auto pKey = std::make_shared<std::string>();
     const auto pValue = std::make_shared<std::string>();
 
-    auto *const pGet = pInfo->add_subcommand("get", "Show the value of a key");
-    pGet->add_option("KEY", *pKey, "The key")->required();
-    pGet->callback(
+    const CommandHandle get = info.Add("get", "Show the value of a key");
+    get.Text("KEY", *pKey, "The key").Required();
+    get.RunsWhenChosen(
         [pKey, &action] { action = [pKey](Report &report) { return Get(*pKey, report); }; });
 
-    auto *const pSet = pInfo->add_subcommand("set", "Set the value of a key");
-    pSet->add_option("KEY", *pKey, "The key")->required();
-    pSet->add_option("VALUE", *pValue, "Its value")->required();
-    pSet->callback([pKey, pValue, &action] {
+    const CommandHandle set = info.Add("set", "Set the value of a key");
+    set.Text("KEY", *pKey, "The key").Required();
+    set.Text("VALUE", *pValue, "Its value").Required();
+    set.RunsWhenChosen([pKey, pValue, &action] {
         action = [pKey, pValue](Report &report) { return Set(*pKey, *pValue, report); };
     });
 }
 
-void AddNotify(CLI::App &app, Action &action) {
-    auto *const pCommand =
-        app.add_subcommand("notify", "Send a notification to this appliance's users");
+void AddNotify(CommandHandle program, Action &action) {
+    const CommandHandle command =
+        program.Add("notify", "Send a notification to this appliance's users");
     const auto pTag = std::make_shared<std::string>();
     const auto pVariables = std::make_shared<std::vector<std::string>>();
-    pCommand->add_option("TAG", *pTag, "The event, such as QRMClientConnectFailed")->required();
-    pCommand->add_option("VARIABLE", *pVariables, "NAME=VALUE, set in place of %NAME%");
-    pCommand->callback([pTag, pVariables, &action] {
+    command.Text("TAG", *pTag, "The event, such as QRMClientConnectFailed").Required();
+    command.Texts("VARIABLE", *pVariables, "NAME=VALUE, set in place of %NAME%");
+    command.RunsWhenChosen([pTag, pVariables, &action] {
         action = [pTag, pVariables](Report &report) { return Notify(*pTag, *pVariables, report); };
     });
 }

@@ -226,42 +226,37 @@ ExitCode Join(const Options &options, Report &report) {
 
 }  // namespace
 
-void AddJoin(CLI::App &app, Action &action) {
-    auto *const pCommand = app.add_subcommand("join", "Join a QRM server");
+void AddJoin(CommandHandle program, Action &action) {
+    const CommandHandle command = program.Add("join", "Join a QRM server");
     const auto pOptions = std::make_shared<Options>();
-    pCommand->add_option("--server", pOptions->strServer, "The server's name or address")
-        ->type_name("HOST")
-        ->required()
-        ->check([](const std::string &strHost) {
+    command.Text("--server", pOptions->strServer, "The server's name or address")
+        .ValueName("HOST")
+        .Required()
+        .Checked([](const std::string &strHost) {
             return std::string(strHost.empty() ? "name the server" : "");
         });
-    pCommand->add_option("--http-port", pOptions->httpPort, "Its port for plain HTTP; 0: none")
-        ->type_name("N")
-        ->required()
-        ->check(CLI::Range(0, 65535));
-    pCommand->add_option("--https-port", pOptions->httpsPort, "Its port for HTTPS; 0: none")
-        ->type_name("N")
-        ->required()
-        ->check(CLI::Range(0, 65535));
-    pCommand
-        ->add_option("--sn", pOptions->strSerial, "Serial number (default: this appliance's own)")
-        ->type_name("SERIAL");
-    pCommand
-        ->add_option("--token-file", pOptions->strTokenFile,
-                     "File with the access token, - for standard input")
-        ->type_name("FILE")
-        ->required();
-    pCommand
-        ->add_option("--candidates", pOptions->strCandidates,
-                     "JSON file with connections to try before")
-        ->type_name("FILE");
-    pCommand->add_option("--id", pOptions->strId, "What the server calls this appliance")
-        ->type_name("ID");
-    pCommand->add_flag("--allow-http", pOptions->blAllowHttp,
-                       "Let the access token go over plain HTTP");
-    pCommand->add_flag("--again", pOptions->blAgain,
-                       "Leave first where a server is joined already");
-    pCommand->callback([pOptions, &action] {
+    command.Number("--http-port", pOptions->httpPort, "Its port for plain HTTP; 0: none")
+        .ValueName("N")
+        .Required()
+        .Between(0, 65535);
+    command.Number("--https-port", pOptions->httpsPort, "Its port for HTTPS; 0: none")
+        .ValueName("N")
+        .Required()
+        .Between(0, 65535);
+    command.Text("--sn", pOptions->strSerial, "Serial number (default: this appliance's own)")
+        .ValueName("SERIAL");
+    command
+        .Text("--token-file", pOptions->strTokenFile,
+              "File with the access token, - for standard input")
+        .ValueName("FILE")
+        .Required();
+    command
+        .Text("--candidates", pOptions->strCandidates, "JSON file with connections to try before")
+        .ValueName("FILE");
+    command.Text("--id", pOptions->strId, "What the server calls this appliance").ValueName("ID");
+    command.Flag("--allow-http", pOptions->blAllowHttp, "Let the access token go over plain HTTP");
+    command.Flag("--again", pOptions->blAgain, "Leave first where a server is joined already");
+    command.RunsWhenChosen([pOptions, &action] {
         action = [pOptions](Report &report) { return Join(*pOptions, report); };
     });
 }

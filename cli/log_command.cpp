@@ -23,17 +23,16 @@ struct Options {
 };
 
 // An option for each parameter: an option with a list of values would take "[a,b]" for two.
-void AddParams(CLI::App &command, Options &options) {
+void AddParams(CommandHandle command, Options &options) {
     constexpr int kMostParams = 32;
     for (int i = 0; i < kMostParams; ++i) {
         const auto add = [&options](const std::string &strParam) {
             options.params.push_back(strParam);
         };
-        auto *const pParam =
-            command.add_option_function<std::string>("PARAM" + (i == 0 ? "" : std::to_string(i)),
-                                                     add, "What fills its markers {0}, {1}, ...");
+        const OptionHandle param = command.Text("PARAM" + (i == 0 ? "" : std::to_string(i)), add,
+                                                "What fills its markers {0}, {1}, ...");
         if (i > 0) {
-            pParam->group("");
+            param.Hidden();
         }
     }
 }
@@ -107,24 +106,23 @@ ExitCode Push(const Options &options, Report &report) {
 
 }  // namespace
 
-void AddLog(CLI::App &app, Action &action) {
-    auto *const pCommand = app.add_subcommand("log", "Push a log entry to the joined server");
+void AddLog(CommandHandle program, Action &action) {
+    const CommandHandle command = program.Add("log", "Push a log entry to the joined server");
     const auto pOptions = std::make_shared<Options>();
-    pCommand->add_option("LEVEL", pOptions->strLevel, "0 to 7, or a name such as warning")
-        ->required();
-    pCommand
-        ->add_option("SECTION", pOptions->strSection,
-                     "Section of the strings files; - when KEY is the message itself")
-        ->required();
-    pCommand->add_option("KEY", pOptions->strKey, "The message")->required();
-    AddParams(*pCommand, *pOptions);
-    auto *const pExtraInfo =
-        pCommand->add_option("--extra-info", pOptions->strExtraInfo, "Text sent beside the message")
-            ->type_name("TEXT");
-    pCommand->add_flag("--render", pOptions->blRender,
-                       "Show the message in every language and send nothing");
-    pCommand->callback([pOptions, pExtraInfo, &action] {
-        pOptions->blExtraInfo = pExtraInfo->count() > 0;
+    command.Text("LEVEL", pOptions->strLevel, "0 to 7, or a name such as warning").Required();
+    command
+        .Text("SECTION", pOptions->strSection,
+              "Section of the strings files; - when KEY is the message itself")
+        .Required();
+    command.Text("KEY", pOptions->strKey, "The message").Required();
+    AddParams(command, *pOptions);
+    const OptionHandle extraInfo =
+        command.Text("--extra-info", pOptions->strExtraInfo, "Text sent beside the message")
+            .ValueName("TEXT");
+    command.Flag("--render", pOptions->blRender,
+                 "Show the message in every language and send nothing");
+    command.RunsWhenChosen([pOptions, extraInfo, &action] {
+        pOptions->blExtraInfo = extraInfo.IsGiven();
         action = [pOptions](Report &report) { return Push(*pOptions, report); };
     });
 }

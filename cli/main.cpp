@@ -2,11 +2,9 @@
 
 #include <syslog.h>
 
-#include <CLI/CLI.hpp>
 #include <algorithm>
 #include <exception>
 #include <iostream>
-#include <sstream>
 #include <string>
 #include <string_view>
 
@@ -22,38 +20,29 @@ bool AsksForJson(int argc, char **argv) {
 }
 
 // Help goes to standard output, wrong usage to standard error.
-int TellUsage(const CLI::App &app, const CLI::ParseError &error, bool blJson) {
-    std::ostringstream help;
-    std::ostringstream wrong;
-    if (app.exit(error, help, wrong) == 0) {
-        std::cout << help.str();
+int TellUsage(const command::Stop &stop, bool blJson) {
+    if (!stop.blWrong) {
+        std::cout << stop.strText;
         return qrmctl::kDone;
     }
-    // The report adds the program's name and the line's end.
-    std::string strWrong = wrong.str();
-    constexpr std::string_view kName = "qrmctl: ";
-    if (strWrong.rfind(kName, 0) == 0) {
-        strWrong.erase(0, kName.size());
-    }
-    while (!strWrong.empty() && strWrong.back() == '\n') {
-        strWrong.pop_back();
-    }
-    return qrmctl::Report(blJson).Fail(qrmctl::ErrorId::kUsage, strWrong);
+    const std::string strWhat = qrmctl::Printable(stop.strText);
+    return qrmctl::Report(blJson).Fail(
+        qrmctl::ErrorId::kUsage,
+        strWhat + (strWhat.back() == '?' ? " " : "; ") +
+            "'qrmctl --help' shows the commands, 'qrmctl COMMAND --help' the options of one");
 }
 
 int Run(int argc, char **argv) {
-    CLI::App app(qrmctl::kSummary, "qrmctl");
+    command::Program program("qrmctl", qrmctl::kSummary, qrmctl::kVersion);
     qrmctl::Action action;
     qrmctl::CommonOptions options;
-    qrmctl::AddCommandLine(app, action, options);
-    try {
-        app.parse(argc, argv);
-    } catch (const CLI::ParseError &error) {
-        return TellUsage(app, error, AsksForJson(argc, argv));
+    qrmctl::AddCommandLine(program.Root(), action, options);
+    if (const auto stop = program.Read(argc, argv)) {
+        return TellUsage(*stop, AsksForJson(argc, argv));
     }
 
     openlog("qrmctl", options.blVerbose ? LOG_PERROR : 0, LOG_USER);
-    const double deadline_s = qrmctl::DeadlineOf(app, options);
+    const double deadline_s = qrmctl::DeadlineOf(program.Root(), options);
     if (deadline_s > 0) {
         qrmctl::StartDeadline(deadline_s, options.blJson);
     }

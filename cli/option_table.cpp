@@ -1,6 +1,9 @@
 #include "option_table.h"
 
+#include <CLI/CLI.hpp>
 #include <algorithm>
+
+#include "words.h"
 
 namespace option_table {
 namespace {
@@ -21,7 +24,7 @@ void ReadValue(const std::string &strType, Option &option) {
         strRange = strRange.substr(0, strRange.find(']'));
         option.strDescription += " (" + strRange.replace(strRange.find(" - "), 3, " to ") + ")";
     } else if (!strLimit.empty() && strLimit.front() == '{') {
-        option.choices = CLI::detail::split(strLimit.substr(1, strLimit.find('}') - 1), ',');
+        option.choices = words::Split(strLimit.substr(1, strLimit.find('}') - 1), ',');
     }
 }
 
@@ -52,7 +55,7 @@ Option ReadOption(const CLI::Option &source) {
 }  // namespace
 
 std::string Option::Label() const {
-    const std::string strNames = CLI::detail::join(names, ", ");
+    const std::string strNames = words::Joined(names, ", ");
     const bool blPositional = names.front().front() != '-';
     return blPositional || strValue.empty() ? strNames : strNames + " " + strValue;
 }

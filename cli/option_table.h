@@ -4,9 +4,12 @@
 #ifndef ZELO_OPTION_TABLE_H
 #define ZELO_OPTION_TABLE_H
 
-#include <CLI/CLI.hpp>
 #include <string>
 #include <vector>
+
+namespace CLI {
+class App;
+}  // namespace CLI
 
 namespace option_table {
 
@@ -31,6 +34,7 @@ struct Command {
     std::vector<Option> options;
     std::vector<Command> commands;
 
+    bool IsProgram() const { return strName.find(' ') == std::string::npos; }
     std::string LastName() const { return strName.substr(strName.rfind(' ') + 1); }
 
     // The words of a call behind the name: what has to be there, what may be.

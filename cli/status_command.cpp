@@ -124,25 +124,24 @@ ExitCode Leave(const LeaveRequest &request, Report &report) {
 
 }  // namespace
 
-void AddStatus(CLI::App &app, Action &action) {
-    auto *const pCommand =
-        app.add_subcommand("status", "Judge whether it is joined (exit 0), not (3) or half (4)");
+void AddStatus(CommandHandle program, Action &action) {
+    const CommandHandle command =
+        program.Add("status", "Judge whether it is joined (exit 0), not (3) or half (4)");
     const auto pExplain = std::make_shared<bool>(false);
-    pCommand->add_flag("--explain", *pExplain, "Show what the judgement rests on");
-    pCommand->callback([pExplain, &action] {
+    command.Flag("--explain", *pExplain, "Show what the judgement rests on");
+    command.RunsWhenChosen([pExplain, &action] {
         action = [pExplain](Report &report) { return Status(*pExplain, report); };
     });
 }
 
-void AddLeave(CLI::App &app, Action &action) {
-    auto *const pCommand =
-        app.add_subcommand("leave", "Leave the server, from any half-way state too");
+void AddLeave(CommandHandle program, Action &action) {
+    const CommandHandle command =
+        program.Add("leave", "Leave the server, from any half-way state too");
     const auto pRequest = std::make_shared<LeaveRequest>();
-    pCommand->add_flag("--rejoin", pRequest->blRejoin, "Leave in order to join again");
-    pCommand->add_option("--from", pRequest->strFrom, "The application that asks for it")
-        ->type_name("APP");
-    pCommand->add_flag("--clear-gluster", pRequest->blClearGluster, "Told to the plug-ins");
-    pCommand->callback([pRequest, &action] {
+    command.Flag("--rejoin", pRequest->blRejoin, "Leave in order to join again");
+    command.Text("--from", pRequest->strFrom, "The application that asks for it").ValueName("APP");
+    command.Flag("--clear-gluster", pRequest->blClearGluster, "Told to the plug-ins");
+    command.RunsWhenChosen([pRequest, &action] {
         action = [pRequest](Report &report) { return Leave(*pRequest, report); };
     });
 }

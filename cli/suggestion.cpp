@@ -2,8 +2,6 @@
 
 #include <algorithm>
 
-#include "option_table.h"
-
 namespace suggestion {
 namespace {
 
@@ -11,19 +9,6 @@ constexpr std::size_t kMostChanges = 2;
 
 std::size_t Letters(const std::string &strWord) {
     return strWord.size() - std::min(strWord.size(), strWord.find_first_not_of('-'));
-}
-
-// The command whose words the parse had no use for, the outermost first; null when there is none.
-const CLI::App *WhereUnknown(const CLI::App &app) {
-    if (app.remaining_size() > 0) {
-        return &app;
-    }
-    for (const CLI::App *pCommand : app.get_subcommands()) {
-        if (const CLI::App *pFound = WhereUnknown(*pCommand)) {
-            return pFound;
-        }
-    }
-    return nullptr;
 }
 
 }  // namespace
@@ -72,13 +57,7 @@ std::string Meant(const std::string &strWord, const std::vector<std::string> &na
     return strMeant;
 }
 
-std::string UnknownWord(const CLI::App &app) {
-    const CLI::App *pWhere = WhereUnknown(app);
-    if (pWhere == nullptr) {
-        return {};
-    }
-    const option_table::Command command = option_table::Read(*pWhere);
-    const std::string strWord = pWhere->remaining(false).front();
+std::string UnknownWord(const std::string &strWord, const option_table::Command &command) {
     const bool blOption = strWord.size() > 1 && strWord.front() == '-';
     std::vector<std::string> names;
     for (const option_table::Option &option : command.options) {

@@ -3,9 +3,10 @@
 #ifndef ZELO_SUGGESTION_H
 #define ZELO_SUGGESTION_H
 
-#include <CLI/CLI.hpp>
 #include <string>
 #include <vector>
+
+#include "option_table.h"
 
 namespace suggestion {
 
@@ -17,9 +18,8 @@ std::size_t Distance(const std::string &strOne, const std::string &strOther);
 // and in fewer than it has, or else one that begins with it. Empty when there is none.
 std::string Meant(const std::string &strWord, const std::vector<std::string> &names);
 
-// The word that a failed parse had no use for, as a message that names what was meant; empty when
-// it failed for another reason.
-std::string UnknownWord(const CLI::App &app);
+// A word that the command has no use for, as a message that names what was meant.
+std::string UnknownWord(const std::string &strWord, const option_table::Command &command);
 
 }  // namespace suggestion
 

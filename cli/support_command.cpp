@@ -133,14 +133,14 @@ ExitCode Support(const std::string &strFile, bool blForce, Report &report) {
 
 }  // namespace
 
-void AddSupport(CLI::App &app, Action &action) {
-    auto *const pCommand =
-        app.add_subcommand("support", "Write an archive for support, without any secret");
+void AddSupport(CommandHandle program, Action &action) {
+    const CommandHandle command =
+        program.Add("support", "Write an archive for support, without any secret");
     const auto pFile = std::make_shared<std::string>();
     const auto pForce = std::make_shared<bool>(false);
-    pCommand->add_option("FILE", *pFile, "The archive")->required();
-    pCommand->add_flag("--force", *pForce, "Replace a file that is there");
-    pCommand->callback([pFile, pForce, &action] {
+    command.Text("FILE", *pFile, "The archive").Required();
+    command.Flag("--force", *pForce, "Replace a file that is there");
+    command.RunsWhenChosen([pFile, pForce, &action] {
         action = [pFile, pForce](Report &report) { return Support(*pFile, *pForce, report); };
     });
 }

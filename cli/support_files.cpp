@@ -93,12 +93,12 @@ class CapturedOutput {
 };
 
 // What a command prints, as if it had been typed.
-std::string OutputOf(const std::string &strCommand) {
-    CLI::App app;
+std::string OutputOf(const std::vector<std::string> &words) {
+    command::Program program("qrmctl", kSummary, kVersion);
     Action action;
     CommonOptions options;
-    AddCommandLine(app, action, options);
-    app.parse(strCommand);
+    AddCommandLine(program.Root(), action, options);
+    program.Read(words);
     Report report(options.blJson);
     const CapturedOutput output;
     const ExitCode code = action(report);
@@ -308,10 +308,10 @@ std::vector<SupportFile> CollectSupportFiles() {
     std::vector<SupportFile> files = {
         {"README.txt", kReadme},
         {"versions.txt", Versions()},
-        {"status.txt", OutputOf("status --explain")},
-        {"status.json", OutputOf("status --explain --json")},
-        {"doctor.txt", OutputOf("doctor")},
-        {"doctor.json", OutputOf("doctor --json")},
+        {"status.txt", OutputOf({"status", "--explain"})},
+        {"status.json", OutputOf({"status", "--explain", "--json"})},
+        {"doctor.txt", OutputOf({"doctor"})},
+        {"doctor.json", OutputOf({"doctor", "--json"})},
         {"configuration.txt", Configuration()},
         {"client_info.txt", ofOthers(ClientInfo())},
         {"notifications.jsonl",

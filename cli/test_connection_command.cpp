@@ -39,19 +39,19 @@ ExitCode TestConnection(const Options &options, Report &report) {
 
 }  // namespace
 
-void AddTestConnection(CLI::App &app, Action &action) {
-    auto *const pCommand = app.add_subcommand(
-        "test-connection", "Find the first connection at which a server answers");
+void AddTestConnection(CommandHandle program, Action &action) {
+    const CommandHandle command =
+        program.Add("test-connection", "Find the first connection at which a server answers");
     const auto pOptions = std::make_shared<Options>();
-    pCommand->add_option("--api", pOptions->strApi, "Web API that the server has to serve")
-        ->type_name("NAME")
-        ->required();
-    pCommand
-        ->add_option("CANDIDATES", pOptions->strCandidates,
-                     "JSON file with the candidate connections, - for standard input")
-        ->type_name("FILE")
-        ->required();
-    pCommand->callback([pOptions, &action] {
+    command.Text("--api", pOptions->strApi, "Web API that the server has to serve")
+        .ValueName("NAME")
+        .Required();
+    command
+        .Text("CANDIDATES", pOptions->strCandidates,
+              "JSON file with the candidate connections, - for standard input")
+        .ValueName("FILE")
+        .Required();
+    command.RunsWhenChosen([pOptions, &action] {
         action = [pOptions](Report &report) { return TestConnection(*pOptions, report); };
     });
 }

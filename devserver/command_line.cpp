@@ -1,8 +1,5 @@
 #include "command_line.h"
 
-#include "help.h"
-#include "suggestion.h"
-
 namespace devserver {
 namespace {
 
@@ -16,40 +13,29 @@ constexpr const char *kExamples =
     "qrm-devserver --token-file token --https-port 8443 \\\n"
     "    --ports-file ports.json --ca-file ca.pem";
 
-std::string UsageMessage(const CLI::App *pApp, const CLI::Error &error) {
-    const std::string strUnknown = suggestion::UnknownWord(*pApp);
-    const std::string strWhat = strUnknown.empty() ? error.what() : strUnknown;
-    return "qrm-devserver: " + strWhat + (strWhat.back() == '?' ? " " : "; ") +
-           "'qrm-devserver --help' shows the options\n";
-}
-
 }  // namespace
 
-void AddCommandLine(CLI::App &app, Options &options, Files &files) {
-    app.description(std::string(kSummary) + "\n" + kText);
-    app.footer(kExamples);
-    app.formatter(std::make_shared<help::Formatter>());
-    app.failure_message(UsageMessage);
-    app.set_version_flag("--version", "qrm-devserver " ZELO_VERSION, "Show the version");
-    app.add_option("--token-file", files.token, "File with the access token")
-        ->type_name("FILE")
-        ->required();
-    app.add_option("--http-port", options.http_port, "Port for HTTP, 0 for a free one")
-        ->type_name("N")
-        ->check(CLI::Range(0, 65535))
-        ->capture_default_str();
-    app.add_option("--https-port", options.https_port, "Port for HTTPS, 0 for a free one")
-        ->type_name("N")
-        ->check(CLI::Range(0, 65535))
-        ->capture_default_str();
-    app.add_option("--ports-file", files.ports, "File to write the ports to, as JSON")
-        ->type_name("FILE");
-    app.add_option("--ca-file", files.ca, "File to write the authority's certificate to, as PEM")
-        ->type_name("FILE");
-    app.add_option("--host", options.host, "Loopback address to listen on")
-        ->type_name("ADDRESS")
-        ->capture_default_str()
-        ->check([](const std::string &strHost) {
+void AddCommandLine(command::CommandHandle program, Options &options, Files &files) {
+    program.Explain(kText, kExamples);
+    program.Text("--token-file", files.token, "File with the access token")
+        .ValueName("FILE")
+        .Required();
+    program.Number("--http-port", options.http_port, "Port for HTTP, 0 for a free one")
+        .ValueName("N")
+        .Between(0, 65535)
+        .ShowsDefault();
+    program.Number("--https-port", options.https_port, "Port for HTTPS, 0 for a free one")
+        .ValueName("N")
+        .Between(0, 65535)
+        .ShowsDefault();
+    program.Text("--ports-file", files.ports, "File to write the ports to, as JSON")
+        .ValueName("FILE");
+    program.Text("--ca-file", files.ca, "File to write the authority's certificate to, as PEM")
+        .ValueName("FILE");
+    program.Text("--host", options.host, "Loopback address to listen on")
+        .ValueName("ADDRESS")
+        .ShowsDefault()
+        .Checked([](const std::string &strHost) {
             return IsLoopback(strHost)
                        ? std::string()
                        : "'" + strHost + "' is no loopback address; name 127.0.0.1 or ::1";

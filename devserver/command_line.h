@@ -3,16 +3,17 @@
 #ifndef DEVSERVER_COMMAND_LINE_H
 #define DEVSERVER_COMMAND_LINE_H
 
-#include <CLI/CLI.hpp>
 #include <string>
 #include <vector>
 
+#include "command.h"
 #include "dev_server.h"
 #include "option_table.h"
 
 namespace devserver {
 
 constexpr const char *kSummary = "A QRM server for development, on loopback";
+constexpr const char *kVersion = "qrm-devserver " ZELO_VERSION;
 
 enum ExitCode { kDone = 0, kFailed = 1, kUsage = 2 };
 
@@ -24,7 +25,7 @@ struct Files {
 
 // Adds everything to the program. The options and files are set when the line is parsed; both have
 // to outlive the program.
-void AddCommandLine(CLI::App &app, Options &options, Files &files);
+void AddCommandLine(command::CommandHandle program, Options &options, Files &files);
 
 const std::vector<option_table::ExitStatus> &ExitStatuses();
 

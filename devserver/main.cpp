@@ -6,7 +6,6 @@
 #include <sys/file.h>
 #include <unistd.h>
 
-#include <CLI/CLI.hpp>
 #include <cerrno>
 #include <csignal>
 #include <cstdio>
@@ -136,15 +135,24 @@ int Serve(const devserver::Options &options, const Files &files) {
     return EXIT_SUCCESS;
 }
 
+// Help goes to standard output, wrong usage to standard error.
+int TellUsage(const command::Stop &stop) {
+    if (!stop.blWrong) {
+        std::cout << stop.strText;
+        return devserver::kDone;
+    }
+    Complain(stop.strText + (stop.strText.back() == '?' ? " " : "; ") +
+             "'qrm-devserver --help' shows the options");
+    return devserver::kUsage;
+}
+
 int Run(int argc, char **argv) {
     devserver::Options options;
     Files files;
-    CLI::App app(devserver::kSummary, "qrm-devserver");
-    devserver::AddCommandLine(app, options, files);
-    try {
-        app.parse(argc, argv);
-    } catch (const CLI::ParseError &error) {
-        return app.exit(error) == EXIT_SUCCESS ? EXIT_SUCCESS : devserver::kUsage;
+    command::Program program("qrm-devserver", devserver::kSummary, devserver::kVersion);
+    devserver::AddCommandLine(program.Root(), options, files);
+    if (const auto stop = program.Read(argc, argv)) {
+        return TellUsage(*stop);
     }
     if ((!files.ports.empty() && !RemoveOldPorts(files.ports)) ||
         !ReadToken(files.token, options.token)) {

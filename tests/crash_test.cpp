@@ -29,16 +29,17 @@ class Crash : public joined::Joined {
 
     // Runs a command of qrmctl in a process of its own, which dies before the call with that
     // number; 0 lets it live. Returns the exit status, or the signal's number below zero.
-    static int Run(Arguments arguments, int killAt = 0) {
+    static int Run(const Arguments &arguments, int killAt = 0) {
         std::fflush(nullptr);
         const pid_t pid = fork();
         if (pid == 0) {
-            CLI::App app;
+            command::Program program("qrmctl", "", "");
             qrmctl::Action action;
-            qrmctl::AddJoin(app, action);
-            qrmctl::AddLeave(app, action);
-            std::reverse(arguments.begin(), arguments.end());
-            app.parse(arguments);
+            qrmctl::AddJoin(program.Root(), action);
+            qrmctl::AddLeave(program.Root(), action);
+            if (program.Read(arguments)) {
+                _exit(qrmctl::kUsage);
+            }
             const std::ostringstream quiet;
             std::cout.rdbuf(quiet.rdbuf());
             qrmctl::Report report(false);

@@ -2,6 +2,8 @@
 
 #include <algorithm>
 
+#include "../words.h"
+
 namespace manual {
 namespace {
 
@@ -20,7 +22,11 @@ std::string FunctionName(const std::string &strName) {
 
 // Text between single quotes, for bash and zsh.
 std::string Quoted(const std::string &strText) {
-    return "'" + CLI::detail::find_and_replace(strText, "'", "'\\''") + "'";
+    std::string strQuoted = "'";
+    for (char c : strText) {
+        strQuoted += c == '\'' ? std::string("'\\''") : std::string(1, c);
+    }
+    return strQuoted + "'";
 }
 
 bool IsFile(const Option &option) {
@@ -41,7 +47,7 @@ std::string Names(const std::vector<Option> &options) {
     for (const Option &option : options) {
         names.insert(names.end(), option.names.begin(), option.names.end());
     }
-    return CLI::detail::join(names, " ");
+    return words::Joined(names, " ");
 }
 
 std::string CommandNames(const Command &command) {
@@ -49,7 +55,7 @@ std::string CommandNames(const Command &command) {
     for (const Command &each : command.commands) {
         names.push_back(each.LastName());
     }
-    return CLI::detail::join(names, " ");
+    return words::Joined(names, " ");
 }
 
 // --- bash ---------------------------------------------------------------------------------------
@@ -60,7 +66,7 @@ std::string BashWords(const Command &command) {
     std::string strFiles;
     for (const Option &argument : command.arguments) {
         if (!argument.choices.empty()) {
-            strWords += (strWords.empty() ? "" : " ") + CLI::detail::join(argument.choices, " ");
+            strWords += (strWords.empty() ? "" : " ") + words::Joined(argument.choices, " ");
         }
         strFiles = IsFile(argument) ? " files=yes" : strFiles;
     }
@@ -73,7 +79,7 @@ std::string BashValues(const Command &command) {
         for (const std::string &strName : option.names) {
             if (!option.strValue.empty()) {
                 strCases += "    " + Quoted(command.strName + " " + strName) +
-                            ") options= words=" + Quoted(CLI::detail::join(option.choices, " ")) +
+                            ") options= words=" + Quoted(words::Joined(option.choices, " ")) +
                             " files=" + (IsFile(option) ? "yes" : "") + " ;;\n";
             }
         }
@@ -89,7 +95,7 @@ std::string ZshValue(const std::string &strName, const Option &option) {
     if (IsFile(option)) {
         strAction = "_files";
     } else if (!option.choices.empty()) {
-        strAction = "(" + CLI::detail::join(option.choices, " ") + ")";
+        strAction = "(" + words::Joined(option.choices, " ") + ")";
     }
     return ":" + strName + ":" + strAction;
 }
@@ -172,7 +178,7 @@ std::string FishOption(const Option &option) {
         strRest += IsFile(option) ? "-r -F " : "-x ";
     }
     if (!option.choices.empty()) {
-        strRest += "-a " + FishQuoted(CLI::detail::join(option.choices, " ")) + " ";
+        strRest += "-a " + FishQuoted(words::Joined(option.choices, " ")) + " ";
     }
     return strRest + "-d " + FishQuoted(option.strDescription);
 }
@@ -245,7 +251,7 @@ std::string FishCompletion(const Command &program) {
         for (const Option &argument : command.arguments) {
             if (!argument.choices.empty()) {
                 strLines += FishLine(program.strName, command,
-                                     "-a " + FishQuoted(CLI::detail::join(argument.choices, " ")));
+                                     "-a " + FishQuoted(words::Joined(argument.choices, " ")));
             }
             if (IsFile(argument)) {
                 strLines += FishLine(program.strName, command, "-F");

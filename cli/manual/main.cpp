@@ -43,17 +43,17 @@ void WriteAll(const fs::path &folder, const manual::Program &program) {
 void Run(const fs::path &folder) {
     const std::vector<std::string> pages = {"qrmctl", "qrm-devserver", "box"};
 
-    CLI::App qrmctl(qrmctl::kSummary, "qrmctl");
+    const command::Program qrmctl("qrmctl", qrmctl::kSummary, qrmctl::kVersion);
     qrmctl::Action action;
     qrmctl::CommonOptions common;
-    qrmctl::AddCommandLine(qrmctl, action, common);
-    WriteAll(folder, {option_table::Read(qrmctl), qrmctl::ExitStatuses(), pages});
+    qrmctl::AddCommandLine(qrmctl.Root(), action, common);
+    WriteAll(folder, {qrmctl.Table(), qrmctl::ExitStatuses(), pages});
 
-    CLI::App server(devserver::kSummary, "qrm-devserver");
+    const command::Program server("qrm-devserver", devserver::kSummary, devserver::kVersion);
     devserver::Options options;
     devserver::Files files;
-    devserver::AddCommandLine(server, options, files);
-    WriteAll(folder, {option_table::Read(server), devserver::ExitStatuses(), pages});
+    devserver::AddCommandLine(server.Root(), options, files);
+    WriteAll(folder, {server.Table(), devserver::ExitStatuses(), pages});
 }
 
 }  // namespace

@@ -2,6 +2,8 @@
 
 #include <algorithm>
 
+#include "../words.h"
+
 namespace manual {
 namespace {
 
@@ -76,14 +78,16 @@ std::string LowerFirst(std::string strText) {
     if (strText.size() > 1 && strText[1] >= 'A' && strText[1] <= 'Z') {
         return strText;
     }
-    strText[0] = CLI::detail::to_lower(strText.substr(0, 1))[0];
+    if (strText[0] >= 'A' && strText[0] <= 'Z') {
+        strText[0] = static_cast<char>(strText[0] - 'A' + 'a');
+    }
     return strText;
 }
 
 // A word of a call: what is to be typed is bold, what is to be replaced is in capitals and italic.
 std::string UsageWord(const std::string &strWord) {
     std::string strLine;
-    for (const std::string &strPart : CLI::detail::split(strWord, ' ')) {
+    for (const std::string &strPart : words::Split(strWord, ' ')) {
         const bool blTyped = strPart.front() == '-';
         strLine += (strLine.empty() ? "" : " ") + (blTyped ? Bold(strPart) : Italic(strPart));
     }
@@ -112,7 +116,7 @@ std::string Options(const std::vector<Option> &options) {
         }
         strText += ".TP\n" + strLabel + "\n" + Escaped(option.strDescription);
         if (!option.choices.empty()) {
-            strText += ": " + Escaped(CLI::detail::join(option.choices, ", "));
+            strText += ": " + Escaped(words::Joined(option.choices, ", "));
         }
         strText +=
             option.blRequired && option.names.front().front() == '-' ? "; required.\n" : ".\n";
@@ -144,7 +148,7 @@ std::string CommandPages(const Command &program) {
 }
 
 std::string Statuses(const std::vector<ExitStatus> &statuses, const Command &command) {
-    const bool blProgram = command.strName.find(' ') == std::string::npos;
+    const bool blProgram = command.IsProgram();
     std::string strText;
     for (const ExitStatus &status : statuses) {
         const bool blOwn = status.szCommand != nullptr && command.strName == status.szCommand;

@@ -1,0 +1,24 @@
+#include "words.h"
+
+#include <sstream>
+
+namespace words {
+
+std::string Joined(const std::vector<std::string> &words, const char *szBetween) {
+    std::string strText;
+    for (std::size_t i = 0; i < words.size(); ++i) {
+        strText += (i == 0 ? "" : szBetween) + words[i];
+    }
+    return strText;
+}
+
+std::vector<std::string> Split(const std::string &strText, char separator) {
+    std::vector<std::string> words;
+    std::istringstream text(strText);
+    for (std::string strWord; std::getline(text, strWord, separator);) {
+        words.push_back(strWord);
+    }
+    return words;
+}
+
+}  // namespace words
