@@ -192,7 +192,14 @@ TEST_F(QrmctlCall, APrivateAuthorityServesEveryPathAndABadOneIsNamed) {
     const std::function<void()> faults[] = {
         [&] { std::ofstream(strBad) << "no certificate"; },
         [&] { std::ofstream(strBad) << FileText(joined::kCaFile).substr(0, 300); },
-        [&] { fs::create_symlink("/tmp/absent", strBad); }};
+        [&] { fs::create_symlink("/tmp/absent", strBad); }, [&] { mkfifo(strBad.c_str(), 0644); },
+        [&] {  // one that is encrypted asks nobody for its password
+            std::string strText = FileText(joined::kCaFile);
+            std::ofstream(strBad) << strText.insert(
+                strText.find('\n') + 1,
+                "Proc-Type: 4,ENCRYPTED\nDEK-Info: "
+                "AES-128-CBC,00112233445566778899AABBCCDDEEFF\n\n");
+        }};
     for (const auto &fault : faults) {
         fault();
         for (const Arguments &command : commands) {

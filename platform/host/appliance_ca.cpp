@@ -1,17 +1,21 @@
 #include "appliance_ca.h"
 
+#include <fcntl.h>
 #include <openssl/bio.h>
 #include <openssl/err.h>
 #include <openssl/pem.h>
 #include <sys/stat.h>
 #include <syslog.h>
+#include <unistd.h>
 
 #include <algorithm>
+#include <cstdio>
 #include <filesystem>
 #include <memory>
 #include <new>
 #include <string>
 #include <system_error>
+#include <utility>
 
 #include "../certificate_authorities.h"
 #include "last_error.h"
@@ -28,6 +32,9 @@ constexpr const char *kFolder = "/usr/zelo/etc/ssl/ca.d";
 struct FreeBio {
     void operator()(BIO *pBio) const { BIO_free(pBio); }
 };
+struct CloseFile {
+    void operator()(std::FILE *pFile) const { static_cast<void>(std::fclose(pFile)); }
+};
 struct FreeCertificate {
     void operator()(X509 *pCertificate) const { X509_free(pCertificate); }
 };
@@ -36,16 +43,35 @@ bool IsPemName(const fs::path &path) {
     return path.extension() == ".pem" || path.extension() == ".crt";
 }
 
+// A regular file; nobody is waited for who might write to a pipe.
+std::unique_ptr<std::FILE, CloseFile> Open(const std::string &strPath) {
+    const int fd = open(strPath.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY);
+    struct stat status = {};
+    std::unique_ptr<std::FILE, CloseFile> pFile(fd < 0 ? nullptr : fdopen(fd, "r"));
+    if (pFile == nullptr && fd >= 0) {
+        close(fd);
+    }
+    const bool blRegular = pFile != nullptr && fstat(fd, &status) == 0 && S_ISREG(status.st_mode);
+    return blRegular ? std::move(pFile) : nullptr;
+}
+
+// Instead of OpenSSL's own, which asks at the terminal.
+int NoPassword(char * /*szPassword*/, int /*cbPassword*/, int /*purpose*/, void * /*pContext*/) {
+    return -1;
+}
+
 // True when the file holds at least one certificate and nothing broken.
 bool AddFile(X509_STORE *pStore, const std::string &strPath) {
-    const std::unique_ptr<BIO, FreeBio> pFile(BIO_new_file(strPath.c_str(), "r"));
+    const auto pStream = Open(strPath);
+    const std::unique_ptr<BIO, FreeBio> pFile(
+        pStream == nullptr ? nullptr : BIO_new_fp(pStream.get(), BIO_NOCLOSE));
     if (pFile == nullptr) {
         return false;
     }
     int count = 0;
     while (true) {
         const std::unique_ptr<X509, FreeCertificate> pCertificate(
-            PEM_read_bio_X509(pFile.get(), nullptr, nullptr, nullptr));
+            PEM_read_bio_X509(pFile.get(), nullptr, NoPassword, nullptr));
         if (pCertificate == nullptr) {
             // The end of the file shows as a missing start line.
             return count > 0 && ERR_GET_REASON(ERR_peek_last_error()) == PEM_R_NO_START_LINE;
@@ -64,17 +90,18 @@ bool AddFolder(X509_STORE *pStore, std::string &strPath) {
     if (error == std::errc::no_such_file_or_directory) {
         return true;
     }
-    bool blAll = !error;
+    bool blAll = true;
     strPath = kFolder;
-    for (; blAll && entries != fs::directory_iterator(); entries.increment(error)) {
+    for (; blAll && !error && entries != fs::directory_iterator(); entries.increment(error)) {
         if (IsPemName(entries->path())) {
             strPath = entries->path().string();
             blAll = AddFile(pStore, strPath);
         }
-        blAll = blAll && !error;
     }
     ERR_clear_error();
-    return blAll;
+    // An error on the way leaves the iterator at its end.
+    strPath = error ? kFolder : strPath;
+    return blAll && !error;
 }
 
 }  // namespace
