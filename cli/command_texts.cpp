@@ -21,7 +21,9 @@ constexpr Text kTexts[] = {
      "All steps of a membership are taken, the join flag last; when one fails, those before it are "
      "undone. What is left of an earlier membership goes once a server has answered. An appliance "
      "that is joined already stays as it is without --again. The token goes over plain HTTP only "
-     "with --allow-http.",
+     "with --allow-http. Once a server has answered, Ctrl-C and SIGTERM wait until the join is "
+     "done "
+     "or undone, thus for the server's answer too; --deadline ends it sooner.",
      "qrmctl join --server qrm.example --http-port 0 --https-port 5001 \\\n"
      "    --token-file token"},
     {"status",
