@@ -1,5 +1,6 @@
 // qrmctl call and update: requests to the joined server.
 
+#include <limits>
 #include <memory>
 
 #include "commands.h"
@@ -88,6 +89,7 @@ void AddCall(CommandHandle program, Action &action) {
     command.Text("METHOD", pOptions->strMethod, "Its method").Required();
     command.Number("--version", pOptions->version, "Version of the API")
         .ValueName("N")
+        .Between(1, std::numeric_limits<int>::max())
         .ShowsDefault();
     command
         .Text("--params", pOptions->strParams,

@@ -1,8 +1,11 @@
 #include "candidates.h"
 
+#include <algorithm>
+
 #include "input_file.h"
 #include "json_text.h"
 #include "web_api_request.h"
+#include "words.h"
 
 namespace qrmctl {
 namespace {
@@ -46,9 +49,10 @@ bool ReadCandidates(const std::string &strFile, Report &report, Json::Value &can
         return false;
     }
     if (!candidates.isArray() || candidates.empty()) {
-        strError = "cannot use candidate list '" + strFile +
-                   "': it has to be an array of objects with \"host\", \"http_port\" and "
-                   "\"https_port\"";
+        strError = "cannot use candidate list '" + strFile + "': it " +
+                   (candidates.isArray() ? "is empty, and has to hold one object or more"
+                                         : "has to be an array of objects") +
+                   " with \"host\", \"http_port\" and \"https_port\"";
         return false;
     }
     for (Json::ArrayIndex i = 0; i < candidates.size(); ++i) {
@@ -59,6 +63,15 @@ bool ReadCandidates(const std::string &strFile, Report &report, Json::Value &can
         }
     }
     return true;
+}
+
+std::string HostFlaw(const std::string &strHost) {
+    const bool blForeign = std::any_of(strHost.begin(), strHost.end(), [](char c) {
+        return static_cast<unsigned char>(c) <= ' ' || c == '/' || c == 0x7F;
+    });
+    return blForeign ? "'" + words::Shortened(strHost) +
+                           "' is no name or address: leave out 'https://', paths and blanks"
+                     : "";
 }
 
 std::string CandidateNames(const Json::Value &candidates) {

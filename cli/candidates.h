@@ -16,6 +16,9 @@ namespace qrmctl {
 bool ReadCandidates(const std::string &strFile, Report &report, Json::Value &candidates,
                     std::string &strError);
 
+// What keeps a text from being a server's name or address, as a sentence; empty when nothing does.
+std::string HostFlaw(const std::string &strHost);
+
 // The candidates that are tried, such as "qrm.example:5001, 10.0.0.5:5001".
 std::string CandidateNames(const Json::Value &candidates);
 

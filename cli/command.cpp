@@ -7,6 +7,7 @@
 
 #include "help.h"
 #include "suggestion.h"
+#include "words.h"
 
 namespace command {
 namespace {
@@ -24,12 +25,47 @@ const CLI::App *WhereUnknown(const CLI::App &app) {
     return nullptr;
 }
 
+// The chosen command that lacks one of its own.
+const CLI::App &Innermost(const CLI::App &app) {
+    const std::vector<CLI::App *> chosen = app.get_subcommands();
+    return chosen.empty() ? app : Innermost(*chosen.front());
+}
+
+// The program's own commands are too many for a line.
+std::string CommandMissing(const CLI::App &app) {
+    const option_table::Command command = option_table::Read(app);
+    std::vector<std::string> names;
+    for (const option_table::Command &each : command.commands) {
+        names.push_back(each.LastName());
+    }
+    return "'" + command.strName + "' needs a command" +
+           (command.IsProgram() ? "" : ": " + words::Joined(names, ", "));
+}
+
 // A misspelt command or option is what the user has to know, not what is missing because of it.
 Stop Wrong(const CLI::App &app, const CLI::ParseError &error) {
-    const CLI::App *const pWhere = WhereUnknown(app);
-    return {true, pWhere == nullptr ? error.what()
-                                    : suggestion::UnknownWord(pWhere->remaining(false).front(),
-                                                              option_table::Read(*pWhere))};
+    if (const CLI::App *const pWhere = WhereUnknown(app)) {
+        return {true, suggestion::UnknownWord(pWhere->remaining(false).front(),
+                                              option_table::Read(*pWhere))};
+    }
+    const CLI::App &innermost = Innermost(app);
+    const bool blRequired =
+        error.get_exit_code() == static_cast<int>(CLI::ExitCodes::RequiredError);
+    if (blRequired && innermost.get_require_subcommand_min() > 0) {
+        return {true, CommandMissing(innermost)};
+    }
+    return {true, error.what()};
+}
+
+constexpr const char *kNotEmpty = "not empty";
+
+// An empty text would be taken for one that is not given.
+OptionHandle NotEmpty(CLI::Option &option) {
+    const auto flaw = [](const std::string &strValue) {
+        return std::string(strValue.empty() ? "it is empty: give a value, or leave it out" : "");
+    };
+    option.check(CLI::Validator(flaw, "", kNotEmpty));
+    return OptionHandle(option);
 }
 
 }  // namespace
@@ -46,6 +82,17 @@ OptionHandle OptionHandle::Hidden() const {
 
 OptionHandle OptionHandle::ValueName(const char *szName) const {
     m_pOption->type_name(szName);
+    return *this;
+}
+
+OptionHandle OptionHandle::Suggests(const std::string &strName,
+                                    const std::vector<std::string> &values) const {
+    m_pOption->type_name(strName + ":{" + words::Joined(values, ",") + "}");
+    return *this;
+}
+
+OptionHandle OptionHandle::MayBeEmpty() const {
+    m_pOption->get_validator(kNotEmpty)->active(false);
     return *this;
 }
 
@@ -124,13 +171,13 @@ OptionHandle CommandHandle::Flag(const std::string &strName, bool &blGiven,
 
 OptionHandle CommandHandle::Text(const std::string &strName, std::string &strValue,
                                  const std::string &strDescription) const {
-    return OptionHandle(*m_pApp->add_option(strName, strValue, strDescription));
+    return NotEmpty(*m_pApp->add_option(strName, strValue, strDescription));
 }
 
 OptionHandle CommandHandle::Text(const std::string &strName,
                                  const std::function<void(const std::string &)> &take,
                                  const std::string &strDescription) const {
-    return OptionHandle(*m_pApp->add_option_function<std::string>(strName, take, strDescription));
+    return NotEmpty(*m_pApp->add_option_function<std::string>(strName, take, strDescription));
 }
 
 OptionHandle CommandHandle::Texts(const std::string &strName, std::vector<std::string> &values,

@@ -31,6 +31,10 @@ class OptionHandle {
     OptionHandle ValueName(const char *szName) const;
     OptionHandle Between(int least, int most) const;
     OptionHandle OneOf(const std::vector<std::string> &values) const;
+    // The value's name, and values to choose from where others are taken too.
+    OptionHandle Suggests(const std::string &strName, const std::vector<std::string> &values) const;
+    // A text that is given and empty is refused otherwise.
+    OptionHandle MayBeEmpty() const;
     // The function says what is wrong with a value; nothing when it can be used.
     OptionHandle Checked(const std::function<std::string(const std::string &)> &flaw) const;
     OptionHandle Needs(OptionHandle other) const;

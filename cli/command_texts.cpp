@@ -21,7 +21,9 @@ constexpr Text kTexts[] = {
      "All steps of a membership are taken, the join flag last; when one fails, those before it are "
      "undone. What is left of an earlier membership goes once a server has answered. An appliance "
      "that is joined already stays as it is without --again. The token goes over plain HTTP only "
-     "with --allow-http.",
+     "with --allow-http. Once a server has answered, Ctrl-C and SIGTERM wait until the join is "
+     "done "
+     "or undone, thus for the server's answer too; --deadline ends it sooner.",
      "qrmctl join --server qrm.example --http-port 0 --https-port 5001 \\\n"
      "    --token-file token"},
     {"status",
@@ -69,6 +71,23 @@ constexpr Text kTexts[] = {
      "The time is that after which the disks sleep. A program that has read it in order to change "
      "it records that, and later readers get the time that it read while it lives.",
      "qrmctl idle set 20"},
+    {"update",
+     "The server gets the appliance's name, model, version and ports as they are now. The entry is "
+     "found by the serial number that the join has stored.",
+     "qrmctl update --host 192.0.2.7"},
+    {"welcome", "The welcome pages are what a user sees at the first login to this appliance.",
+     "qrmctl welcome hide admin"},
+    {"doctor",
+     "Each way is taken step by step, from the name to the Web API, and each step says what was "
+     "seen and what mends it. What is stored of the membership is checked too. Without options the "
+     "stored server is looked at.",
+     "qrmctl doctor\n"
+     "qrmctl doctor --server qrm.example --http-port 0 --https-port 5001"},
+    {"support",
+     "The archive holds the judgement, what doctor finds, versions, settings and how the client's "
+     "files lie, as a tar file with gzip. Tokens and passwords are left out; host names, addresses "
+     "and the serial number are not.",
+     "qrmctl support support.tar.gz"},
 };
 
 }  // namespace
@@ -87,6 +106,11 @@ const std::vector<option_table::ExitStatus> &ExitStatuses() {
         {kUsage, nullptr, "Wrong usage; standard error says which word."},
         {kNotJoined, "qrmctl status", "This appliance is not joined."},
         {kInconsistent, "qrmctl status", "This appliance is half joined: the indicators disagree."},
+        {kDeadline, nullptr,
+         "The deadline struck; standard error says what the time was spent on."},
+        {kDeadline, "qrmctl status",
+         "The deadline struck, after 10 seconds without --deadline; standard error says what the "
+         "time was spent on."},
     };
     return statuses;
 }

@@ -174,16 +174,24 @@ void AddDoctor(CommandHandle program, Action &action) {
         program.Add("doctor", "Check each step on the way to a server, changing nothing");
     const auto pOptions = std::make_shared<Options>();
     const OptionHandle candidates =
-        command.Text("--candidates", pOptions->strCandidates,
-                     "JSON file with the candidate connections, - for standard input");
+        command
+            .Text("--candidates", pOptions->strCandidates,
+                  "JSON file with the candidate connections, - for standard input")
+            .ValueName("FILE");
     const OptionHandle server =
-        command.Text("--server", pOptions->strServer,
-                     "The server's name or address (default: the stored connection)");
+        command
+            .Text("--server", pOptions->strServer,
+                  "The server's name or address (default: the stored connection)")
+            .ValueName("HOST")
+            .Checked(HostFlaw);
     const OptionHandle http =
-        command.Number("--http-port", pOptions->httpPort, "Its port for plain HTTP")
+        command.Number("--http-port", pOptions->httpPort, "Its port for plain HTTP; 0: none")
+            .ValueName("N")
             .Between(0, 65535);
     const OptionHandle https =
-        command.Number("--https-port", pOptions->httpsPort, "Its port for HTTPS").Between(0, 65535);
+        command.Number("--https-port", pOptions->httpsPort, "Its port for HTTPS; 0: none")
+            .ValueName("N")
+            .Between(0, 65535);
     server.Excludes(candidates).Needs(http).Needs(https);
     http.Needs(server);
     https.Needs(server);

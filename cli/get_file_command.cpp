@@ -10,6 +10,7 @@
 #include <cstdlib>
 #include <cstring>
 #include <filesystem>
+#include <limits>
 #include <memory>
 
 #include "commands.h"
@@ -151,6 +152,11 @@ bool ResolveDestination(const std::string &strPath, fs::path &destination, std::
         strError = "'" + strPath + "' is a directory: name the file in it";
         return false;
     }
+    const fs::file_type type = fs::status(destination, error).type();
+    if (type != fs::file_type::not_found && type != fs::file_type::regular) {
+        strError = "'" + strPath + "' is there and no ordinary file: name another path";
+        return false;
+    }
     const std::string strFolder = destination.parent_path();
     constexpr int kOwner = 1024;
     constexpr int kGroup = 100;
@@ -251,6 +257,7 @@ void AddGetFile(CommandHandle program, Action &action) {
     command.Text("METHOD", pOptions->strMethod, "Its method").Required();
     command.Number("--version", pOptions->version, "Version of the API")
         .ValueName("N")
+        .Between(1, std::numeric_limits<int>::max())
         .ShowsDefault();
     command
         .Text("--params", pOptions->strParams,

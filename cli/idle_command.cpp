@@ -4,16 +4,20 @@
 #include <memory>
 
 #include "commands.h"
+#include "words.h"
 #include "zeloqrmclient.h"
 
 namespace qrmctl {
 namespace {
 
+// The platform keeps any time. One beyond a year is a slip of the keyboard.
+constexpr unsigned long kLongest_min = 365UL * 24 * 60;
+
 // The whole text as a number. The parser itself takes "-1" for the largest one.
-bool ReadNumber(const std::string &strText, unsigned long &number) {
+bool ReadMinutes(const std::string &strText, unsigned long &minutes) {
     const char *szEnd = strText.data() + strText.size();
-    const auto [szRest, error] = std::from_chars(strText.data(), szEnd, number);
-    return error == std::errc() && szRest == szEnd;
+    const auto [szRest, error] = std::from_chars(strText.data(), szEnd, minutes);
+    return error == std::errc() && szRest == szEnd && minutes <= kLongest_min;
 }
 
 ExitCode Get(Report &report) {
@@ -48,16 +52,21 @@ void AddIdle(CommandHandle program, Action &action) {
     });
     const CommandHandle set = idle.Add("set", "Set the idle time");
     const auto pMinutes = std::make_shared<std::string>();
-    set.Text("MINUTES", *pMinutes, "Minutes without use before the disks sleep; 0: never")
+    set.Text("MINUTES", *pMinutes,
+             "Minutes without use before the disks sleep, at most a year; 0: never")
         .Required()
         .Checked([](const std::string &strMinutes) {
             unsigned long minutes = 0;
-            return ReadNumber(strMinutes, minutes) ? "" : "'" + strMinutes + "' is no number";
+            return ReadMinutes(strMinutes, minutes)
+                       ? ""
+                       : "'" + words::Shortened(strMinutes) +
+                             "' is no number of minutes from 0 to " + std::to_string(kLongest_min) +
+                             " (a year)";
         });
     set.RunsWhenChosen([pMinutes, &action] {
         action = [pMinutes](Report &report) {
             unsigned long minutes = 0;
-            ReadNumber(*pMinutes, minutes);
+            ReadMinutes(*pMinutes, minutes);
             return Set(minutes, report);
         };
     });

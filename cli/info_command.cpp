@@ -96,13 +96,13 @@ void AddInfo(CommandHandle program, Action &action) {
     const auto pValue = std::make_shared<std::string>();
 
     const CommandHandle get = info.Add("get", "Show the value of a key");
-    get.Text("KEY", *pKey, "The key").Required();
+    get.Text("KEY", *pKey, "The key; the library's own").Suggests("KEY", {"status"}).Required();
     get.RunsWhenChosen(
         [pKey, &action] { action = [pKey](Report &report) { return Get(*pKey, report); }; });
 
     const CommandHandle set = info.Add("set", "Set the value of a key");
     set.Text("KEY", *pKey, "The key").Required();
-    set.Text("VALUE", *pValue, "Its value").Required();
+    set.Text("VALUE", *pValue, "Its value").Required().MayBeEmpty();
     set.RunsWhenChosen([pKey, pValue, &action] {
         action = [pKey, pValue](Report &report) { return Set(*pKey, *pValue, report); };
     });

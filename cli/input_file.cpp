@@ -1,18 +1,22 @@
 #include "input_file.h"
 
+#include <json/reader.h>
+
 #include <cerrno>
 #include <cstring>
 #include <fstream>
 #include <iostream>
+#include <memory>
 #include <sstream>
 
 #include "json_text.h"
+#include "words.h"
 
 namespace qrmctl {
 namespace {
 
 bool ReadAll(const char *szWhat, const std::string &strFile, std::string &strText,
-             std::string &strError) {
+             std::string &strError, const char *szStandardInput = "-") {
     std::ostringstream text;
     if (strFile == "-") {
         text << std::cin.rdbuf();
@@ -25,7 +29,8 @@ bool ReadAll(const char *szWhat, const std::string &strFile, std::string &strTex
         if (!file.is_open() || file.bad() || errno == EISDIR) {
             strError = std::string("cannot read ") + szWhat + " '" + strFile +
                        "': " + std::strerror(errno == 0 ? EIO : errno) +
-                       "; name a file that can be read, or - for standard input";
+                       "; name a file that can be read, or " + szStandardInput +
+                       " for standard input";
             return false;
         }
     }
@@ -33,16 +38,44 @@ bool ReadAll(const char *szWhat, const std::string &strFile, std::string &strTex
     return true;
 }
 
+// The library's reader leaves what follows the value alone. Here it is part of a slip, such as a
+// quote at the wrong place. Other values than objects and arrays are no use to a command anyway.
+bool EndsWithValue(const std::string &strText, const Json::Value &value) {
+    if (!value.isObject() && !value.isArray()) {
+        return true;
+    }
+    Json::CharReaderBuilder builder;
+    builder["collectComments"] = false;
+    builder["failIfExtra"] = true;
+    builder["strictRoot"] = true;  // without it, following text that is no JSON passes
+    const std::unique_ptr<Json::CharReader> pReader(builder.newCharReader());
+    Json::Value ignored;
+    return pReader->parse(strText.data(), strText.data() + strText.size(), &ignored, nullptr);
+}
+
+bool ReadJson(const std::string &strText, Json::Value &value, std::string &strReason) {
+    Json::Value read;
+    if (!json_text::FromString(strText, read, &strReason)) {
+        return false;
+    }
+    if (!EndsWithValue(strText, read)) {
+        strReason = "something follows the end of the value";
+        return false;
+    }
+    value.swap(read);
+    return true;
+}
+
 }  // namespace
 
 bool ReadJsonFile(const char *szWhat, const std::string &strFile, Json::Value &value,
-                  std::string &strError) {
+                  std::string &strError, const char *szStandardInput) {
     std::string strText;
-    if (!ReadAll(szWhat, strFile, strText, strError)) {
+    if (!ReadAll(szWhat, strFile, strText, strError, szStandardInput)) {
         return false;
     }
     std::string strReason;
-    if (!json_text::FromString(strText, value, &strReason)) {
+    if (!ReadJson(strText, value, strReason)) {
         strError = std::string("cannot read ") + szWhat + " '" + strFile + "': " + strReason;
         return false;
     }
@@ -55,15 +88,16 @@ bool ReadParams(const std::string &strText, Json::Value &params, std::string &st
         return true;
     }
     if (strText.front() == '@') {
-        if (!ReadJsonFile("parameters", strText.substr(1), params, strError)) {
+        if (!ReadJsonFile("parameters", strText.substr(1), params, strError, "@-")) {
             return false;
         }
-    } else if (!json_text::FromString(strText, params, &strReason)) {
-        strError = "cannot read the parameters '" + strText + "': " + strReason;
+    } else if (!ReadJson(strText, params, strReason)) {
+        strError = "cannot read the parameters '" + words::Shortened(strText) + "': " + strReason;
         return false;
     }
     if (!params.isObject()) {
-        strError = "cannot use the parameters '" + strText + "': they have to be a JSON object";
+        strError = "cannot use the parameters '" + words::Shortened(strText) +
+                   "': they have to be a JSON object";
         return false;
     }
     return true;

@@ -14,9 +14,10 @@ namespace qrmctl {
 constexpr std::size_t kMaxStoredText = 1023;
 
 // Each returns whether the input can be used; if not, strError says in one line what is wrong with
-// which file. "-" is standard input. szWhat names the input in messages, such as "candidate list".
+// which file. "-" is standard input; how the user writes that is szStandardInput. szWhat names the
+// input in messages, such as "candidate list". Nothing may follow the JSON value.
 bool ReadJsonFile(const char *szWhat, const std::string &strFile, Json::Value &value,
-                  std::string &strError);
+                  std::string &strError, const char *szStandardInput = "-");
 
 // The parameters of a call, an object: JSON text, or @FILE; null for an empty text.
 bool ReadParams(const std::string &strText, Json::Value &params, std::string &strError);

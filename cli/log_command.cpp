@@ -29,8 +29,10 @@ void AddParams(CommandHandle command, Options &options) {
         const auto add = [&options](const std::string &strParam) {
             options.params.push_back(strParam);
         };
-        const OptionHandle param = command.Text("PARAM" + (i == 0 ? "" : std::to_string(i)), add,
-                                                "What fills its markers {0}, {1}, ...");
+        const OptionHandle param = command
+                                       .Text("PARAM" + (i == 0 ? "" : std::to_string(i)), add,
+                                             "What fills its markers {0}, {1}, ...")
+                                       .MayBeEmpty();
         if (i > 0) {
             param.Hidden();
         }
@@ -109,7 +111,9 @@ ExitCode Push(const Options &options, Report &report) {
 void AddLog(CommandHandle program, Action &action) {
     const CommandHandle command = program.Add("log", "Push a log entry to the joined server");
     const auto pOptions = std::make_shared<Options>();
-    command.Text("LEVEL", pOptions->strLevel, "0 to 7, or a name such as warning").Required();
+    command.Text("LEVEL", pOptions->strLevel, "0 to 7, or a name")
+        .Suggests("LEVEL", {"emerg", "alert", "crit", "err", "warning", "notice", "info", "debug"})
+        .Required();
     command
         .Text("SECTION", pOptions->strSection,
               "Section of the strings files; - when KEY is the message itself")
@@ -118,7 +122,8 @@ void AddLog(CommandHandle program, Action &action) {
     AddParams(command, *pOptions);
     const OptionHandle extraInfo =
         command.Text("--extra-info", pOptions->strExtraInfo, "Text sent beside the message")
-            .ValueName("TEXT");
+            .ValueName("TEXT")
+            .MayBeEmpty();
     command.Flag("--render", pOptions->blRender,
                  "Show the message in every language and send nothing");
     command.RunsWhenChosen([pOptions, extraInfo, &action] {

@@ -2,6 +2,8 @@
 
 #include <algorithm>
 
+#include "words.h"
+
 namespace suggestion {
 namespace {
 
@@ -71,10 +73,11 @@ std::string UnknownWord(const std::string &strWord, const option_table::Command 
     }
     const std::string strMeant = Meant(strWord.substr(0, strWord.find('=')), names);
     if (strMeant.empty() && !blOption && names.empty()) {
-        return "'" + strWord + "' is one argument too many";
+        return "'" + words::Shortened(strWord) + "' is one argument too many";
     }
-    return "'" + strWord + "' is no " + (blOption ? "option" : "command") + " of '" +
-           command.strName + "'" + (strMeant.empty() ? "" : "; did you mean '" + strMeant + "'?");
+    return "'" + words::Shortened(strWord) + "' is no " + (blOption ? "option" : "command") +
+           " of '" + command.strName + "'" +
+           (strMeant.empty() ? "" : "; did you mean '" + strMeant + "'?");
 }
 
 }  // namespace suggestion

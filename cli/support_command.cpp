@@ -138,7 +138,7 @@ void AddSupport(CommandHandle program, Action &action) {
         program.Add("support", "Write an archive for support, without any secret");
     const auto pFile = std::make_shared<std::string>();
     const auto pForce = std::make_shared<bool>(false);
-    command.Text("FILE", *pFile, "The archive").Required();
+    command.Text("FILE", *pFile, "The archive").ValueName("FILE").Required();
     command.Flag("--force", *pForce, "Replace a file that is there");
     command.RunsWhenChosen([pFile, pForce, &action] {
         action = [pFile, pForce](Report &report) { return Support(*pFile, *pForce, report); };

@@ -132,7 +132,7 @@ struct Setting {
 };
 
 // What the library and the platform look up; nothing else of the files is anybody's business.
-constexpr std::array<Setting, 16> kSettings = {{
+constexpr std::array<Setting, 17> kSettings = {{
     {kConfigFile, "join_nvo_qrm"},
     {kConfigFile, "admin_port"},
     {kConfigFile, "secure_admin_port"},
@@ -144,6 +144,7 @@ constexpr std::array<Setting, 16> kSettings = {{
     {kConfigFile, "plugin_timeout"},
     {kConfigFile, "max_users"},
     {kConfigFile, "extra_admin_QRM"},
+    {kConfigFile, "disk_idle_minutes"},
     {"/etc.defaults/zeloinfo.conf", "upnpmodelname"},
     {"/etc.defaults/VERSION", "majorversion"},
     {"/etc.defaults/VERSION", "minorversion"},

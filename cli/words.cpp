@@ -21,4 +21,16 @@ std::vector<std::string> Split(const std::string &strText, char separator) {
     return words;
 }
 
+std::string Shortened(const std::string &strText) {
+    constexpr std::size_t kLongest = 200;
+    if (strText.size() <= kLongest) {
+        return strText;
+    }
+    std::size_t end = kLongest;
+    while (end > 0 && (static_cast<unsigned char>(strText[end]) & 0xC0U) == 0x80) {
+        --end;
+    }
+    return strText.substr(0, end) + "...";
+}
+
 }  // namespace words

@@ -104,6 +104,16 @@ Json::Value HeadersOf(const httplib::Request &request) {
     return headers;
 }
 
+// For who opens the server's bare address in a browser.
+Reply ToConsole() {
+    Reply reply;
+    reply.status = 302;
+    reply.strType = "text/plain";
+    reply.headers = {{"Location", kConsolePath}};
+    reply.strBody = std::string("The console is at ") + kConsolePath + ".\n";
+    return reply;
+}
+
 // The optional parameters of a description: text, except for the numbers.
 bool HasDescriptionTypes(const Json::Value &params) {
     const auto isText = [&params](const char *szKey) {
@@ -253,6 +263,10 @@ void DevServer::Handle(const char *szScheme, const httplib::Request &request,
     const auto pause = [this](int ms) { return Delay(ms); };
     if (request.path.rfind("/dev/", 0) == 0) {
         Send(HandleDevelopment(request), {}, pause, response);
+        return;
+    }
+    if (request.method == "GET" && request.path == "/") {
+        Send(ToConsole(), {}, pause, response);
         return;
     }
     const Call call(request);

@@ -3,6 +3,9 @@
 #include <httplib.h>
 
 #include <algorithm>
+#include <ctime>
+#include <iomanip>
+#include <sstream>
 
 #include "json_text.h"
 
@@ -61,6 +64,19 @@ class Pieces {
     Pause m_pause;
 };
 
+// Such as "Sun, 06 Nov 1994 08:49:37 GMT", whatever the language of the process.
+std::string HttpDate(std::time_t time) {
+    constexpr const char *kDays[] = {"Sun", "Mon", "Tue", "Wed", "Thu", "Fri", "Sat"};
+    constexpr const char *kMonths[] = {"Jan", "Feb", "Mar", "Apr", "May", "Jun",
+                                       "Jul", "Aug", "Sep", "Oct", "Nov", "Dec"};
+    std::tm utc = {};
+    gmtime_r(&time, &utc);
+    std::ostringstream text;
+    text << kDays[utc.tm_wday] << std::put_time(&utc, ", %d ") << kMonths[utc.tm_mon]
+         << std::put_time(&utc, " %Y %H:%M:%S GMT");
+    return text.str();
+}
+
 }  // namespace
 
 Reply JsonReply(int status, const Json::Value &value) {
@@ -73,6 +89,10 @@ Reply JsonReply(int status, const Json::Value &value) {
 void Send(const Reply &reply, const NextAnswer &answer, const Pause &pause,
           httplib::Response &response) {
     response.status = reply.status;
+    // A header that is set twice goes out twice.
+    if (answer.headers.count("Date") == 0) {
+        response.set_header("Date", HttpDate(std::time(nullptr)));
+    }
     for (const auto *pHeaders : {&reply.headers, &answer.headers}) {
         for (const auto &[strName, strValue] : *pHeaders) {
             response.set_header(strName, strValue);

@@ -8,7 +8,7 @@
 #include <iostream>
 
 int main(int argc, char **argv) {
-    if (argc != 2) {
+    if (argc != 2 || argv[1][0] == '-') {
         std::cerr << "usage: example-push-log VOLUME\n";
         return 2;
     }

@@ -95,11 +95,11 @@ TEST_F(QrmctlCall, ALogEntryAndAnIdleTimeAreTakenAsTheyAreTyped) {
     Run({"log", "err", "nosuch", "text"}, 1);
     EXPECT_EQ(s_pServer->Log().size(), 1U);
 
-    for (const char *szTime : {"0", "18446744073709551615"}) {
+    for (const char *szTime : {"0", "525600"}) {
         Run({"idle", "set", szTime}, 0);
         EXPECT_EQ(Run({"idle", "get"}, 0)["idle_minutes"].asString(), szTime);
     }
-    for (const char *szTime : {"-1", "18446744073709551616", "1x", ""}) {
+    for (const char *szTime : {"-1", "18446744073709551616", "525601", "1x", ""}) {
         EXPECT_EQ(run_program::Run({QRMCTL, "idle", "set", szTime}).status, 2) << szTime;
     }
 }

@@ -116,7 +116,8 @@ TEST_F(Qrmctl, WrongUsageIsToldToPeopleAndPrograms) {
     const struct {
         Arguments arguments;
         const char *szNamed;
-    } rows[] = {{{}, "subcommand"},
+    } rows[] = {{{}, "'qrmctl' needs a command;"},
+                {{"credential"}, "needs a command: show, create, update, delete;"},
                 {{"jion"}, "jion"},
                 {{"credential", "shwo"}, "shwo"},
                 {{"credential", "show", "surplus"}, "surplus"},
@@ -125,7 +126,15 @@ TEST_F(Qrmctl, WrongUsageIsToldToPeopleAndPrograms) {
                 {{"join", "--sever", "h"}, "--sever"},
                 {Join("65536", "1"), "65536"},
                 {Join("0", "https"), "https"},
-                {{"join", "--server", "", "--http-port", "0"}, "--server"}};
+                {{"join", "--server", "", "--http-port", "0"}, "--server"},
+                {Join("0", "1") + Arguments{"--sn", ""}, "--sn: it is empty"},
+                {{"call", "a", "b", "--params", ""}, "--params: it is empty"},
+                {{"info", "set", "", "c"}, "KEY: it is empty"},
+                {{"call", "a", "b", "--version", "-1"}, "range 1 to 2147483647"},
+                {{"call", "a", "b", "--version", "99999999999999"}, "range 1 to 2147483647"},
+                {{"doctor", "--server", "https://h", "--http-port", "0", "--https-port", "1"},
+                 "leave out 'https://'"},
+                {{std::string(100'000, 'x')}, "xxx...' is no command"}};
     for (const auto &row : rows) {
         const Outcome outcome = Run(row.arguments);
         EXPECT_EQ(outcome.status, 2);
@@ -187,6 +196,9 @@ TEST_F(Qrmctl, UnusableInputFailsBeforeAnythingIsSentOrStored) {
     const Arguments candidates = Join("0", s_strHttps) + Arguments{"--candidates", "in"};
     const Arguments test = {"test-connection", "--api", kApi, "in"};
     const Arguments create = {"credential", "create", "in"};
+    const auto call = [](const std::string &strParams) {
+        return Arguments{"call", kApi, "info", "--params", strParams};
+    };
     const Arguments update = {"credential", "update", "in"};
     const struct {
         Arguments arguments;
@@ -203,7 +215,12 @@ TEST_F(Qrmctl, UnusableInputFailsBeforeAnythingIsSentOrStored) {
         {test, "{}", "an array"},
         {test, std::string(5000, '['), "nested too deeply"},
         {candidates, "-", "name a file"},
-        {candidates, "[]", "an array"},
+        {candidates, "[]", "it is empty"},
+        {candidates, "[{}] {}", "something follows the end"},
+        {call(R"({"a":1} trailing)"), "-", "something follows the end"},
+        {call(R"({"a":1}})"), "-", "something follows the end"},
+        {call("@in"), "-", "or @- for standard input"},
+        {call("x" + std::string(100'000, 'a')), "-", "aaa...'"},
         {create, "", "'in': Line 1"},
         {create, "[]", "an object"},
         {create, strCred + R"(t","port":"443"})", "\"port\" has to be an integer"},
