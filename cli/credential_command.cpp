@@ -19,8 +19,12 @@ using json_text::Member;
 ExitCode Show(bool blWithToken, Report &report) {
     Report::Stage("reading the credential store");
     Json::Value cred(Json::objectValue);
-    const bool blFound = blWithToken ? ZELOQRMClientGetServerCredentialWithToken(cred)
-                                     : ZELOQRMClientGetServerCredential(cred);
+    const auto find = [&] {
+        return blWithToken ? ZELOQRMClientGetServerCredentialWithToken(cred)
+                           : ZELOQRMClientGetServerCredential(cred);
+    };
+    // A store that can be read now may have been held by another program a moment ago.
+    const bool blFound = find() || (!HasMember(cred, "host") && !StoreFlaw() && find());
     if (!blFound && HasMember(cred, "host")) {
         return report.Fail(ErrorId::kNoSession, "the server credential has no session: join again");
     }
@@ -98,6 +102,9 @@ ExitCode Change(const std::string &strFile, bool blCreate, Report &report) {
 ExitCode Delete(Report &report) {
     Report::Stage("changing the credential store");
     Report::Remedy("run 'qrmctl credential delete' again");
+    if (const std::optional<ErrorId> flaw = StoreFlaw()) {
+        return report.Fail(*flaw, StoreFlawText(*flaw));
+    }
     if (!ZELOQRMClientDeleteServerCredential()) {
         return report.Fail(ErrorId::kCredentialNotRemoved,
                            "the credential could not be removed whole; -v shows the reason");

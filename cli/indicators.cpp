@@ -78,7 +78,8 @@ Indicator ReadCredential(const Flag &flag, const char *szName, const char *szApp
     const long id = ZELOCredIDGetByApplication(szApplication);
     const CredHandle pCred(ZELOCredAlloc());
     FixedText<1024> host;
-    if (const std::optional<ErrorId> flaw = StoreFlaw()) {
+    const std::optional<ErrorId> flaw = StoreFlaw();
+    if (flaw) {
         indicator.strHolds = *flaw == ErrorId::kStoreDamaged
                                  ? "damaged store; 'qrmctl leave' sets it aside"
                                  : "cannot be read (-v names the store)";
@@ -94,6 +95,13 @@ Indicator ReadCredential(const Flag &flag, const char *szName, const char *szApp
         Break(indicator, rule);
     } else if (flag.blYes && id < 0) {
         Break(indicator, rule + 1);
+    }
+    if (flaw) {
+        // Leaving because of a store that another program holds would end a good membership.
+        indicator.strRemedy =
+            *flaw == ErrorId::kStoreDamaged
+                ? "qrmctl leave, which sets the store aside, then qrmctl join"
+                : "end the program that holds the store, or mend its mode; then look again";
     }
     return indicator;
 }

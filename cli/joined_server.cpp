@@ -63,6 +63,10 @@ std::optional<JoinedServer> RequireJoinedServer(Report &report, ExitCode &code) 
         return server;
     }
     const std::optional<ErrorId> flaw = StoreFlaw();
+    // A store that can be read now may have been held by another program a moment ago.
+    if (!flaw && (server = FindJoinedServer())) {
+        return server;
+    }
     code = flaw ? report.Fail(*flaw, StoreFlawText(*flaw))
                 : report.Fail(ErrorId::kNotJoined,
                               "this appliance is not joined, there is no server to ask: run "

@@ -48,6 +48,9 @@ void Explain(Report &report) {
             entry["remedy"] = indicator.strRemedy;
             strLine += "breaks rule " + std::to_string(indicator.rule) + ", " +
                        indicator.strMeaning + "; to mend: " + indicator.strRemedy;
+        } else if (!indicator.strRemedy.empty()) {
+            entry["remedy"] = indicator.strRemedy;
+            strLine += "is not known; to mend: " + indicator.strRemedy;
         } else {
             strLine += "agrees";
         }
@@ -62,7 +65,11 @@ ExitCode Status(bool blExplain, Report &report) {
     Report::Stage(
         "judging the membership: configuration, credential store, cache daemon, web sessions and "
         "service account");
-    const int status = ZELOQRMClientStatus();
+    int status = ZELOQRMClientStatus();
+    // The look-ups that the judgement rests on may succeed in a store that is damaged elsewhere.
+    if (StoreFlaw() == ErrorId::kStoreDamaged) {
+        status = -1;
+    }
     report.Fact("status", VerdictName(status));
     if (blExplain) {
         Explain(report);

@@ -365,8 +365,15 @@ TEST_F(Qrmctl, ADamagedStoreIsSetAsideByLeavingAndJoiningAlone) {
             Run(arguments);
             EXPECT_EQ(read(), strDamaged) << "reading leaves it as it is";
         }
-        EXPECT_TRUE(Holds(Run({"status", "--explain"}).strOut, "damaged store"));
-        EXPECT_EQ(RunForJson({"call", kApi, "info"}, 1)["error_id"], "store-damaged");
+        const Outcome explained = Run({"status", "--explain"});
+        EXPECT_EQ(explained.status, 4);
+        EXPECT_TRUE(Holds(explained.strOut, "qrmctl leave, which sets the store aside"));
+        EXPECT_FALSE(Holds(explained.strOut, "sets it aside agrees"));
+        for (const Arguments &arguments :
+             {Arguments{"call", kApi, "info"}, {"credential", "delete"}}) {
+            EXPECT_EQ(RunForJson(arguments, 1)["error_id"], "store-damaged");
+        }
+        EXPECT_EQ(read(), strDamaged);
 
         const Json::Value mended = RunForJson(row.mend, 0);
         const std::string strAside = mended["set_aside"].asString();
