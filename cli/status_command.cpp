@@ -59,9 +59,7 @@ void Explain(Report &report) {
 }
 
 ExitCode Status(bool blExplain, Report &report) {
-    Report::Stage(
-        "judging the membership: configuration, credential store, cache daemon, web sessions and "
-        "service account");
+    Report::Stage("judging the membership");
     const int status = ZELOQRMClientStatus();
     report.Fact("status", VerdictName(status));
     if (blExplain) {
@@ -108,7 +106,7 @@ ExitCode Leave(const LeaveRequest &request, Report &report) {
     Report::Stage("looking up the joined server in the credential store");
     const std::optional<JoinedServer> server = FindJoinedServer();
     const bool blDamaged = ClearDamagedStore(report);
-    Report::Stage("leaving: plug-ins, credentials, web sessions, cache daemon, account");
+    Report::Stage("leaving");
     const bool blJoined = ZELOQRMClientStatus() != 0;
     if (!LeaveWholly(request)) {
         return report.Fail(ErrorId::kLeaveFailed,
