@@ -1,31 +1,32 @@
 #include "deadline.h"
 
 #include <json/value.h>
-#include <poll.h>
 #include <pthread.h>
 #include <unistd.h>
 
 #include <chrono>
 #include <condition_variable>
 #include <csignal>
-#include <filesystem>
-#include <fstream>
+#include <exception>
 #include <mutex>
 #include <sstream>
+#include <string_view>
 #include <thread>
 #include <utility>
-#include <vector>
 
+#include "fixed_text.h"
 #include "json_text.h"
+#include "output.h"
 #include "report.h"
+#include "waiting.h"
 
 namespace qrmctl {
 namespace {
 
-namespace fs = std::filesystem;
 using Clock = std::chrono::steady_clock;
 
 constexpr std::chrono::milliseconds kLongestCleanup(500);
+constexpr std::chrono::milliseconds kLongestTelling(250);
 
 struct Stage {
     std::string strName;
@@ -46,7 +47,8 @@ struct Watch {
     std::string strRemedy = "mend what it waited for, or give it more time with --deadline";
     std::function<void()> cleanup;
     std::mutex cleanupMutex;
-    std::condition_variable cleaned;
+    std::condition_variable cleanupWake;
+    bool blCleanupAsked = false;
     bool blCleaned = false;
 };
 
@@ -67,68 +69,73 @@ std::string Seconds(Clock::duration time) {
         1000);
 }
 
-// A reader that has stopped reading must not keep the program from ending.
-void Write(int fd, const std::string &strText) {
-    pollfd output = {fd, POLLOUT, 0};
-    if (poll(&output, 1, 0) == 1) {
-        static_cast<void>(write(fd, strText.data(), strText.size()) < 0);
+// A text for a message that is to fit into a pipe at once; cut between characters.
+std::string Short(const std::string &strText) {
+    constexpr std::size_t kMost = 300;
+    if (strText.size() <= kMost) {
+        return strText;
     }
-}
-
-// --- What was started ---------------------------------------------------------------------------
-
-std::vector<pid_t> ChildrenOf(const std::string &strProcess) {
-    std::vector<pid_t> children;
-    std::error_code error;
-    for (fs::directory_iterator task("/proc/" + strProcess + "/task", error);
-         !error && task != fs::directory_iterator(); task.increment(error)) {
-        std::ifstream list(task->path() / "children");
-        for (pid_t pid = 0; list >> pid;) {
-            children.push_back(pid);
-        }
+    std::size_t cb = kMost;
+    while (cb > 0 && (static_cast<unsigned char>(strText[cb]) & 0xC0U) == 0x80U) {
+        --cb;
     }
-    return children;
-}
-
-// Ends what the program waits for: its children, the platform's wardens, and the process groups of
-// the programs that those watch. The wardens only stop at first: one that ended would let the main
-// thread go on to its next step. Returns them.
-std::vector<pid_t> EndStarted() {
-    std::vector<pid_t> wardens = ChildrenOf("self");
-    for (const pid_t warden : wardens) {
-        kill(warden, SIGSTOP);
-        for (const pid_t program : ChildrenOf(std::to_string(warden))) {
-            kill(-program, SIGKILL);
-            kill(program, SIGKILL);
-        }
-    }
-    return wardens;
+    return strText.substr(0, cb) + "...";
 }
 
 // --- The strike ---------------------------------------------------------------------------------
+
+// The stage in force, with what the platform waits for in it.
+std::string StageNow(const Watch &watch) {
+    FixedText<1024> waiting;
+    return ZELOWaitingFor(waiting.Buffer(), FixedText<1024>::Size()) > 0
+               ? Short(watch.strStage) + ", " + Short(waiting.sz())
+               : Short(watch.strStage);
+}
+
+// A thread that was there before, since starting one may fail.
+void RunCleanup() {
+    Watch &watch = TheWatch();
+    std::unique_lock<std::mutex> lock(watch.cleanupMutex);
+    watch.cleanupWake.wait(lock, [&watch] { return watch.blCleanupAsked; });
+    try {
+        watch.cleanup();
+    } catch (const std::exception &) {
+        // What is left over stays; there is nobody to tell.
+    }
+    watch.blCleaned = true;
+    watch.cleanupWake.notify_all();
+}
 
 void CleanUp(Watch &watch) {
     if (!watch.cleanup) {
         return;
     }
-    std::thread([&watch] {
-        watch.cleanup();
-        const std::lock_guard<std::mutex> lock(watch.cleanupMutex);
-        watch.blCleaned = true;
-        watch.cleaned.notify_one();
-    }).detach();
     std::unique_lock<std::mutex> lock(watch.cleanupMutex);
-    watch.cleaned.wait_for(lock, kLongestCleanup, [&watch] { return watch.blCleaned; });
+    watch.blCleanupAsked = true;
+    watch.cleanupWake.notify_all();
+    watch.cleanupWake.wait_for(lock, kLongestCleanup, [&watch] { return watch.blCleaned; });
 }
 
-void Tell(const Watch &watch) {
-    const Clock::duration time = Clock::now() - watch.begin;
+// A reader that has stopped reading must not keep the program from ending.
+void WriteSoon(int fd, std::string_view text) {
+    const Clock::time_point end = Clock::now() + kLongestTelling;
+    while (!text.empty()) {
+        const ssize_t cb = WriteNow(fd, text);
+        const auto left = std::chrono::duration_cast<std::chrono::milliseconds>(end - Clock::now());
+        if (cb < 0 || (cb == 0 && (left.count() <= 0 || !AwaitRoom(fd, left)))) {
+            return;
+        }
+        text.remove_prefix(static_cast<std::size_t>(cb));
+    }
+}
+
+void Tell(const Watch &watch, const std::string &strStage, Clock::duration time) {
     const bool blEarlier = watch.longest.time > time;
+    const std::string strLongest = Short(watch.longest.strName);
     std::string strError = "the deadline of " + Seconds(watch.limit_s) + " struck while '" +
-                           watch.strStage + "' (" + Seconds(time) + ')';
+                           strStage + "' (" + Seconds(time) + ')';
     if (blEarlier) {
-        strError +=
-            ", after '" + watch.longest.strName + "' had taken " + Seconds(watch.longest.time);
+        strError += ", after '" + strLongest + "' had taken " + Seconds(watch.longest.time);
     }
     strError += "; " + watch.strRemedy;
     if (watch.blJson && !watch.blOutput) {
@@ -138,20 +145,23 @@ void Tell(const Watch &watch) {
         result["error"] = strError;
         result["error_id"] = ErrorOf(ErrorId::kDeadline).szId;
         result["deadline_s"] = watch.limit_s;
-        result["stage"] = watch.strStage;
-        result["longest_stage"] = blEarlier ? watch.longest.strName : watch.strStage;
-        Write(STDOUT_FILENO, json_text::ToLogText(result) + '\n');
+        result["stage"] = strStage;
+        result["longest_stage"] = blEarlier ? strLongest : strStage;
+        WriteSoon(STDOUT_FILENO, json_text::ToLogText(result) + '\n');
     }
-    Write(STDERR_FILENO, "qrmctl: " + Printable(strError) + '\n');
+    WriteSoon(STDERR_FILENO, "qrmctl: " + Printable(strError) + '\n');
 }
 
 // The mutex is held to the end: the main thread enters no other stage and prints nothing more.
 [[noreturn]] void Strike(Watch &watch) {
-    const std::vector<pid_t> wardens = EndStarted();
-    Tell(watch);
-    CleanUp(watch);
-    for (const pid_t warden : wardens) {
-        kill(warden, SIGKILL);
+    try {
+        const Clock::duration time = Clock::now() - watch.begin;
+        const std::string strStage = StageNow(watch);
+        ZELOWaitingGiveUp();
+        CleanUp(watch);
+        Tell(watch, strStage, time);
+    } catch (const std::exception &) {
+        // Without memory there is no message; the exit status tells enough.
     }
     _exit(ErrorOf(ErrorId::kDeadline).exitCode);
 }
@@ -176,6 +186,7 @@ void StartDeadline(double limit_s, bool blJson) {
     sigset_t before;
     sigfillset(&all);
     pthread_sigmask(SIG_SETMASK, &all, &before);
+    std::thread(RunCleanup).detach();
     std::thread(KeepTime, end).detach();
     pthread_sigmask(SIG_SETMASK, &before, nullptr);
 }
@@ -197,17 +208,25 @@ void SetDeadlineRemedy(const std::string &strRemedy) {
     watch.strRemedy = strRemedy;
 }
 
-void BeginOutput() {
-    EnterStage("writing the result");
-    const std::lock_guard<std::mutex> lock(TheWatch().mutex);
-    TheWatch().blOutput = true;
-}
-
-void StopDeadline() {
+// Each piece is written under the mutex: the deadline strikes before the last one or not at all.
+bool Deliver(int fd, std::string_view text, bool blLast) {
     Watch &watch = TheWatch();
-    const std::lock_guard<std::mutex> lock(watch.mutex);
-    watch.blStopped = true;
-    watch.wake.notify_all();
+    for (;;) {
+        {
+            const std::lock_guard<std::mutex> lock(watch.mutex);
+            const ssize_t cb = WriteNow(fd, text);
+            if (cb < 0) {
+                return false;
+            }
+            watch.blOutput = watch.blOutput || (fd == STDOUT_FILENO && cb > 0);
+            text.remove_prefix(static_cast<std::size_t>(cb));
+            if (text.empty()) {
+                watch.blStopped = watch.blStopped || blLast;
+                return true;
+            }
+        }
+        AwaitRoom(fd, std::chrono::milliseconds(-1));
+    }
 }
 
 DeadlineCleanup::DeadlineCleanup(std::function<void()> cleanup) {

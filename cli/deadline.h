@@ -1,6 +1,6 @@
 // The deadline of a run: when it strikes, the program ends at once, whatever it is blocked in, and
-// says which stage used the time. What the program waits for meanwhile, such as a plug-in, is ended
-// with it.
+// says which stage used the time and what it waited for. A program that it runs meanwhile, such as
+// a plug-in, is ended with it.
 //
 // A thread of its own keeps the time. It blocks all signals, so that none that is meant to
 // interrupt a wait of the main thread is lost to it.
@@ -10,6 +10,7 @@
 
 #include <functional>
 #include <string>
+#include <string_view>
 
 namespace qrmctl {
 
@@ -26,12 +27,10 @@ void EnterStage(const std::string &strName);
 // What the operator is told to do when the deadline strikes from here on.
 void SetDeadlineRemedy(const std::string &strRemedy);
 
-// From here on standard output belongs to the result: a deadline that strikes is told on standard
-// error alone.
-void BeginOutput();
-
-// The result is out: the deadline strikes no more.
-void StopDeadline();
+// Writes the text to the standard stream. The deadline strikes while it waits for the reader; it is
+// told on standard error alone once standard output has begun. blLast: with the text's last byte,
+// or at once when it has none, the deadline is over. False when the stream cannot be written.
+bool Deliver(int fd, std::string_view text, bool blLast);
 
 // Something to clear away when the deadline strikes during its life, within half a second; what
 // takes longer is left.

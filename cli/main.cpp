@@ -10,6 +10,7 @@
 
 #include "command_line.h"
 #include "deadline.h"
+#include "output.h"
 
 namespace {
 
@@ -53,6 +54,7 @@ int Run(int argc, char **argv) {
 }  // namespace
 
 int main(int argc, char **argv) {
+    const qrmctl::GuardedOutput output;
     try {
         return Run(argc, argv);
     } catch (const std::exception &error) {

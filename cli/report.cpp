@@ -12,8 +12,11 @@
 #include "certificate_authorities.h"
 #include "deadline.h"
 #include "json_text.h"
+#include "output.h"
 
 namespace qrmctl {
+
+static constexpr const char *kOutputStage = "writing the result";
 
 std::string Printable(const std::string &strText) {
     std::string strSafe;
@@ -80,7 +83,7 @@ void Report::Say(const std::string &strSentence) const {
 
 void Report::Warn(const std::string &strSentence) {
     m_result["warnings"].append(strSentence);
-    std::cerr << "qrmctl: warning: " << Printable(strSentence) << '\n';
+    std::cerr << ("qrmctl: warning: " + Printable(strSentence) + '\n');
 }
 
 void Report::Stage(const std::string &strName) {
@@ -93,8 +96,10 @@ void Report::Remedy(const std::string &strRemedy) {
 
 ExitCode Report::Done(ExitCode code) {
     m_result["success"] = true;
-    if (!Print()) {
+    Stage(kOutputStage);
+    if (!PutOutResult()) {
         std::cerr << "qrmctl: cannot write to standard output\n";
+        static_cast<void>(PutOutLast(std::cerr));
         return ErrorOf(ErrorId::kOutput).exitCode;
     }
     return code;
@@ -104,8 +109,17 @@ ExitCode Report::Fail(ErrorId id, const std::string &strError) {
     m_result["success"] = false;
     m_result["error"] = strError;
     m_result["error_id"] = ErrorOf(id).szId;
-    static_cast<void>(Print());
-    std::cerr << "qrmctl: " << Printable(strError) << '\n';
+    Stage(kOutputStage);
+    const std::string strLine = "qrmctl: " + Printable(strError) + '\n';
+    // What comes last decides: until it is out the deadline may strike.
+    if (m_blJson) {
+        std::cerr << strLine;
+        static_cast<void>(PutOutResult());
+    } else {
+        std::cout.flush();
+        std::cerr << std::nounitbuf << strLine;
+        static_cast<void>(PutOutLast(std::cerr));
+    }
     return ErrorOf(id).exitCode;
 }
 
@@ -134,15 +148,12 @@ ExitCode Report::FailExchange(ErrorId id, const std::string &strError) {
     return strFlaw.empty() ? Fail(id, strError) : Fail(ErrorId::kCaUnreadable, strFlaw);
 }
 
-// Puts everything out that is meant for standard output; the deadline strikes until it is.
-bool Report::Print() {
-    BeginOutput();
+// Puts everything out that is meant for standard output; the deadline is over when it is.
+bool Report::PutOutResult() {
     if (m_blJson) {
-        std::cout << json_text::ToLogText(m_result) << '\n';
+        std::cout << json_text::ToLogText(m_result) + '\n';
     }
-    std::cout.flush();
-    StopDeadline();
-    return static_cast<bool>(std::cout);
+    return PutOutLast(std::cout);
 }
 
 }  // namespace qrmctl

@@ -54,7 +54,7 @@ class Report {
     ExitCode FailExchange(ErrorId id, const std::string &strError);
 
   private:
-    bool Print();
+    bool PutOutResult();
 
     bool m_blJson;
     Json::Value m_result{Json::objectValue};

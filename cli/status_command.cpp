@@ -62,9 +62,7 @@ void Explain(Report &report) {
 }
 
 ExitCode Status(bool blExplain, Report &report) {
-    Report::Stage(
-        "judging the membership: configuration, credential store, cache daemon, web sessions and "
-        "service account");
+    Report::Stage("judging the membership");
     int status = ZELOQRMClientStatus();
     // The look-ups that the judgement rests on may succeed in a store that is damaged elsewhere.
     if (StoreFlaw() == ErrorId::kStoreDamaged) {
@@ -115,7 +113,7 @@ ExitCode Leave(const LeaveRequest &request, Report &report) {
     Report::Stage("looking up the joined server in the credential store");
     const std::optional<JoinedServer> server = FindJoinedServer();
     const bool blDamaged = ClearDamagedStore(report);
-    Report::Stage("leaving: plug-ins, credentials, web sessions, cache daemon, account");
+    Report::Stage("leaving");
     const bool blJoined = ZELOQRMClientStatus() != 0;
     if (!LeaveWholly(request)) {
         return report.Fail(ErrorId::kLeaveFailed,

@@ -1,5 +1,6 @@
 // The deadline of qrmctl: what the program may be blocked in, and what it leaves when it strikes.
 
+#include <fcntl.h>
 #include <shadow.h>
 #include <sqlite3.h>
 
@@ -20,6 +21,8 @@ using Arguments = std::vector<std::string>;
 namespace fs = std::filesystem;
 
 constexpr const char *kDaemonScript = "/usr/zelo/etc/rc.d/S99zelocache.sh";
+constexpr const char *kPlugin = "/usr/zelo/etc/plugins/qrm_client/disjoin/hanging";
+constexpr const char *kHook = "/usr/zelo/etc/notify.d/hanging";
 constexpr const char *kPath = "/tmp/files/file";
 
 // What a command may wait for. Each is held until it is destroyed.
@@ -69,14 +72,21 @@ struct HeldAccounts {
     HeldAccounts &operator=(const HeldAccounts &) = delete;
 };
 
-// The cache daemon's script, which does not come back and tells its process id.
-class HangingScript {
+// A program at the path, which does not come back and tells its process id.
+class HangingProgram {
   public:
-    HangingScript() : m_strBefore(FileText(kDaemonScript)) {
-        std::ofstream(kDaemonScript) << "#!/bin/sh\necho $$ > /tmp/pid\nexec sleep 600\n";
+    explicit HangingProgram(const char *szPath)
+        : m_szPath(szPath), m_blThere(fs::exists(szPath)), m_strBefore(FileText(szPath)) {
+        fs::create_directories(fs::path(szPath).parent_path());
+        std::ofstream(szPath) << "#!/bin/sh\necho $$ > /tmp/pid\nexec sleep 600\n";
+        fs::permissions(szPath, fs::perms(0755));
     }
-    ~HangingScript() {
-        std::ofstream(kDaemonScript) << m_strBefore;
+    ~HangingProgram() {
+        if (m_blThere) {
+            std::ofstream(m_szPath) << m_strBefore;
+        } else {
+            fs::remove(m_szPath);
+        }
         int pid = 0;
         std::istringstream(FileText("/tmp/pid")) >> pid;
         EXPECT_GT(pid, 0);
@@ -84,11 +94,43 @@ class HangingScript {
             << "what was started does not outlive the deadline";
         fs::remove("/tmp/pid");
     }
-    HangingScript(const HangingScript &) = delete;
-    HangingScript &operator=(const HangingScript &) = delete;
+    HangingProgram(const HangingProgram &) = delete;
+    HangingProgram &operator=(const HangingProgram &) = delete;
 
   private:
+    const char *m_szPath;
+    bool m_blThere;
     std::string m_strBefore;
+};
+
+// A pipe that is full but for some bytes, and that nobody reads until its text is asked for.
+class FullPipe {
+  public:
+    static constexpr const char *kPipe = "/tmp/full";
+    explicit FullPipe(std::size_t cbFree) {
+        EXPECT_EQ(mkfifo(kPipe, 0600), 0);
+        m_fd = open(kPipe, O_RDWR | O_NONBLOCK | O_CLOEXEC);
+        const std::string strPage(4096, 'x');
+        while (write(m_fd, strPage.data(), strPage.size()) > 0) {
+        }
+        std::string strFreed(cbFree, ' ');
+        EXPECT_EQ(read(m_fd, strFreed.data(), cbFree), static_cast<ssize_t>(cbFree));
+    }
+    ~FullPipe() {
+        close(m_fd);
+        fs::remove(kPipe);
+    }
+    FullPipe(const FullPipe &) = delete;
+    FullPipe &operator=(const FullPipe &) = delete;
+
+    std::string Text() const {
+        std::string strText(std::size_t{1024} * 1024, ' ');
+        const ssize_t cb = read(m_fd, strText.data(), strText.size());
+        return strText.substr(0, cb < 0 ? 0 : static_cast<std::size_t>(cb));
+    }
+
+  private:
+    int m_fd = -1;
 };
 
 class Deadline : public joined::Joined {
@@ -107,15 +149,20 @@ TEST_F(Deadline, EndsWhateverACommandIsBlockedInAndNamesIt) {
     using Hold = std::function<std::shared_ptr<void>()>;
     const Hold silence = [] { return std::make_shared<Silence>(*s_pServer); };
     const Hold store = [] { return std::make_shared<HeldStore>(); };
-    const Hold script = [] { return std::make_shared<HangingScript>(); };
+    const auto program = [](const char *szPath) -> Hold {
+        return [szPath] { return std::make_shared<HangingProgram>(szPath); };
+    };
     const Hold accounts = [] { return std::make_shared<HeldAccounts>(); };
     const auto lock = [](const char *szPath) -> Hold {
         return [szPath] { return std::make_shared<HeldLock>(szPath); };
     };
     const std::string strServer = "localhost:" + std::to_string(s_pServer->HttpsPort());
     const std::string strPort = std::to_string(s_pServer->HttpsPort());
-    const char *szJudging = "judging the membership";
-    const char *szTurn = "waiting for another program";
+    const std::string strStore =
+        std::string("waiting for the credential store '") + stored::kDatabase + '\'';
+    const char *szAccounts = "waiting for the lock '/etc/.pwd.lock'";
+    std::ofstream("/tmp/credential") << R"({"protocol":"https","host":"h","port":1,)"
+                                     << R"("application":"ZELO.QRM","access_token":"t"})";
     const struct {
         Arguments arguments;
         Hold hold;
@@ -135,21 +182,47 @@ TEST_F(Deadline, EndsWhateverACommandIsBlockedInAndNamesIt) {
          silence,
          strServer,
          "is as it was"},
-        {{"status"}, store, szJudging, ""},
-        {{"status", "--explain"}, store, szJudging, ""},
-        {{"status", "--explain"}, script, "cache daemon", ""},
-        {{"account", "create"}, accounts, "service account", "qrmctl leave"},
-        {{"leave"}, lock("/tmp/qrmctl.membership.lock"), szTurn, "qrmctl leave"},
-        {{"leave"}, store, "credential store", "qrmctl leave"},
-        {{"info", "set", "key", "value"}, lock("/tmp/qrm_client.info.lock"), "client info", ""},
-        {{"idle", "set", "5"}, lock("/tmp/qrm_idle_time.lock"), "idle time", "idle get"},
-        {{"credential", "show"}, store, "credential store", ""}};
+        {{"status"}, store, strStore, ""},
+        {{"status", "--explain"}, store, strStore, ""},
+        {{"status", "--explain"},
+         program(kDaemonScript),
+         std::string("running '") + kDaemonScript + " status'",
+         ""},
+        {{"account", "create"}, accounts, szAccounts, "qrmctl leave"},
+        {{"account", "delete"}, accounts, szAccounts, "qrmctl leave"},
+        {{"leave"},
+         lock("/tmp/qrmctl.membership.lock"),
+         "waiting for the lock '/tmp/qrmctl.membership.lock'",
+         "qrmctl leave"},
+        {{"leave"}, store, strStore, "qrmctl leave"},
+        {{"leave"}, program(kPlugin), std::string("running '") + kPlugin + " pre'", "qrmctl leave"},
+        {{"plugins", "run", "disjoin", "POST"},
+         program(kPlugin),
+         std::string("running '") + kPlugin + " post'",
+         ""},
+        {{"notify", "QRMClientConnectFailed"},
+         program(kHook),
+         std::string("running '") + kHook + " QRMClientConnectFailed'",
+         ""},
+        {{"info", "set", "key", "value"},
+         lock("/tmp/qrm_client.info.lock"),
+         "waiting for the lock '/tmp/qrm_client.info.lock'",
+         ""},
+        {{"idle", "set", "5"},
+         lock("/tmp/qrm_idle_time.lock"),
+         "waiting for the lock '/tmp/qrm_idle_time.lock'",
+         "idle get"},
+        {{"credential", "create", "/tmp/credential"}, store, strStore, "credential show"},
+        {{"credential", "update", "/tmp/credential"}, store, strStore, "credential show"},
+        {{"credential", "delete"}, store, strStore, "credential delete"},
+        {{"credential", "show"}, store, strStore, ""}};
+    ASSERT_EQ(run_program::Run({QRMCTL, "account", "create"}).status, 0);
     for (const auto &row : rows) {
         SCOPED_TRACE(testing::PrintToString(row.arguments));
         const std::shared_ptr<void> held = row.hold();
         Arguments command = row.arguments;
         command.insert(command.begin(), QRMCTL);
-        command.insert(command.end(), {"--deadline", "0.5", "--json"});
+        command.insert(command.end(), {"--deadline", "0.4", "--json"});
         const auto begin = std::chrono::steady_clock::now();
         const run_program::Outcome outcome = run_program::Run(command);
         EXPECT_LT(std::chrono::steady_clock::now() - begin, std::chrono::seconds(2));
@@ -179,10 +252,57 @@ TEST_F(Deadline, IsANumberOfSecondsAboveZeroAndStatusHasOne) {
           Arguments{QRMCTL, "credential", "show", "--deadline", "2e1"}}) {
         EXPECT_EQ(run_program::Run(command).status, 0);
     }
-    const HangingScript script;
+    const HeldStore store;
     const auto begin = std::chrono::steady_clock::now();
-    EXPECT_EQ(run_program::Run({QRMCTL, "status", "--explain"}).status, 5);
+    const run_program::Outcome outcome = run_program::Run({QRMCTL, "status"});
+    EXPECT_EQ(outcome.status, 5);
+    EXPECT_NE(outcome.strErr.find(stored::kDatabase), std::string::npos) << outcome.strErr;
     EXPECT_GE(std::chrono::steady_clock::now() - begin, std::chrono::seconds(10));
+}
+
+// A reader that has stopped reading, on one of the streams; the other one is read.
+TEST_F(Deadline, EndsThoughNobodyReadsItsOutputAndNeverContradictsIt) {
+    constexpr std::size_t kPage = 4096;
+    const std::string strLong(2 * kPage, 'k');
+    ASSERT_EQ(run_program::Run({QRMCTL, "info", "set", "key", "value"}).status, 0);
+    const struct {
+        char fd;
+        std::size_t cbFree;
+        std::string strKey;
+        bool blJson;  // whether the deadline is the JSON object
+    } rows[] = {{'2', 0, "none", true}, {'2', kPage, strLong, true}, {'1', 0, "key", false}};
+    for (const auto &row : rows) {
+        SCOPED_TRACE(row.strKey.substr(0, 4) + row.fd);
+        const FullPipe full(row.cbFree);
+        const std::string strCommand =
+            std::string(R"(exec "$0" "$@" )") + row.fd + ">" + FullPipe::kPipe;
+        const auto begin = std::chrono::steady_clock::now();
+        const run_program::Outcome outcome =
+            run_program::Run({"/bin/sh", "-c", strCommand, QRMCTL, "info", "get", row.strKey,
+                              "--json", "--deadline", "0.4"});
+        EXPECT_LT(std::chrono::steady_clock::now() - begin, std::chrono::seconds(2));
+        EXPECT_EQ(outcome.status, 5);
+        Json::Value result;
+        EXPECT_EQ(json_text::FromString(outcome.strOut, result), row.blJson) << outcome.strOut;
+        EXPECT_EQ(result["error_id"] == "deadline", row.blJson);
+        EXPECT_EQ(outcome.strErr.find("qrmctl: the deadline") == 0, !row.blJson) << outcome.strErr;
+        EXPECT_EQ(full.Text().find("deadline"), std::string::npos);
+    }
+}
+
+TEST_F(Deadline, LeavesAloneWhatItDidNotStart) {
+    const HeldStore store;
+    EXPECT_EQ(run_program::Run(
+                  {"/bin/sh", "-c",
+                   R"(sleep 600 & echo $! > /tmp/pid; exec "$0" status --deadline 0.4)", QRMCTL})
+                  .status,
+              5);
+    int pid = 0;
+    std::istringstream(FileText("/tmp/pid")) >> pid;
+    ASSERT_GT(pid, 0);
+    EXPECT_EQ(YLIBCProcAlive(pid), 1);
+    kill(pid, SIGKILL);
+    fs::remove("/tmp/pid");
 }
 
 }  // namespace

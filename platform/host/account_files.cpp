@@ -13,6 +13,7 @@
 
 #include "file_replacement.h"
 #include "last_error.h"
+#include "waiting.h"
 
 namespace host {
 namespace {
@@ -177,6 +178,7 @@ std::mutex s_threads;
 }  // namespace
 
 AccountLock::AccountLock() {
+    const Waiting waiting({"waiting for the lock '/etc/.pwd.lock'"});
     s_threads.lock();
     // lckpwdf limits its wait with the process's alarm, and would leave the caller without its own.
     struct itimerval callers = {};

@@ -17,6 +17,7 @@
 
 #include "last_error.h"
 #include "trusted_file.h"
+#include "waiting.h"
 
 namespace {
 
@@ -181,6 +182,7 @@ Try WaitForLock(int fd, Clock::time_point end) {
 int Lock(const char *szPath, int timeout_s, int &handle) {
     const Clock::time_point end = Clock::now() + std::chrono::seconds(timeout_s);
     for (;;) {
+        const host::Waiting waiting({"waiting for the lock '", szPath, "'"});
         LockFile file(szPath);
         if (file.Get() < 0) {
             return HOST_FAIL(errno == ELOOP ? YLIBC_ERR_UNSAFE_FILE : YLIBC_ERR_FILE);

@@ -16,11 +16,13 @@
 #include <mutex>
 #include <new>
 #include <set>
+#include <string_view>
 
 #include "appliance_ca.h"
 #include "key_value_lookup.h"
 #include "last_error.h"
 #include "reply_sink.h"
+#include "waiting.h"
 
 namespace host {
 namespace {
@@ -325,6 +327,12 @@ bool IsPlain(const std::string &strText, char other) {
     });
 }
 
+// "https://host:port" of an URL.
+std::string_view ServerOf(std::string_view url) {
+    const std::size_t host = url.find("//");
+    return host == std::string_view::npos ? url : url.substr(0, url.find_first_of("/?", host + 2));
+}
+
 // The error of a request as the platform's last error.
 unsigned int LastErrorOf(int error) {
     switch (error) {
@@ -368,6 +376,7 @@ int Transact(const HttpRequest &request, CURL *pEasy, HttpReply &reply) {
         curl_easy_setopt(pEasy, CURLOPT_XFERINFOFUNCTION, ShowProgress);
         curl_easy_setopt(pEasy, CURLOPT_XFERINFODATA, &transfer);
     }
+    const Waiting waiting({"asking '", ServerOf(request.strUrl), "'"});
     const CURLcode result = curl_easy_perform(pEasy);
     curl_easy_getinfo(pEasy, CURLINFO_RESPONSE_CODE, &reply.status);
     if (transfer.blStopped) {

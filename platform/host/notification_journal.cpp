@@ -19,6 +19,7 @@
 #include "file_descriptor.h"
 #include "json_text.h"
 #include "last_error.h"
+#include "waiting.h"
 
 namespace {
 
@@ -76,6 +77,7 @@ class HeldJournal {
     }
 
     int Hold() {
+        const host::Waiting waiting({"waiting for the journal '", kJournal, "'"});
         int tries = 0;
         while (flock(m_file.Get(), LOCK_EX | LOCK_NB) != 0) {
             if (errno != EWOULDBLOCK && errno != EINTR) {

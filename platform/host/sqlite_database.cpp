@@ -44,6 +44,11 @@ std::mutex g_chainMutex;
 std::atomic<unsigned> g_connections{0};
 Database *g_pFirst = nullptr;
 
+// Waited for: the store's other users, in this process and elsewhere, and its disk.
+Waiting NameWait(const Store &store) {
+    return Waiting({"waiting for the ", store.szName, " '", store.szPath, "'"});
+}
+
 bool ReadPragma(sqlite3 *pDb, const char *szPragma, int &value, int &error) {
     sqlite3_stmt *pRaw = nullptr;
     error = sqlite3_prepare_v2(pDb, szPragma, -1, &pRaw, nullptr);
@@ -272,6 +277,7 @@ Result Database::CheckWhole() {
 }
 
 Result Database::SetAsideIfDamaged(std::string &strAside) {
+    const Waiting waiting = NameWait(m_store);
     const std::lock_guard<std::mutex> lock(m_mutex);
     struct stat judged = {};
     if (lstat(m_store.szPath, &judged) != 0) {
@@ -305,14 +311,14 @@ Result Database::SetAsideIfDamaged(std::string &strAside) {
 // --- Run ----------------------------------------------------------------------------------------
 
 Run::Run(Database &database, std::size_t statement, bool blWrite)
-    : m_database(database), m_lock(database.m_mutex) {
+    : m_database(database), m_waiting(NameWait(database.m_store)), m_lock(database.m_mutex) {
     m_result = database.Connect(blWrite);
     if (m_result == Result::kDone) {
         Prepare(statement);
     }
 }
 
-Run::Run(const Run &outer, std::size_t statement) : m_database(outer.m_database) {
+Run::Run(const Run &outer, std::size_t statement) : m_database(outer.m_database), m_waiting({}) {
     Prepare(statement);
 }
 

@@ -20,6 +20,8 @@
 #include <optional>
 #include <string>
 
+#include "waiting.h"
+
 struct sqlite3;
 struct sqlite3_stmt;
 
@@ -125,6 +127,7 @@ class Run {
     void Check(int sqliteError, int line);
 
     Database &m_database;
+    Waiting m_waiting;                    // nothing in a further run
     std::unique_lock<std::mutex> m_lock;  // holds nothing in a further run
     sqlite3 *m_pDb = nullptr;
     sqlite3_stmt *m_pStatement = nullptr;
