@@ -43,6 +43,7 @@ struct Watch {
     Stage longest = {"", Clock::duration::zero()};  // of those that are over
     std::string strStage = "starting";
     Clock::time_point begin = Clock::now();
+    Clock::time_point end = Clock::time_point::max();
     std::string strRemedy = "mend what it waited for, or give it more time with --deadline";
     std::function<void()> cleanup;
     std::mutex cleanupMutex;
@@ -90,6 +91,15 @@ std::vector<pid_t> ChildrenOf(const std::string &strProcess) {
     return children;
 }
 
+// Ends the process group that this process leads, with what its processes have started.
+void EndBelow(pid_t leader) {
+    for (const pid_t started : ChildrenOf(std::to_string(leader))) {
+        EndBelow(started);
+    }
+    kill(-leader, SIGKILL);
+    kill(leader, SIGKILL);
+}
+
 // Ends what the program waits for: its children, the platform's wardens, and the process groups of
 // the programs that those watch. The wardens only stop at first: one that ended would let the main
 // thread go on to its next step. Returns them.
@@ -98,8 +108,7 @@ std::vector<pid_t> EndStarted() {
     for (const pid_t warden : wardens) {
         kill(warden, SIGSTOP);
         for (const pid_t program : ChildrenOf(std::to_string(warden))) {
-            kill(-program, SIGKILL);
-            kill(program, SIGKILL);
+            EndBelow(program);
         }
     }
     return wardens;
@@ -172,6 +181,7 @@ void StartDeadline(double limit_s, bool blJson) {
     watch.blJson = blJson;
     const Clock::time_point end = watch.begin + std::chrono::duration_cast<Clock::duration>(
                                                     std::chrono::duration<double>(limit_s));
+    watch.end = end;
     sigset_t all;
     sigset_t before;
     sigfillset(&all);
@@ -208,6 +218,19 @@ void StopDeadline() {
     const std::lock_guard<std::mutex> lock(watch.mutex);
     watch.blStopped = true;
     watch.wake.notify_all();
+}
+
+double DeadlineLeft_s() {
+    const Clock::time_point end = TheWatch().end;
+    return end == Clock::time_point::max()
+               ? kMaxDeadline_s
+               : std::chrono::duration<double>(end - Clock::now()).count();
+}
+
+DeadlineCleanup::DeadlineCleanup(const std::function<void()> &make, std::function<void()> cleanup) {
+    const std::lock_guard<std::mutex> lock(TheWatch().mutex);
+    make();
+    TheWatch().cleanup = std::move(cleanup);
 }
 
 DeadlineCleanup::DeadlineCleanup(std::function<void()> cleanup) {

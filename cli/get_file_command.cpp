@@ -112,12 +112,8 @@ class Workplace {
   public:
     explicit Workplace(const fs::path &destination)
         : m_strFolder(destination.parent_path() /
-                      ('.' + destination.filename().string() + ".XXXXXX")) {
-        if (mkdtemp(m_strFolder.data()) == nullptr) {
-            m_error = errno;
-            m_strFolder.clear();
-        }
-    }
+                      ('.' + destination.filename().string() + ".XXXXXX")),
+          m_cleanup([this] { Make(); }, [this] { Remove(); }) {}
     ~Workplace() { Remove(); }
     Workplace(const Workplace &) = delete;
     Workplace &operator=(const Workplace &) = delete;
@@ -126,6 +122,13 @@ class Workplace {
     int Error() const { return m_error; }
     std::string File() const { return m_strFolder + "/file"; }
 
+  private:
+    void Make() {
+        if (mkdtemp(m_strFolder.data()) == nullptr) {
+            m_error = errno;
+            m_strFolder.clear();
+        }
+    }
     // Also while the file is being written.
     void Remove() const {
         std::error_code ignored;
@@ -134,9 +137,9 @@ class Workplace {
         }
     }
 
-  private:
     std::string m_strFolder;
     int m_error = 0;
+    DeadlineCleanup m_cleanup;
 };
 
 // Through links to the file itself, so that a link stays one; absolute, so that it has a folder.
@@ -203,7 +206,6 @@ ExitCode GetBeside(const Options &options, const JoinedServer &server, Json::Val
         return report.Fail(ErrorId::kBadDestination, "cannot write beside '" + options.strPath +
                                                          "': " + std::strerror(workplace.Error()));
     }
-    const DeadlineCleanup cleanup([&workplace] { workplace.Remove(); });
     Report::Stage(FetchStage(options, server));
     Progress progress(!report.IsJson());
     const Outcome outcome = Fetch(workplace.File(), options, params, progress);
