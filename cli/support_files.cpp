@@ -316,14 +316,33 @@ constexpr const char *kReadme =
     "files.txt            mode, owner, size and time of the client's files\n"
     "\n"
     "Every access and csrf token of the credential store was searched for in all of them, plain,\n"
-    "escaped and in Base64, and replaced by [redacted]. So was, in texts of other programs, what\n"
-    "follows a name with token, passw, secret, key, cred, cookie or authorization in it, and\n"
-    "passwords in URLs. Host names, addresses and the serial number are still there: look the\n"
-    "files through before you pass them on.\n";
+    "escaped, in hexadecimal and in Base64, and replaced by [redacted]. Tokens of fewer than 4\n"
+    "bytes were not searched for. In texts of other programs (client info, notifications, log),\n"
+    "[redacted] also stands for what follows \"Bearer\" or a name such as token, password,\n"
+    "passphrase, pwd, secret, key, cred, cookie, auth or sid, for passwords in URLs, and for "
+    "every\n"
+    "word of 16 or more characters that mixes digits, small and capital letters: it may be a "
+    "token\n"
+    "of an earlier membership, which nobody knows any more. Host names, addresses and the serial\n"
+    "number are still there: look the files through before you pass them on.\n";
 
-constexpr const char *kLeftOut =
+constexpr const char *kUnreadable =
     "Left out: the credential store cannot be read, so it is not known what would have to be\n"
     "redacted here.\n";
+constexpr const char *kSetAside =
+    "Left out: a damaged credential store was set aside, and its tokens cannot be searched for.\n"
+    "Remove the files named credentials.db.damaged-... when nobody needs them any more.\n";
+
+// Why texts of others cannot be redacted; empty when they can.
+std::string WhyLeftOut(bool blKnown) {
+    constexpr int kListSize = 16;
+    ListHandle list(YLIBCSzListAlloc(kListSize));
+    const int count = list.Get() == nullptr ? -1 : ZELOCredStoreListSetAside(list.Address());
+    if (!blKnown || count < 0) {
+        return kUnreadable;
+    }
+    return count > 0 ? kSetAside : "";
+}
 
 // A password of the configuration may turn up elsewhere.
 void AddConfigured(Redaction &redaction) {
@@ -343,11 +362,15 @@ std::vector<SupportFile> CollectSupportFiles() {
     Redaction redaction;
     const bool blKnown = redaction.AddStored();
     AddConfigured(redaction);
-    const auto ofOthers = [blKnown](const std::string &strText) {
-        return blKnown ? MaskNamed(strText) : std::string(kLeftOut);
+    const std::string strWhy = WhyLeftOut(blKnown);
+    // By value first: what masking leaves of a token would not be found.
+    const auto ofOthers = [&](const std::string &strText) {
+        return strWhy.empty() ? MaskNamed(redaction.Redact(strText)) : strWhy;
     };
+    const std::string strMissing =
+        strWhy.empty() ? "" : "\nclient_info.txt, notifications.jsonl and log.txt: " + strWhy;
     std::vector<SupportFile> files = {
-        {"README.txt", kReadme},
+        {"README.txt", kReadme + strMissing},
         {"versions.txt", Versions()},
         {"status.txt", OutputOf({"status", "--explain"}, false, kStatusLimit_s)},
         {"status.json", OutputOf({"status", "--explain"}, true, kStatusLimit_s)},
