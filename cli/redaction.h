@@ -32,6 +32,9 @@ class Redaction {
     std::vector<std::string> m_base64;  // what is the same wherever the secret begins
 };
 
+// The value of so many hexadecimal digits at the place; -1 when they are not there.
+int HexValue(const std::string &strText, std::size_t at, std::size_t digits);
+
 // Whether a key, a variable or a member of this name holds a secret.
 bool IsSecretName(const std::string &strName);
 
