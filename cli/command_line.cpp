@@ -9,6 +9,7 @@ namespace qrmctl {
 namespace {
 
 constexpr double kStatusDeadline_s = 10;
+constexpr double kSupportDeadline_s = 180;
 
 std::string DeadlineFlaw(const std::string &strSeconds) {
     double seconds = 0;
@@ -26,7 +27,7 @@ void AddCommonOptions(CommandHandle command, CommonOptions &options) {
     command
         .Real("--deadline", options.deadline_s,
               "End after so many seconds, whatever it waits for (default: 10 for status, "
-              "none for the others)")
+              "180 for support, none for the others)")
         .ValueName("SECONDS")
         .Checked(DeadlineFlaw);
     for (const CommandHandle each : command.Commands()) {
@@ -37,6 +38,9 @@ void AddCommonOptions(CommandHandle command, CommonOptions &options) {
 }  // namespace
 
 double DeadlineOf(CommandHandle program, const CommonOptions &options) {
+    if (options.deadline_s == 0 && program.Command("support").IsChosen()) {
+        return kSupportDeadline_s;
+    }
     const bool blStatus = options.deadline_s == 0 && program.Command("status").IsChosen();
     return blStatus ? kStatusDeadline_s : options.deadline_s;
 }

@@ -44,6 +44,7 @@ struct Watch {
     Stage longest = {"", Clock::duration::zero()};  // of those that are over
     std::string strStage = "starting";
     Clock::time_point begin = Clock::now();
+    Clock::time_point end = Clock::time_point::max();
     std::string strRemedy = "mend what it waited for, or give it more time with --deadline";
     std::function<void()> cleanup;
     std::mutex cleanupMutex;
@@ -182,6 +183,7 @@ void StartDeadline(double limit_s, bool blJson) {
     watch.blJson = blJson;
     const Clock::time_point end = watch.begin + std::chrono::duration_cast<Clock::duration>(
                                                     std::chrono::duration<double>(limit_s));
+    watch.end = end;
     sigset_t all;
     sigset_t before;
     sigfillset(&all);
@@ -227,6 +229,19 @@ bool Deliver(int fd, std::string_view text, bool blLast) {
         }
         AwaitRoom(fd, std::chrono::milliseconds(-1));
     }
+}
+
+double DeadlineLeft_s() {
+    const Clock::time_point end = TheWatch().end;
+    return end == Clock::time_point::max()
+               ? kMaxDeadline_s
+               : std::chrono::duration<double>(end - Clock::now()).count();
+}
+
+DeadlineCleanup::DeadlineCleanup(const std::function<void()> &make, std::function<void()> cleanup) {
+    const std::lock_guard<std::mutex> lock(TheWatch().mutex);
+    make();
+    TheWatch().cleanup = std::move(cleanup);
 }
 
 DeadlineCleanup::DeadlineCleanup(std::function<void()> cleanup) {

@@ -32,11 +32,17 @@ void SetDeadlineRemedy(const std::string &strRemedy);
 // or at once when it has none, the deadline is over. False when the stream cannot be written.
 bool Deliver(int fd, std::string_view text, bool blLast);
 
+// The seconds until the deadline strikes; kMaxDeadline_s when none was started.
+double DeadlineLeft_s();
+
 // Something to clear away when the deadline strikes during its life, within half a second; what
 // takes longer is left.
 class DeadlineCleanup {
   public:
     explicit DeadlineCleanup(std::function<void()> cleanup);
+    // The same for what `make` makes, which is to be short: the deadline strikes before or after
+    // it.
+    DeadlineCleanup(const std::function<void()> &make, std::function<void()> cleanup);
     ~DeadlineCleanup();
     DeadlineCleanup(const DeadlineCleanup &) = delete;
     DeadlineCleanup &operator=(const DeadlineCleanup &) = delete;

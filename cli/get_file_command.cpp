@@ -113,12 +113,8 @@ class Workplace {
   public:
     explicit Workplace(const fs::path &destination)
         : m_strFolder(destination.parent_path() /
-                      ('.' + destination.filename().string() + ".XXXXXX")) {
-        if (mkdtemp(m_strFolder.data()) == nullptr) {
-            m_error = errno;
-            m_strFolder.clear();
-        }
-    }
+                      ('.' + destination.filename().string() + ".XXXXXX")),
+          m_cleanup([this] { Make(); }, [this] { Remove(); }) {}
     ~Workplace() { Remove(); }
     Workplace(const Workplace &) = delete;
     Workplace &operator=(const Workplace &) = delete;
@@ -127,6 +123,13 @@ class Workplace {
     int Error() const { return m_error; }
     std::string File() const { return m_strFolder + "/file"; }
 
+  private:
+    void Make() {
+        if (mkdtemp(m_strFolder.data()) == nullptr) {
+            m_error = errno;
+            m_strFolder.clear();
+        }
+    }
     // Also while the file is being written.
     void Remove() const {
         std::error_code ignored;
@@ -135,9 +138,9 @@ class Workplace {
         }
     }
 
-  private:
     std::string m_strFolder;
     int m_error = 0;
+    DeadlineCleanup m_cleanup;
 };
 
 // Through links to the file itself, so that a link stays one; absolute, so that it has a folder.
@@ -209,7 +212,6 @@ ExitCode GetBeside(const Options &options, const JoinedServer &server, Json::Val
         return report.Fail(ErrorId::kBadDestination, "cannot write beside '" + options.strPath +
                                                          "': " + std::strerror(workplace.Error()));
     }
-    const DeadlineCleanup cleanup([&workplace] { workplace.Remove(); });
     Report::Stage(FetchStage(options, server));
     Progress progress(!report.IsJson());
     const Outcome outcome = Fetch(workplace.File(), options, params, progress);

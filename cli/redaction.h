@@ -23,7 +23,8 @@ class Redaction {
     bool AddStored();
 
     // The text without the secrets: plain, with characters escaped as in JSON or an URL, also
-    // several times over, and in Base64 of either alphabet at whatever place of a longer text.
+    // several times over, in hexadecimal, and in Base64 of either alphabet at whatever place of a
+    // longer text, also wrapped over lines.
     std::string Redact(const std::string &strText) const;
 
   private:
@@ -31,11 +32,15 @@ class Redaction {
     std::vector<std::string> m_base64;  // what is the same wherever the secret begins
 };
 
+// The value of so many hexadecimal digits at the place; -1 when they are not there.
+int HexValue(const std::string &strText, std::size_t at, std::size_t digits);
+
 // Whether a key, a variable or a member of this name holds a secret.
 bool IsSecretName(const std::string &strName);
 
 // Each line without what follows the name of a secret. In a JSON object, the values of such members
-// go; anywhere else the rest of the line. Names and passwords in URLs go too.
+// go, and their like in its strings; anywhere else the rest of the line. Names and passwords in
+// URLs go too, and long words that look like tokens.
 std::string MaskNamed(const std::string &strLines);
 
 }  // namespace qrmctl

@@ -29,11 +29,8 @@ constexpr const char *kFolder = "qrmctl-support";
 class Beside {
   public:
     explicit Beside(const fs::path &archive)
-        : m_strFolder(archive.parent_path() / ('.' + archive.filename().string() + ".XXXXXX")) {
-        if (mkdtemp(m_strFolder.data()) == nullptr) {
-            m_strFolder.clear();
-        }
-    }
+        : m_strFolder(archive.parent_path() / ('.' + archive.filename().string() + ".XXXXXX")),
+          m_cleanup([this] { Make(); }, [this] { Remove(); }) {}
     ~Beside() { Remove(); }
     Beside(const Beside &) = delete;
     Beside &operator=(const Beside &) = delete;
@@ -41,7 +38,15 @@ class Beside {
     bool IsUsable() const { return !m_strFolder.empty(); }
     std::string Path(const std::string &strName) const { return m_strFolder + '/' + strName; }
     const std::string &Folder() const { return m_strFolder; }
+    int Error() const { return m_error; }
 
+  private:
+    void Make() {
+        if (mkdtemp(m_strFolder.data()) == nullptr) {
+            m_error = errno;
+            m_strFolder.clear();
+        }
+    }
     // Also while it is being filled.
     void Remove() const {
         std::error_code ignored;
@@ -50,8 +55,9 @@ class Beside {
         }
     }
 
-  private:
     std::string m_strFolder;
+    int m_error = 0;
+    DeadlineCleanup m_cleanup;
 };
 
 bool WriteFiles(const std::string &strFolder) {
@@ -108,9 +114,8 @@ ExitCode Support(const std::string &strFile, bool blForce, Report &report) {
     umask(077);
     const Beside beside(archive);
     if (!beside.IsUsable()) {
-        return FailFor(strFile, std::strerror(errno), report);
+        return FailFor(strFile, std::strerror(beside.Error()), report);
     }
-    const DeadlineCleanup cleanup([&beside] { beside.Remove(); });
     Report::Stage("collecting what goes into the archive");
     if (!WriteFiles(beside.Path(kFolder))) {
         return FailFor(strFile, "no room beside it, or another fault of the disk", report);

@@ -4,25 +4,29 @@
 #include <fcntl.h>
 #include <json/version.h>
 #include <openssl/crypto.h>
+#include <spawn.h>
 #include <sqlite3.h>
+#include <sys/mman.h>
 #include <sys/stat.h>
 #include <sys/utsname.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <array>
+#include <cerrno>
 #include <ctime>
 #include <filesystem>
-#include <iostream>
 #include <sstream>
 
-#include "command_line.h"
 #include "connection_checks.h"
+#include "deadline.h"
 #include "fixed_text.h"
 #include "key_value_file.h"
 #include "membership.h"
 #include "platform_handles.h"
 #include "redaction.h"
+#include "report.h"
 
 namespace qrmctl {
 namespace {
@@ -33,6 +37,9 @@ constexpr off_t kMaxTail = off_t{1024} * 1024;
 constexpr std::size_t kNotifications = 50;
 constexpr std::size_t kLogLines = 200;
 constexpr int kMaxListed = 500;
+// All four runs together end before support's own deadline.
+constexpr double kStatusLimit_s = 10;
+constexpr double kDoctorLimit_s = 60;
 
 // --- Reading ------------------------------------------------------------------------------------
 
@@ -70,41 +77,75 @@ std::string LastLines(const std::string &strText, std::size_t count,
     return strLast;
 }
 
-// While it lives, what the program prints goes into texts.
-class CapturedOutput {
+// A file without a name, closed at the end of its scope.
+class NamelessFile {
   public:
-    CapturedOutput()
-        : m_pOut(std::cout.rdbuf(m_out.rdbuf())), m_pErr(std::cerr.rdbuf(m_err.rdbuf())) {}
-    ~CapturedOutput() {
-        std::cout.rdbuf(m_pOut);
-        std::cerr.rdbuf(m_pErr);
+    NamelessFile() : m_fd(memfd_create("output", MFD_CLOEXEC)) {}
+    ~NamelessFile() {
+        if (m_fd >= 0) {
+            close(m_fd);
+        }
     }
-    CapturedOutput(const CapturedOutput &) = delete;
-    CapturedOutput &operator=(const CapturedOutput &) = delete;
+    NamelessFile(const NamelessFile &) = delete;
+    NamelessFile &operator=(const NamelessFile &) = delete;
 
-    std::string Out() const { return m_out.str(); }
-    std::string Err() const { return m_err.str(); }
+    int Descriptor() const { return m_fd; }
+    std::string Text() const {
+        struct stat status = {};
+        std::string strText;
+        if (fstat(m_fd, &status) == 0) {
+            strText.resize(static_cast<std::size_t>(status.st_size));
+            const ssize_t cb = pread(m_fd, strText.data(), strText.size(), 0);
+            strText.resize(cb < 0 ? 0 : static_cast<std::size_t>(cb));
+        }
+        return strText;
+    }
 
   private:
-    std::ostringstream m_out;
-    std::ostringstream m_err;
-    std::streambuf *m_pOut;
-    std::streambuf *m_pErr;
+    int m_fd;
 };
 
-// What a command prints, as if it had been typed.
-std::string OutputOf(const std::vector<std::string> &words) {
-    command::Program program("qrmctl", kSummary, kVersion);
-    Action action;
-    CommonOptions options;
-    AddCommandLine(program.Root(), action, options);
-    program.Read(words);
-    Report report(options.blJson);
-    const CapturedOutput output;
-    const ExitCode code = action(report);
-    return options.blJson
-               ? output.Out()
-               : output.Out() + output.Err() + "exit status: " + std::to_string(code) + '\n';
+// Runs this very program with these arguments; returns its exit status, -1 when it cannot be run.
+int RunAgain(std::vector<std::string> words, const NamelessFile &out, const NamelessFile &err) {
+    words.insert(words.begin(), "qrmctl");
+    std::vector<char *> arguments;
+    for (std::string &strWord : words) {
+        arguments.push_back(strWord.data());
+    }
+    arguments.push_back(nullptr);
+    posix_spawn_file_actions_t actions;
+    posix_spawn_file_actions_init(&actions);
+    posix_spawn_file_actions_addopen(&actions, STDIN_FILENO, "/dev/null", O_RDONLY, 0);
+    posix_spawn_file_actions_adddup2(&actions, out.Descriptor(), STDOUT_FILENO);
+    posix_spawn_file_actions_adddup2(&actions, err.Descriptor(), STDERR_FILENO);
+    pid_t pid = -1;
+    const int result =
+        posix_spawn(&pid, "/proc/self/exe", &actions, nullptr, arguments.data(), environ);
+    posix_spawn_file_actions_destroy(&actions);
+    int status = 0;
+    while (result == 0 && waitpid(pid, &status, 0) < 0) {
+        if (errno != EINTR) {
+            return -1;
+        }
+    }
+    return result == 0 && WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+}
+
+// What a command prints, as if it had been typed. A process of its own has a deadline of its own,
+// which ends it also when this program's deadline strikes meanwhile.
+std::string OutputOf(std::vector<std::string> words, bool blJson, double limit_s) {
+    constexpr double kLeast_s = 0.01;
+    Report::Stage("running qrmctl " + words.front());
+    const double deadline_s = std::max(kLeast_s, std::min(limit_s, DeadlineLeft_s()));
+    words.insert(words.end(), {"--deadline", std::to_string(deadline_s)});
+    if (blJson) {
+        words.emplace_back("--json");
+    }
+    const NamelessFile out;
+    const NamelessFile err;
+    const int status = RunAgain(words, out, err);
+    return blJson ? out.Text()
+                  : out.Text() + err.Text() + "exit status: " + std::to_string(status) + '\n';
 }
 
 // --- Texts --------------------------------------------------------------------------------------
@@ -276,14 +317,33 @@ constexpr const char *kReadme =
     "files.txt            mode, owner, size and time of the client's files\n"
     "\n"
     "Every access and csrf token of the credential store was searched for in all of them, plain,\n"
-    "escaped and in Base64, and replaced by [redacted]. So was, in texts of other programs, what\n"
-    "follows a name with token, passw, secret, key, cred, cookie or authorization in it, and\n"
-    "passwords in URLs. Host names, addresses and the serial number are still there: look the\n"
-    "files through before you pass them on.\n";
+    "escaped, in hexadecimal and in Base64, and replaced by [redacted]. Tokens of fewer than 4\n"
+    "bytes were not searched for. In texts of other programs (client info, notifications, log),\n"
+    "[redacted] also stands for what follows \"Bearer\" or a name such as token, password,\n"
+    "passphrase, pwd, secret, key, cred, cookie, auth or sid, for passwords in URLs, and for "
+    "every\n"
+    "word of 16 or more characters that mixes digits, small and capital letters: it may be a "
+    "token\n"
+    "of an earlier membership, which nobody knows any more. Host names, addresses and the serial\n"
+    "number are still there: look the files through before you pass them on.\n";
 
-constexpr const char *kLeftOut =
+constexpr const char *kUnreadable =
     "Left out: the credential store cannot be read, so it is not known what would have to be\n"
     "redacted here.\n";
+constexpr const char *kSetAside =
+    "Left out: a damaged credential store was set aside, and its tokens cannot be searched for.\n"
+    "Remove the files named credentials.db.damaged-... when nobody needs them any more.\n";
+
+// Why texts of others cannot be redacted; empty when they can.
+std::string WhyLeftOut(bool blKnown) {
+    constexpr int kListSize = 16;
+    ListHandle list(YLIBCSzListAlloc(kListSize));
+    const int count = list.Get() == nullptr ? -1 : ZELOCredStoreListSetAside(list.Address());
+    if (!blKnown || count < 0) {
+        return kUnreadable;
+    }
+    return count > 0 ? kSetAside : "";
+}
 
 // A password of the configuration may turn up elsewhere.
 void AddConfigured(Redaction &redaction) {
@@ -303,16 +363,20 @@ std::vector<SupportFile> CollectSupportFiles() {
     Redaction redaction;
     const bool blKnown = redaction.AddStored();
     AddConfigured(redaction);
-    const auto ofOthers = [blKnown](const std::string &strText) {
-        return blKnown ? MaskNamed(strText) : std::string(kLeftOut);
+    const std::string strWhy = WhyLeftOut(blKnown);
+    // By value first: what masking leaves of a token would not be found.
+    const auto ofOthers = [&](const std::string &strText) {
+        return strWhy.empty() ? MaskNamed(redaction.Redact(strText)) : strWhy;
     };
+    const std::string strMissing =
+        strWhy.empty() ? "" : "\nclient_info.txt, notifications.jsonl and log.txt: " + strWhy;
     std::vector<SupportFile> files = {
-        {"README.txt", kReadme},
+        {"README.txt", kReadme + strMissing},
         {"versions.txt", Versions()},
-        {"status.txt", OutputOf({"status", "--explain"})},
-        {"status.json", OutputOf({"status", "--explain", "--json"})},
-        {"doctor.txt", OutputOf({"doctor"})},
-        {"doctor.json", OutputOf({"doctor", "--json"})},
+        {"status.txt", OutputOf({"status", "--explain"}, false, kStatusLimit_s)},
+        {"status.json", OutputOf({"status", "--explain"}, true, kStatusLimit_s)},
+        {"doctor.txt", OutputOf({"doctor"}, false, kDoctorLimit_s)},
+        {"doctor.json", OutputOf({"doctor"}, true, kDoctorLimit_s)},
         {"configuration.txt", Configuration()},
         {"client_info.txt", ofOthers(ClientInfo())},
         {"notifications.jsonl",

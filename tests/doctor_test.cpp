@@ -427,15 +427,77 @@ TEST_F(Support, NoSecretLeavesTheAppliance) {
     }
 }
 
+// Whatever the token is made of, and however a program has written it.
+TEST_F(Support, ATokenIsFoundInEveryEncoding) {
+    const struct {
+        const char *szToken;
+        std::vector<std::string> written;
+    } rows[] = {
+        {"ab%41cd#ef",
+         {"ab%41cd#ef", "ab%2541cd%23ef", "ab%252541cd%2523ef", "61622534316364236566"}},
+        {"q\"b\\\\s'%5Cu", {R"(q"b\\s'%5Cu)", R"(q\"b\\\\s'%5Cu)", "q%22b%5C%5Cs%27%255Cu"}},
+        {"gr\xC3\xBC\xC3\x9F-\xF0\x9F\x98\x80.x",
+         {"gr\xC3\xBC\xC3\x9F-\xF0\x9F\x98\x80.x", R"(gr\u00fc\u00DF-\ud83d\ude00.x)",
+          R"(gr\\u00fc\\u00df-\\ud83d\\ude00.x)", "gr%C3%BC%c3%9F-%F0%9F%98%80.x",
+          "6772C3BCC39F2DF09F98802E78", "6772c3bcc39f2df09f98802e78"}},
+        {"0.1.2.3.4.5.6.7.8.9.a.b.c.d.e.f.g.h.i.j.k.l.m.n.o.p",
+         {"MC4xLjIuMy40LjUuNi43LjguOS5hLmIuYy5kLmUuZi5nLmguaS5qLmsubC5tLm4u\\nby5w",
+          "MC4xLjIuMy40LjUuNi43LjguOS5hLmIuYy5kLmUuZi5nLmguaS5qLmsubC5tLm4u\\r\\nby5w"}},
+    };
+    for (const auto &row : rows) {
+        SCOPED_TRACE(row.szToken);
+        SetUp();
+        Store("https", row.szToken);
+        std::string strLog;
+        std::string strKept;
+        for (const std::string &strWritten : row.written) {
+            strLog += "qrmctl: <" + strWritten + ">\n";
+            strKept += "qrmctl: <[redacted]>\n";
+        }
+        Write("/var/log/messages", strLog);
+        EXPECT_EQ(Run().status, 0);
+        Unpack();
+        EXPECT_EQ(Unpacked("log.txt"), strKept);
+    }
+}
+
+TEST_F(Support, AnUnknownSecretIsFoundByItsNameOrItsLook) {
+    for (const char *szLine :
+         {"passphrase=n0body", "PWD=n0body", "_sid=n0body", "sid: n0body", "auth=n0body",
+          "sent Bearer n0body", "Set-Cookie: id=n0body", "access_token%3Dn0body", "pass=n0body",
+          R"(got {\"access_token\":\"n0body\"})", R"({"text":"bad password=n0body"})",
+          R"({"variables":{"%BODY%":"{\"token\":\"n0body\"}"}})", R"([{"text":"Bearer n0body"}])",
+          "was n0bodyKnowsThisToken"}) {
+        SCOPED_TRACE(szLine);
+        Write("/var/log/messages", std::string("qrmctl: ") + szLine + '\n');
+        Write(kJournal, std::string(szLine) + '\n');
+        EXPECT_EQ(Run({"--force"}).status, 0);
+        Unpack();
+        const std::string strAll = Unpacked("log.txt") + Unpacked("notifications.jsonl");
+        EXPECT_TRUE(Holds(strAll, "qrmctl: ")) << strAll;
+        EXPECT_FALSE(Holds(strAll, "n0body")) << strAll;
+    }
+}
+
 TEST_F(Support, WhatMayHoldUnknownTokensIsLeftOut) {
-    Store();
-    Write(stored::kDatabase, std::string(99, 'x'));
-    Write(kJournal, std::string(R"({"text":"s3cret-of-old"})") + '\n');
-    Write("/var/log/messages", "qrmctl: s3cret-of-old\n");
-    EXPECT_EQ(Run().status, 0);
-    Unpack();
-    for (const char *szName : {"notifications.jsonl", "log.txt", "client_info.txt"}) {
-        EXPECT_TRUE(Holds(Unpacked(szName), "Left out")) << szName;
+    const std::string strAside = std::string(stored::kDatabase) + ".damaged-20300514T092653Z";
+    const std::function<void()> rows[] = {
+        [] { Write(stored::kDatabase, std::string(99, 'x')); }, [&] { Write(strAside, "x"); },
+        [this] { Store("https", std::string(70'000, 't').c_str()); },  // longer than can be read
+    };
+    for (const auto &spoil : rows) {
+        SCOPED_TRACE(&spoil - rows);
+        SetUp();
+        Store();
+        spoil();
+        Write(kJournal, std::string(R"({"text":"s3cret-of-old"})") + '\n');
+        Write("/var/log/messages", "qrmctl: s3cret-of-old\n");
+        EXPECT_EQ(Run().status, 0);
+        Unpack();
+        for (const char *szName :
+             {"notifications.jsonl", "log.txt", "client_info.txt", "README.txt"}) {
+            EXPECT_TRUE(Holds(Unpacked(szName), "Left out")) << szName;
+        }
     }
 }
 
