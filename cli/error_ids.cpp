@@ -43,6 +43,8 @@ const std::vector<ErrorEntry> &AllErrors() {
          "a step of the join failed; nothing of it stays stored"},
         {ErrorId::kJoinNotUndone, "join-not-undone", kFailed,
          "a step of the join failed, and what came before could not be undone wholly"},
+        {ErrorId::kJoinedElsewhere, "joined-elsewhere", kFailed,
+         "another server than the one named is joined already; nothing was changed"},
         {ErrorId::kLeaveFailed, "leave-failed", kFailed,
          "a step of leaving failed; what came before it is done"},
         {ErrorId::kLogNotConfirmed, "log-not-confirmed", kFailed,

@@ -39,6 +39,7 @@ enum class ErrorId {
     kInterrupted,
     kJoinFailed,
     kJoinNotUndone,
+    kJoinedElsewhere,
     kLeaveFailed,
     kLogNotConfirmed,
     kNoCredential,

@@ -1,6 +1,9 @@
 // qrmctl join: the enrolling program. The library's join stores where the server is; every other
 // step of a membership is this program's to take, in order, and to undo when one fails.
 
+#include <strings.h>
+
+#include <algorithm>
 #include <functional>
 #include <memory>
 #include <vector>
@@ -180,6 +183,34 @@ ExitCode Enrol(const Json::Value &joinInfo, bool blJoined, Report &report) {
     return report.Done();
 }
 
+bool IsSameName(const Json::Value &one, const Json::Value &other) {
+    return one.isString() && other.isString() &&
+           strcasecmp(one.asCString(), other.asCString()) == 0;
+}
+
+// Whether one of the candidates is that server.
+bool Holds(const Json::Value &candidates, const JoinedServer &server) {
+    using json_text::Member;
+    return std::any_of(candidates.begin(), candidates.end(), [&](const Json::Value &candidate) {
+        return IsSameName(Member(candidate, "host"), server.host) &&
+               (Member(candidate, "https_port") == server.port ||
+                Member(candidate, "http_port") == server.port);
+    });
+}
+
+// The server that is joined already, where it is none of those asked for.
+std::optional<JoinedServer> JoinedElsewhere(const Json::Value &candidates) {
+    Report::Stage("comparing with the server that is joined already");
+    std::optional<JoinedServer> server = FindJoinedServer();
+    const bool blElsewhere = server && !Holds(candidates, *server) && ZELOQRMClientStatus() == 1;
+    return blElsewhere ? server : std::nullopt;
+}
+
+void TellAddress(const JoinedServer &server, Report &report) {
+    report.Fact("host", server.host);
+    report.Fact("port", server.port);
+}
+
 ExitCode Join(const Options &options, Report &report) {
     Json::Value joinInfo(Json::objectValue);
     std::string strError;
@@ -189,6 +220,15 @@ ExitCode Join(const Options &options, Report &report) {
         return report.Fail(ErrorId::kBadInput, strError);
     }
     const Json::Value candidates = AllCandidates(joinInfo);
+    if (const auto server = options.blAgain ? std::nullopt : JoinedElsewhere(candidates)) {
+        report.Member("host", server->host);
+        report.Member("port", server->port);
+        return report.Fail(ErrorId::kJoinedElsewhere,
+                           "this appliance is joined already, to the server at " +
+                               server->Address() +
+                               ", nothing was changed: run 'qrmctl leave' first, or join with "
+                               "--again");
+    }
     if (!options.blAllowHttp && !HasSecurePort(candidates)) {
         return report.Fail(
             ErrorId::kNoSecurePort,
@@ -203,7 +243,7 @@ ExitCode Join(const Options &options, Report &report) {
             ErrorId::kNoServer,
             "no server answered at '" + options.strServer +
                 "' or any other candidate, nothing was changed: check address, ports "
-                "and certificate; -v shows the reason of each attempt");
+                "and certificate, with 'qrmctl doctor'; -v shows the reason of each attempt");
     }
     report.WarnOfAuthority();
     Report::Stage(kTurnStage);
@@ -218,6 +258,9 @@ ExitCode Join(const Options &options, Report &report) {
     const bool blJoined = ZELOQRMClientStatus() == 1;
     report.Member("was_joined", blJoined);
     if (blJoined && !options.blAgain) {
+        if (const auto server = FindJoinedServer()) {
+            TellAddress(*server, report);
+        }
         report.Say("This appliance is joined already, nothing was changed; --again joins anew.");
         return report.Done();
     }
