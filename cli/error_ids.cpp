@@ -29,6 +29,8 @@ const std::vector<ErrorEntry> &AllErrors() {
          "the credential could not be stored"},
         {ErrorId::kDeadline, "deadline", kDeadline,
          "the deadline struck; `stage` names what used the time"},
+        {ErrorId::kFactMissing, "fact-missing", kFailed,
+         "a fact that a join tells the server cannot be read; nothing was changed"},
         {ErrorId::kFetchFailed, "fetch-failed", kFailed, "the file could not be fetched"},
         {ErrorId::kIdleNotSet, "idle-not-set", kFailed, "the disks' idle time could not be set"},
         {ErrorId::kIdleUnreadable, "idle-unreadable", kFailed,

@@ -30,6 +30,7 @@ enum class ErrorId {
     kCredentialNotRemoved,
     kCredentialNotStored,
     kDeadline,
+    kFactMissing,
     kFetchFailed,
     kIdleNotSet,
     kIdleUnreadable,

@@ -4,6 +4,7 @@
 #include <strings.h>
 
 #include <algorithm>
+#include <cstring>
 #include <functional>
 #include <memory>
 #include <vector>
@@ -13,6 +14,7 @@
 #include "input_file.h"
 #include "joined_server.h"
 #include "json_text.h"
+#include "key_value_file.h"
 #include "membership.h"
 #include "serial_number.h"
 #include "zeloqrmclient.h"
@@ -84,6 +86,29 @@ bool BuildJoinInfo(const Options &options, Report &report, Json::Value &joinInfo
     return true;
 }
 
+// The first fact that the server has to be told and that cannot be read, as "'key' in 'file'";
+// empty when all can.
+std::string MissingFact() {
+    constexpr const char *kDefaults = "/etc.defaults/zeloinfo.conf";
+    constexpr const char *kVersion = "/etc.defaults/VERSION";
+    constexpr struct {
+        const char *szFile;
+        const char *szKey;
+    } facts[] = {{kDefaults, "upnpmodelname"}, {kVersion, "majorversion"},
+                 {kVersion, "minorversion"},   {kVersion, "buildnumber"},
+                 {kConfigFile, "admin_port"},  {kConfigFile, "secure_admin_port"}};
+    const bool blSecure = YLIBCFileCheckKeyValue(kConfigFile, "runHTTPS", "yes", 0) == 1;
+    for (const auto &fact : facts) {
+        char szValue[64];
+        const bool blNeeded = blSecure || std::strcmp(fact.szKey, "secure_admin_port") != 0;
+        if (blNeeded &&
+            YLIBCFileGetKeyValue(fact.szFile, fact.szKey, szValue, sizeof(szValue), 0) <= 0) {
+            return std::string("'") + fact.szKey + "' in '" + fact.szFile + "'";
+        }
+    }
+    return {};
+}
+
 // The list that join tries: the candidates, then the address given explicitly.
 Json::Value AllCandidates(const Json::Value &joinInfo) {
     Json::Value all =
@@ -108,10 +133,8 @@ std::vector<Step> Steps(const Json::Value &joinInfo) {
     const std::string strSerial = joinInfo["sn"].asString();
     return {
         {"joining: the server's answer",
-         "the server did not accept the join (check token and serial number; -v shows its "
-         "answer), its address could not be stored, or the appliance's model, version or ports "
-         "could not be read (check "
-         "/etc.defaults/zeloinfo.conf, /etc.defaults/VERSION and /etc/zeloinfo.conf)",
+         "the server did not accept the join (check token and serial number), gave no reply (see "
+         "'qrmctl doctor'), or its address could not be stored; -v shows which",
          [&joinInfo] { return ZELOQRMClientSendCreateClient(joinInfo) == 0; }},
         {"storing the serial number", "the serial number could not be stored",
          [strSerial] { return StoreSerial(strSerial); }},
@@ -234,6 +257,12 @@ ExitCode Join(const Options &options, Report &report) {
             ErrorId::kNoSecurePort,
             "no candidate has an https port, and the access token does not go over plain http: "
             "give --https-port, or accept the risk with --allow-http");
+    }
+    const std::string strMissing = MissingFact();
+    if (!strMissing.empty()) {
+        return report.Fail(ErrorId::kFactMissing,
+                           "this appliance has no " + strMissing +
+                               ", which the server has to be told; nothing was changed");
     }
     // Nothing is left, nor removed, for a server that cannot be had.
     Report::Stage("asking " + CandidateNames(candidates) + " for the API '" + kApi + '\'');

@@ -435,6 +435,11 @@ TEST_F(Qrmctl, AJoinedApplianceJoinsAnewOnlyWhenTold) {
     EXPECT_EQ(other["error_id"], "joined-elsewhere");
     EXPECT_TRUE(Holds(other["error"].asString(), "localhost:" + s_strHttps));
     EXPECT_EQ(Requests(), "") << "it is told before anything is asked";
+    std::filesystem::rename("/etc.defaults/VERSION", "/etc.defaults/away");
+    EXPECT_EQ(RunForJson(Join("0", s_strHttps) + Arguments{"--again"}, 1)["error_id"],
+              "fact-missing");
+    std::filesystem::rename("/etc.defaults/away", "/etc.defaults/VERSION");
+    EXPECT_EQ(Run({"status"}).status, 0) << "the old membership stays";
     EXPECT_TRUE(RunForJson(Join("0", s_strHttps) + Arguments{"--again"}, 0)["was_joined"].asBool());
     EXPECT_TRUE(Holds(Requests(), "join"));
 }
