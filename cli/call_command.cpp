@@ -7,6 +7,7 @@
 #include "input_file.h"
 #include "joined_server.h"
 #include "json_text.h"
+#include "lost_reply.h"
 #include "zeloqrmclient.h"
 
 namespace qrmctl {
@@ -20,16 +21,6 @@ struct Options {
     bool blCached = false;
     std::string strHost;
 };
-
-// The server's own code, with its name.
-ExitCode Refused(const Json::Value &reply, Report &report) {
-    const int code = json_text::ErrorCode(reply);
-    const std::string strName = ServerErrorName(code);
-    report.Member("server_code", code);
-    report.Member("server_error", strName);
-    return report.Fail(ErrorId::kRefused, "the server refused the call with error code " +
-                                              std::to_string(code) + " (" + strName + ')');
-}
 
 ExitCode Call(const Options &options, Report &report) {
     Json::Value params;
@@ -48,13 +39,15 @@ ExitCode Call(const Options &options, Report &report) {
     Json::Value reply;
     if (ZELOQRMClientSendWebapi(reply, options.strApi, options.version, options.strMethod, params,
                                 options.blCached) != 0) {
-        return report.FailExchange(ErrorId::kNoReply,
-                                   "no usable reply from the server at " + server->Address() +
-                                       ": can this appliance reach it? -v shows the reason");
+        return FailRequest(ErrorId::kNoReply,
+                           "no usable reply from the server at " + server->Address() +
+                               ": run 'qrmctl doctor', which tries the way to it step by step; -v "
+                               "shows the reason",
+                           *server, options.strApi, report);
     }
     report.Document("reply", reply);
     if (!json_text::IsTrue(json_text::Member(reply, "success"))) {
-        return Refused(reply, report);
+        return FailRefused(reply, "the call", report);
     }
     return report.Done();
 }
@@ -71,10 +64,11 @@ ExitCode Update(const Options &options, Report &report) {
     }
     Report::Stage("updating this appliance's entry at " + server->Address());
     if (ZELOQRMClientSendSetClient(info) != 0) {
-        return report.FailExchange(
+        return FailRequest(
             ErrorId::kUpdateFailed,
-            "the server did not take the update, or a fact of this appliance is "
-            "missing; -v shows the reason");
+            "the server did not take the update, or a fact of this appliance is missing: run "
+            "'qrmctl doctor'; -v shows the reason",
+            *server, "ZELO.QRM.RPC.ClientInfo", report);
     }
     report.Say("The server's entry for this appliance is up to date.");
     return report.Done();

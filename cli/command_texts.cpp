@@ -20,7 +20,9 @@ constexpr Text kTexts[] = {
     {"join",
      "All steps of a membership are taken, the join flag last; when one fails, those before it are "
      "undone. What is left of an earlier membership goes once a server has answered. An appliance "
-     "that is joined already stays as it is without --again. The token goes over plain HTTP only "
+     "that is joined already stays as it is without --again; with it the old membership ends "
+     "before "
+     "the server accepts the new one. The token goes over plain HTTP only "
      "with --allow-http. Once a server has answered, Ctrl-C and SIGTERM wait until the join is "
      "done "
      "or undone, thus for the server's answer too; --deadline ends it sooner.",

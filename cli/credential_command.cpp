@@ -1,6 +1,8 @@
 // qrmctl credential: show, create, update and delete the stored server credential.
 
+#include <algorithm>
 #include <cstring>
+#include <iterator>
 #include <memory>
 
 #include "commands.h"
@@ -43,6 +45,33 @@ ExitCode Show(bool blWithToken, Report &report) {
     return report.Done();
 }
 
+// What the library would store, and no request could use.
+std::string FlawOfValues(const Json::Value &cred, bool blComplete) {
+    const std::string strOwn = blComplete ? "extra_info" : "sn";
+    for (const std::string &strName : cred.getMemberNames()) {
+        const auto isName = [&](const std::string &strKnown) { return strName == strKnown; };
+        const std::string known[] = {"protocol",    "host",         "port",
+                                     "application", "access_token", strOwn};
+        if (std::none_of(std::begin(known), std::end(known), isName)) {
+            return "there is no member \"" + strName + '"';
+        }
+    }
+    const char *szProtocol = json_text::Text(Member(cred, "protocol"));
+    const std::string strProtocol = szProtocol == nullptr ? "https" : szProtocol;
+    if (strProtocol != "http" && strProtocol != "https" && strProtocol != "fld") {
+        return "\"protocol\" has to be http, https or fld";
+    }
+    const char *szHost = json_text::Text(Member(cred, "host"));
+    if (szHost != nullptr && szHost[0] == '\0') {
+        return "\"host\" is empty";
+    }
+    int port = 0;
+    if (json_text::ReadInt(Member(cred, "port"), port) && (port < 1 || port > 65535)) {
+        return "\"port\" has to be 1 to 65535";
+    }
+    return {};
+}
+
 // What the library would refuse, as a sentence; empty when there is nothing.
 std::string Flaw(const Json::Value &cred, bool blComplete) {
     if (!cred.isObject()) {
@@ -62,7 +91,7 @@ std::string Flaw(const Json::Value &cred, bool blComplete) {
     if (!HasMember(cred, "port") ? blComplete : !json_text::ReadInt(Member(cred, "port"), port)) {
         return "\"port\" has to be an integer";
     }
-    return {};
+    return FlawOfValues(cred, blComplete);
 }
 
 ExitCode Change(const std::string &strFile, bool blCreate, Report &report) {

@@ -97,8 +97,8 @@ ExitCode Tell(Outcome outcome, const std::string &strPath, const Progress &progr
                    : report.FailExchange(
                          ErrorId::kFetchFailed,
                          "the file could not be fetched: can this appliance reach the "
-                         "server, does that have the file, and is there room for it? -v "
-                         "shows the reason");
+                         "server ('qrmctl doctor' says), does that have the file, and is "
+                         "there room for it? -v shows the reason");
     }
     report.Fact("path", strPath);
     report.Fact("unchanged", outcome == Outcome::kUnchanged);

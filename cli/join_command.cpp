@@ -1,6 +1,10 @@
 // qrmctl join: the enrolling program. The library's join stores where the server is; every other
 // step of a membership is this program's to take, in order, and to undo when one fails.
 
+#include <strings.h>
+
+#include <algorithm>
+#include <cstring>
 #include <functional>
 #include <memory>
 #include <vector>
@@ -10,6 +14,7 @@
 #include "input_file.h"
 #include "joined_server.h"
 #include "json_text.h"
+#include "key_value_file.h"
 #include "membership.h"
 #include "serial_number.h"
 #include "zeloqrmclient.h"
@@ -81,6 +86,29 @@ bool BuildJoinInfo(const Options &options, Report &report, Json::Value &joinInfo
     return true;
 }
 
+// The first fact that the server has to be told and that cannot be read, as "'key' in 'file'";
+// empty when all can.
+std::string MissingFact() {
+    constexpr const char *kDefaults = "/etc.defaults/zeloinfo.conf";
+    constexpr const char *kVersion = "/etc.defaults/VERSION";
+    constexpr struct {
+        const char *szFile;
+        const char *szKey;
+    } facts[] = {{kDefaults, "upnpmodelname"}, {kVersion, "majorversion"},
+                 {kVersion, "minorversion"},   {kVersion, "buildnumber"},
+                 {kConfigFile, "admin_port"},  {kConfigFile, "secure_admin_port"}};
+    const bool blSecure = YLIBCFileCheckKeyValue(kConfigFile, "runHTTPS", "yes", 0) == 1;
+    for (const auto &fact : facts) {
+        char szValue[64];
+        const bool blNeeded = blSecure || std::strcmp(fact.szKey, "secure_admin_port") != 0;
+        if (blNeeded &&
+            YLIBCFileGetKeyValue(fact.szFile, fact.szKey, szValue, sizeof(szValue), 0) <= 0) {
+            return std::string("'") + fact.szKey + "' in '" + fact.szFile + "'";
+        }
+    }
+    return {};
+}
+
 // The list that join tries: the candidates, then the address given explicitly.
 Json::Value AllCandidates(const Json::Value &joinInfo) {
     Json::Value all =
@@ -105,10 +133,8 @@ std::vector<Step> Steps(const Json::Value &joinInfo) {
     const std::string strSerial = joinInfo["sn"].asString();
     return {
         {"joining: the server's answer",
-         "the server did not accept the join (check token and serial number; -v shows its "
-         "answer), its address could not be stored, or the appliance's model, version or ports "
-         "could not be read (check "
-         "/etc.defaults/zeloinfo.conf, /etc.defaults/VERSION and /etc/zeloinfo.conf)",
+         "the server did not accept the join (check token and serial number), gave no reply (see "
+         "'qrmctl doctor'), or its address could not be stored; -v shows which",
          [&joinInfo] { return ZELOQRMClientSendCreateClient(joinInfo) == 0; }},
         {"storing the serial number", "the serial number could not be stored",
          [strSerial] { return StoreSerial(strSerial); }},
@@ -180,6 +206,34 @@ ExitCode Enrol(const Json::Value &joinInfo, bool blJoined, Report &report) {
     return report.Done();
 }
 
+bool IsSameName(const Json::Value &one, const Json::Value &other) {
+    return one.isString() && other.isString() &&
+           strcasecmp(one.asCString(), other.asCString()) == 0;
+}
+
+// Whether one of the candidates is that server.
+bool Holds(const Json::Value &candidates, const JoinedServer &server) {
+    using json_text::Member;
+    return std::any_of(candidates.begin(), candidates.end(), [&](const Json::Value &candidate) {
+        return IsSameName(Member(candidate, "host"), server.host) &&
+               (Member(candidate, "https_port") == server.port ||
+                Member(candidate, "http_port") == server.port);
+    });
+}
+
+// The server that is joined already, where it is none of those asked for.
+std::optional<JoinedServer> JoinedElsewhere(const Json::Value &candidates) {
+    Report::Stage("comparing with the server that is joined already");
+    std::optional<JoinedServer> server = FindJoinedServer();
+    const bool blElsewhere = server && !Holds(candidates, *server) && ZELOQRMClientStatus() == 1;
+    return blElsewhere ? server : std::nullopt;
+}
+
+void TellAddress(const JoinedServer &server, Report &report) {
+    report.Fact("host", server.host);
+    report.Fact("port", server.port);
+}
+
 ExitCode Join(const Options &options, Report &report) {
     Json::Value joinInfo(Json::objectValue);
     std::string strError;
@@ -189,11 +243,26 @@ ExitCode Join(const Options &options, Report &report) {
         return report.Fail(ErrorId::kBadInput, strError);
     }
     const Json::Value candidates = AllCandidates(joinInfo);
+    if (const auto server = options.blAgain ? std::nullopt : JoinedElsewhere(candidates)) {
+        report.Member("host", server->host);
+        report.Member("port", server->port);
+        return report.Fail(ErrorId::kJoinedElsewhere,
+                           "this appliance is joined already, to the server at " +
+                               server->Address() +
+                               ", nothing was changed: run 'qrmctl leave' first, or join with "
+                               "--again");
+    }
     if (!options.blAllowHttp && !HasSecurePort(candidates)) {
         return report.Fail(
             ErrorId::kNoSecurePort,
             "no candidate has an https port, and the access token does not go over plain http: "
             "give --https-port, or accept the risk with --allow-http");
+    }
+    const std::string strMissing = MissingFact();
+    if (!strMissing.empty()) {
+        return report.Fail(ErrorId::kFactMissing,
+                           "this appliance has no " + strMissing +
+                               ", which the server has to be told; nothing was changed");
     }
     // Nothing is left, nor removed, for a server that cannot be had.
     Report::Stage("asking " + CandidateNames(candidates) + " for the API '" + kApi + '\'');
@@ -203,7 +272,7 @@ ExitCode Join(const Options &options, Report &report) {
             ErrorId::kNoServer,
             "no server answered at '" + options.strServer +
                 "' or any other candidate, nothing was changed: check address, ports "
-                "and certificate; -v shows the reason of each attempt");
+                "and certificate, with 'qrmctl doctor'; -v shows the reason of each attempt");
     }
     report.WarnOfAuthority();
     Report::Stage(kTurnStage);
@@ -218,6 +287,9 @@ ExitCode Join(const Options &options, Report &report) {
     const bool blJoined = ZELOQRMClientStatus() == 1;
     report.Member("was_joined", blJoined);
     if (blJoined && !options.blAgain) {
+        if (const auto server = FindJoinedServer()) {
+            TellAddress(*server, report);
+        }
         report.Say("This appliance is joined already, nothing was changed; --again joins anew.");
         return report.Done();
     }

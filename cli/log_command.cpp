@@ -50,15 +50,13 @@ bool ReadLevel(const std::string &strLevel, int &level) {
     return false;
 }
 
-ExitCode Render(const Options &options, YLIBSZLIST *pslParams, Report &report) {
+bool Convert(const Options &options, YLIBSZLIST *pslParams, Json::Value &texts) {
     Report::Stage("reading the strings files");
     const char *szSection = options.strSection == "-" ? nullptr : options.strSection.c_str();
-    Json::Value texts;
-    if (ConvertLog(szSection, options.strKey.c_str(), pslParams, texts) != 0) {
-        return report.Fail(ErrorId::kNoSuchText, "no strings file has the key '" + options.strKey +
-                                                     "' in the section '" + options.strSection +
-                                                     "'");
-    }
+    return ConvertLog(szSection, options.strKey.c_str(), pslParams, texts) == 0;
+}
+
+ExitCode Render(const Json::Value &texts, Report &report) {
     if (report.IsJson()) {
         report.Fact("log", texts);
     } else {
@@ -85,13 +83,19 @@ ExitCode Push(const Options &options, Report &report) {
             return report.Fail(ErrorId::kOutOfMemory, "out of memory");
         }
     }
-    if (options.blRender) {
-        return Render(options, params.Get(), report);
-    }
     ExitCode code = kFailed;
-    const std::optional<JoinedServer> server = RequireJoinedServer(report, code);
-    if (!server) {
+    std::optional<JoinedServer> server;
+    if (!options.blRender && !(server = RequireJoinedServer(report, code))) {
         return code;
+    }
+    Json::Value texts;
+    if (!Convert(options, params.Get(), texts)) {
+        return report.Fail(ErrorId::kNoSuchText, "no strings file has the key '" + options.strKey +
+                                                     "' in the section '" + options.strSection +
+                                                     "', nothing was sent");
+    }
+    if (options.blRender) {
+        return Render(texts, report);
     }
     Report::Stage("pushing the log entry to " + server->Address());
     Report::Remedy("the server may have the entry: look there before this is run again");
@@ -100,7 +104,7 @@ ExitCode Push(const Options &options, Report &report) {
                          options.blExtraInfo ? options.strExtraInfo.c_str() : nullptr) != 0) {
         return report.FailExchange(
             ErrorId::kLogNotConfirmed,
-            "the server has not confirmed the log entry; -v shows the reason");
+            "the server has not confirmed the log entry: run 'qrmctl doctor'; -v shows the reason");
     }
     report.Say("The server has the log entry.");
     return report.Done();

@@ -27,8 +27,8 @@ ExitCode TestConnection(const Options &options, Report &report) {
         return report.FailExchange(ErrorId::kNoServer,
                                    "no candidate of '" + options.strCandidates +
                                        "' answered for the API '" + options.strApi +
-                                       "': check addresses, ports and certificates; -v shows "
-                                       "the reason of each attempt");
+                                       "': check addresses, ports and certificates, with "
+                                       "'qrmctl doctor'; -v shows the reason of each attempt");
     }
     report.WarnOfAuthority();
     report.Fact("protocol", connection["protocol"]);

@@ -48,6 +48,9 @@ TEST_F(QrmctlCall, ACallPrintsTheReplyAndSaysWhetherItSucceeded) {
     EXPECT_EQ(Run({"info", "get", "status"}, 0)["value"], "success");
     EXPECT_EQ(Run({"call", "ZELO.QRM.RPC", "info", "--version", "2"}, 1)["reply"]["error"]["code"],
               104);
+    const Json::Value unknown = Run({"call", "NO.SUCH", "info"}, 1);
+    EXPECT_EQ(unknown["error_id"], "refused");
+    EXPECT_EQ(unknown["server_error"], "no-such-api");
     std::ofstream("/tmp/files/params") << R"({"sn":"S","x":1})";
     EXPECT_EQ(Run({"call", "ZELO.QRM.RPC.ClientInfo", "update", "--params", "@/tmp/files/params"},
                   1)["reply"]["error"]["code"],
@@ -92,7 +95,7 @@ TEST_F(QrmctlCall, ALogEntryAndAnIdleTimeAreTakenAsTheyAreTyped) {
     EXPECT_EQ(rendered.size(), 20U);
     EXPECT_EQ(rendered["enu"], "Volume 1 is degraded: a disk is missing.");
     Run({"log", "9", "-", "text"}, 1);
-    Run({"log", "err", "nosuch", "text"}, 1);
+    EXPECT_EQ(Run({"log", "err", "nosuch", "text"}, 1)["error_id"], "no-such-text");
     EXPECT_EQ(s_pServer->Log().size(), 1U);
 
     for (const char *szTime : {"0", "525600"}) {

@@ -430,6 +430,16 @@ TEST_F(Qrmctl, AJoinedApplianceJoinsAnewOnlyWhenTold) {
     EXPECT_EQ(outcome.status, 0);
     EXPECT_TRUE(Holds(outcome.strOut, "joined already")) << outcome.strOut;
     EXPECT_EQ(Requests(), "https:discover ");
+    s_pServer->ForgetRequests();
+    const Json::Value other = RunForJson(Join("0", s_strHttp), 1);
+    EXPECT_EQ(other["error_id"], "joined-elsewhere");
+    EXPECT_TRUE(Holds(other["error"].asString(), "localhost:" + s_strHttps));
+    EXPECT_EQ(Requests(), "") << "it is told before anything is asked";
+    std::filesystem::rename("/etc.defaults/VERSION", "/etc.defaults/away");
+    EXPECT_EQ(RunForJson(Join("0", s_strHttps) + Arguments{"--again"}, 1)["error_id"],
+              "fact-missing");
+    std::filesystem::rename("/etc.defaults/away", "/etc.defaults/VERSION");
+    EXPECT_EQ(Run({"status"}).status, 0) << "the old membership stays";
     EXPECT_TRUE(RunForJson(Join("0", s_strHttps) + Arguments{"--again"}, 0)["was_joined"].asBool());
     EXPECT_TRUE(Holds(Requests(), "join"));
 }
@@ -458,6 +468,12 @@ TEST_F(Qrmctl, CredentialCommandsSayWhatIsInForce) {
     const std::string strRest =
         R"(","protocol":"https","port":443,"application":"ZELO.QRM","access_token":"t0"})";
     EXPECT_TRUE(Holds(RunForJson(show, 1)["error"].asString(), "join first"));
+    for (const char *szFlawed : {R"("port":0)", R"("port":65536)", R"("host":"")",
+                                 R"("protocol":"ftp")", R"("hots":"h")"}) {
+        const std::string strFlawed = R"({"application":"ZELO.QRM",)" + std::string(szFlawed) + '}';
+        EXPECT_EQ(RunForJson({"credential", "update", "-"}, 1, strFlawed)["error_id"], "bad-input")
+            << szFlawed;
+    }
 
     EXPECT_EQ(Run(create, R"({"host":"one\u001b)" + strRest).status, 0);
     EXPECT_EQ(Run(show).strOut, "protocol: https\nhost: one\\x1B\nport: 443\n");
