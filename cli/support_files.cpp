@@ -109,6 +109,7 @@ class NamelessFile {
 int RunAgain(std::vector<std::string> words, const NamelessFile &out, const NamelessFile &err) {
     words.insert(words.begin(), "qrmctl");
     std::vector<char *> arguments;
+    arguments.reserve(words.size() + 1);
     for (std::string &strWord : words) {
         arguments.push_back(strWord.data());
     }

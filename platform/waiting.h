@@ -19,7 +19,7 @@ ZELO_PLATFORM_API int ZELOWaitingFor(char *sz, int cb);
 // Ends the programs that operations of the platform run at this moment in this process, each with
 // its process group; other children of the process are left alone. The operations that run them do
 // not return any more, and none runs another program: the caller is about to end the process.
-// Returns when the programs have ended, after half a second at most.
+// It comes back when the programs have ended, after half a second at most.
 ZELO_PLATFORM_API void ZELOWaitingGiveUp();
 }
 
