@@ -71,37 +71,55 @@ Indicator ReadFlag(Flag &flag) {
     return indicator;
 }
 
+struct Found {
+    std::optional<ErrorId> flaw;
+    long id;  // negative when there is none, or the store cannot be read
+};
+
+// Look-ups take a store that another program holds for one without the credential.
+Found FindId(const char *szApplication) {
+    Found found = {StoreFlaw(), -1};
+    if (found.flaw == ErrorId::kStoreUnreadable) {
+        return found;
+    }
+    found.id = ZELOCredIDGetByApplication(szApplication);
+    if (found.id < 0 && !found.flaw) {
+        found.flaw = StoreFlaw();
+        found.id = found.flaw ? -1 : ZELOCredIDGetByApplication(szApplication);
+    }
+    return found;
+}
+
+std::string StoredFor(long id) {
+    const CredHandle pCred(ZELOCredAlloc());
+    FixedText<1024> host;
+    const bool blHost = pCred != nullptr && ZELOCredLoad(id, pCred.get()) >= 0 &&
+                        ZELOCredItemGetHost(host.Buffer(), FixedText<1024>::Size(),
+                                            pCred.get()) == 0;
+    return blHost ? std::string("stored, for ") + host.sz() : "stored";
+}
+
 Indicator ReadCredential(const Flag &flag, const char *szName, const char *szApplication,
                          int rule) {
     Indicator indicator;
     indicator.strName = szName;
-    const long id = ZELOCredIDGetByApplication(szApplication);
-    const CredHandle pCred(ZELOCredAlloc());
-    FixedText<1024> host;
-    const std::optional<ErrorId> flaw = StoreFlaw();
-    if (flaw) {
-        indicator.strHolds = *flaw == ErrorId::kStoreDamaged
-                                 ? "damaged store; 'qrmctl leave' sets it aside"
-                                 : "cannot be read (-v names the store)";
-    } else if (id < 0) {
-        indicator.strHolds = "not stored";
-    } else if (pCred != nullptr && ZELOCredLoad(id, pCred.get()) >= 0 &&
-               ZELOCredItemGetHost(host.Buffer(), FixedText<1024>::Size(), pCred.get()) == 0) {
-        indicator.strHolds = std::string("stored, for ") + host.sz();
-    } else {
-        indicator.strHolds = "stored";
+    const Found found = FindId(szApplication);
+    if (found.flaw == ErrorId::kStoreUnreadable) {
+        // Nothing is known of the credential: leaving might end a good membership.
+        indicator.strHolds = "cannot be read now (-v shows the reason)";
+        indicator.strRemedy =
+            "wait for the program that holds the store, or mend its mode; then try again";
+        return indicator;
     }
-    if (flag.blNo && id >= 0) {
+    if (flag.blNo && found.id >= 0) {
         Break(indicator, rule);
-    } else if (flag.blYes && id < 0) {
+    } else if (flag.blYes && found.id < 0) {
         Break(indicator, rule + 1);
     }
-    if (flaw) {
-        // Leaving because of a store that another program holds would end a good membership.
-        indicator.strRemedy =
-            *flaw == ErrorId::kStoreDamaged
-                ? "qrmctl leave, which sets the store aside, then qrmctl join"
-                : "end the program that holds the store, or mend its mode; then look again";
+    indicator.strHolds = found.id < 0 ? "not stored" : StoredFor(found.id);
+    if (found.flaw) {
+        indicator.strHolds = "damaged store; 'qrmctl leave' sets it aside";
+        indicator.strRemedy = "qrmctl leave, which sets the store aside, then qrmctl join";
     }
     return indicator;
 }
