@@ -44,9 +44,10 @@ bool HasToken(const ZELO_CRED_SESS *pSess) {
 Check StoreUnreadable() {
     switch (YLIBCErrGet()) {
         case YLIBC_ERR_STORE_DAMAGED:
-            return {"credential", Outcome::kFailed, 0,
-                    "the credential store is damaged or of another format",
-                    "restore a copy, or run 'qrmctl leave', which sets it aside, then 'qrmctl join'"};
+            return {
+                "credential", Outcome::kFailed, 0,
+                "the credential store is damaged or of another format",
+                "restore a copy, or run 'qrmctl leave', which sets it aside, then 'qrmctl join'"};
         case YLIBC_ERR_STORE_BUSY:
             return {"credential", Outcome::kFailed, 0,
                     "another program keeps the credential store locked",

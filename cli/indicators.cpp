@@ -71,53 +71,46 @@ Indicator ReadFlag(Flag &flag) {
     return indicator;
 }
 
-struct Found {
-    std::optional<ErrorId> flaw;
-    long id;  // negative when there is none, or the store cannot be read
-};
-
-// Look-ups take a store that another program holds for one without the credential.
-Found FindId(const char *szApplication) {
-    Found found = {StoreFlaw(), -1};
-    if (found.flaw == ErrorId::kStoreUnreadable) {
-        return found;
+// A look-up takes a store that another program holds for one without the credential.
+long FindId(const char *szApplication, std::optional<ErrorId> &flaw) {
+    if (flaw == ErrorId::kStoreUnreadable) {
+        return -1;
     }
-    found.id = ZELOCredIDGetByApplication(szApplication);
-    if (found.id < 0 && !found.flaw) {
-        found.flaw = StoreFlaw();
-        found.id = found.flaw ? -1 : ZELOCredIDGetByApplication(szApplication);
+    const long id = ZELOCredIDGetByApplication(szApplication);
+    if (id >= 0 || flaw || (flaw = StoreFlaw())) {
+        return id;
     }
-    return found;
+    return ZELOCredIDGetByApplication(szApplication);
 }
 
 std::string StoredFor(long id) {
     const CredHandle pCred(ZELOCredAlloc());
     FixedText<1024> host;
-    const bool blHost = pCred != nullptr && ZELOCredLoad(id, pCred.get()) >= 0 &&
-                        ZELOCredItemGetHost(host.Buffer(), FixedText<1024>::Size(),
-                                            pCred.get()) == 0;
+    const bool blHost =
+        pCred != nullptr && ZELOCredLoad(id, pCred.get()) >= 0 &&
+        ZELOCredItemGetHost(host.Buffer(), FixedText<1024>::Size(), pCred.get()) == 0;
     return blHost ? std::string("stored, for ") + host.sz() : "stored";
 }
 
-Indicator ReadCredential(const Flag &flag, const char *szName, const char *szApplication,
-                         int rule) {
+Indicator ReadCredential(const Flag &flag, std::optional<ErrorId> &flaw, const char *szName,
+                         const char *szApplication, int rule) {
     Indicator indicator;
     indicator.strName = szName;
-    const Found found = FindId(szApplication);
-    if (found.flaw == ErrorId::kStoreUnreadable) {
+    const long id = FindId(szApplication, flaw);
+    if (flaw == ErrorId::kStoreUnreadable) {
         // Nothing is known of the credential: leaving might end a good membership.
         indicator.strHolds = "cannot be read now (-v shows the reason)";
         indicator.strRemedy =
             "wait for the program that holds the store, or mend its mode; then try again";
         return indicator;
     }
-    if (flag.blNo && found.id >= 0) {
+    if (flag.blNo && id >= 0) {
         Break(indicator, rule);
-    } else if (flag.blYes && found.id < 0) {
+    } else if (flag.blYes && id < 0) {
         Break(indicator, rule + 1);
     }
-    indicator.strHolds = found.id < 0 ? "not stored" : StoredFor(found.id);
-    if (found.flaw) {
+    indicator.strHolds = id < 0 ? "not stored" : StoredFor(id);
+    if (flaw) {
         indicator.strHolds = "damaged store; 'qrmctl leave' sets it aside";
         indicator.strRemedy = "qrmctl leave, which sets the store aside, then qrmctl join";
     }
@@ -188,9 +181,10 @@ std::vector<Indicator> ReadIndicators() {
     EnterStage("reading the join flag");
     indicators.push_back(ReadFlag(flag));
     EnterStage("reading the credential store");
-    indicators.push_back(ReadCredential(flag, "server credential", kServerApplication, 1));
+    std::optional<ErrorId> flaw = StoreFlaw();
+    indicators.push_back(ReadCredential(flag, flaw, "server credential", kServerApplication, 1));
     indicators.push_back(
-        ReadCredential(flag, "notification-center credential", kNotificationCenter, 3));
+        ReadCredential(flag, flaw, "notification-center credential", kNotificationCenter, 3));
     EnterStage("asking the cache daemon's script for its status");
     indicators.push_back(ReadDaemon(flag));
     EnterStage("reading the web sessions");

@@ -58,8 +58,7 @@ bool MoveAll(const std::string &strPath, const std::string &strName) {
             continue;
         }
         for (const char *szMoved : moved) {
-            static_cast<void>(!IsThere(strPath) ||
-                              Move(strName + szMoved, strPath + szMoved));
+            static_cast<void>(!IsThere(strPath) || Move(strName + szMoved, strPath + szMoved));
         }
         errno = error;
         return false;
@@ -104,7 +103,8 @@ std::vector<std::string> ListSetAside(const std::string &strPath) {
     for (fs::directory_iterator entry(fs::path(strPath).parent_path(), error);
          !error && entry != fs::directory_iterator(); entry.increment(error)) {
         const std::string strName = entry->path().filename().string();
-        if (strName.compare(0, strBegin.size(), strBegin) == 0 && !IsBesideItsDatabase(entry->path().string())) {
+        if (strName.compare(0, strBegin.size(), strBegin) == 0 &&
+            !IsBesideItsDatabase(entry->path().string())) {
             paths.push_back(entry->path().string());
         }
     }

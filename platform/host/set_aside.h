@@ -15,8 +15,8 @@ namespace host {
 // is where the file is now.
 bool SetAside(const std::string &strPath, std::string &strAside);
 
-// All files that were set aside from the path, the oldest first: databases, and what belonged to one
-// that was not moved with it.
+// All files that were set aside from the path, the oldest first: databases, and what belonged to
+// one that was not moved with it.
 std::vector<std::string> ListSetAside(const std::string &strPath);
 
 }  // namespace host
