@@ -44,13 +44,14 @@ bool HasToken(const ZELO_CRED_SESS *pSess) {
 Check StoreUnreadable() {
     switch (YLIBCErrGet()) {
         case YLIBC_ERR_STORE_DAMAGED:
-            return {"credential", Outcome::kFailed, 0,
-                    "the credential store is damaged or of another format",
-                    "move /usr/zelo/etc/credentials/credentials.db aside or restore a copy of it"};
+            return {
+                "credential", Outcome::kFailed, 0,
+                "the credential store is damaged or of another format",
+                "restore a copy, or run 'qrmctl leave', which sets it aside, then 'qrmctl join'"};
         case YLIBC_ERR_STORE_BUSY:
             return {"credential", Outcome::kFailed, 0,
                     "another program keeps the credential store locked",
-                    "try again when that program is done"};
+                    "wait for that program, or find and end it; then try again"};
         default:
             return {"credential", Outcome::kFailed, 0, "the credential store cannot be read",
                     "run this as root; -v shows the reason"};

@@ -71,37 +71,48 @@ Indicator ReadFlag(Flag &flag) {
     return indicator;
 }
 
-Indicator ReadCredential(const Flag &flag, const char *szName, const char *szApplication,
-                         int rule) {
-    Indicator indicator;
-    indicator.strName = szName;
+// A look-up takes a store that another program holds for one without the credential.
+long FindId(const char *szApplication, std::optional<ErrorId> &flaw) {
+    if (flaw == ErrorId::kStoreUnreadable) {
+        return -1;
+    }
     const long id = ZELOCredIDGetByApplication(szApplication);
+    if (id >= 0 || flaw || (flaw = StoreFlaw())) {
+        return id;
+    }
+    return ZELOCredIDGetByApplication(szApplication);
+}
+
+std::string StoredFor(long id) {
     const CredHandle pCred(ZELOCredAlloc());
     FixedText<1024> host;
-    const std::optional<ErrorId> flaw = StoreFlaw();
-    if (flaw) {
-        indicator.strHolds = *flaw == ErrorId::kStoreDamaged
-                                 ? "damaged store; 'qrmctl leave' sets it aside"
-                                 : "cannot be read (-v names the store)";
-    } else if (id < 0) {
-        indicator.strHolds = "not stored";
-    } else if (pCred != nullptr && ZELOCredLoad(id, pCred.get()) >= 0 &&
-               ZELOCredItemGetHost(host.Buffer(), FixedText<1024>::Size(), pCred.get()) == 0) {
-        indicator.strHolds = std::string("stored, for ") + host.sz();
-    } else {
-        indicator.strHolds = "stored";
+    const bool blHost =
+        pCred != nullptr && ZELOCredLoad(id, pCred.get()) >= 0 &&
+        ZELOCredItemGetHost(host.Buffer(), FixedText<1024>::Size(), pCred.get()) == 0;
+    return blHost ? std::string("stored, for ") + host.sz() : "stored";
+}
+
+Indicator ReadCredential(const Flag &flag, std::optional<ErrorId> &flaw, const char *szName,
+                         const char *szApplication, int rule) {
+    Indicator indicator;
+    indicator.strName = szName;
+    const long id = FindId(szApplication, flaw);
+    if (flaw == ErrorId::kStoreUnreadable) {
+        // Nothing is known of the credential: leaving might end a good membership.
+        indicator.strHolds = "cannot be read now (-v shows the reason)";
+        indicator.strRemedy =
+            "wait for the program that holds the store, or mend its mode; then try again";
+        return indicator;
     }
     if (flag.blNo && id >= 0) {
         Break(indicator, rule);
     } else if (flag.blYes && id < 0) {
         Break(indicator, rule + 1);
     }
+    indicator.strHolds = id < 0 ? "not stored" : StoredFor(id);
     if (flaw) {
-        // Leaving because of a store that another program holds would end a good membership.
-        indicator.strRemedy =
-            *flaw == ErrorId::kStoreDamaged
-                ? "qrmctl leave, which sets the store aside, then qrmctl join"
-                : "end the program that holds the store, or mend its mode; then look again";
+        indicator.strHolds = "damaged store; 'qrmctl leave' sets it aside";
+        indicator.strRemedy = "qrmctl leave, which sets the store aside, then qrmctl join";
     }
     return indicator;
 }
@@ -170,9 +181,10 @@ std::vector<Indicator> ReadIndicators() {
     EnterStage("reading the join flag");
     indicators.push_back(ReadFlag(flag));
     EnterStage("reading the credential store");
-    indicators.push_back(ReadCredential(flag, "server credential", kServerApplication, 1));
+    std::optional<ErrorId> flaw = StoreFlaw();
+    indicators.push_back(ReadCredential(flag, flaw, "server credential", kServerApplication, 1));
     indicators.push_back(
-        ReadCredential(flag, "notification-center credential", kNotificationCenter, 3));
+        ReadCredential(flag, flaw, "notification-center credential", kNotificationCenter, 3));
     EnterStage("asking the cache daemon's script for its status");
     indicators.push_back(ReadDaemon(flag));
     EnterStage("reading the web sessions");

@@ -16,7 +16,6 @@
 #include "json_text.h"
 #include "key_value_file.h"
 #include "membership.h"
-#include "serial_number.h"
 #include "zeloqrmclient.h"
 
 namespace qrmctl {
@@ -36,14 +35,6 @@ struct Options {
     bool blAgain = false;
 };
 
-std::string SerialNumber() {
-    char sz[36] = {};
-    if (YLIBGetCustomSerialNumber(sz, 31) < 0 || sz[0] == '\0') {
-        YLIBGetSerialNumber(sz, sizeof(sz));
-    }
-    return sz;
-}
-
 // An id that reads as a number goes as one.
 Json::Value IdValue(const std::string &strId) {
     Json::Value value;
@@ -60,7 +51,7 @@ bool BuildJoinInfo(const Options &options, Report &report, Json::Value &joinInfo
     if (!ReadTokenFile(options.strTokenFile, strToken, strError)) {
         return false;
     }
-    const std::string strSerial = options.strSerial.empty() ? SerialNumber() : options.strSerial;
+    const std::string strSerial = options.strSerial.empty() ? OwnSerialNumber() : options.strSerial;
     if (strSerial.empty()) {
         strError = "this appliance has no serial number: give one with --sn";
         return false;

@@ -4,6 +4,7 @@
 #include "json_text.h"
 #include "last_error.h"
 #include "membership.h"
+#include "serial_number.h"
 #include "zeloqrmclient.h"
 
 namespace qrmctl {
@@ -38,6 +39,14 @@ std::string AsText(const Json::Value &value) {
     return value.isString() ? value.asString() : json_text::ToLogText(value);
 }
 
+std::string OwnSerialNumber() {
+    char sz[36] = {};
+    if (YLIBGetCustomSerialNumber(sz, 31) < 0 || sz[0] == '\0') {
+        YLIBGetSerialNumber(sz, sizeof(sz));
+    }
+    return sz;
+}
+
 std::string JoinedServer::HostAndPort() const {
     return AsText(host) + ':' + AsText(port);
 }
@@ -46,14 +55,27 @@ std::string JoinedServer::Address() const {
     return AsText(protocol) + "://" + HostAndPort();
 }
 
+namespace {
+
+JoinedServer ServerOf(const Json::Value &cred) {
+    using json_text::Member;
+    return {Member(cred, "host"), Member(cred, "port"), Member(cred, "protocol"),
+            Member(cred, "sn")};
+}
+
+}  // namespace
+
 std::optional<JoinedServer> FindJoinedServer() {
     Json::Value cred(Json::objectValue);
-    if (!ZELOQRMClientGetServerCredential(cred)) {
-        return std::nullopt;
-    }
-    using json_text::Member;
-    return JoinedServer{Member(cred, "host"), Member(cred, "port"), Member(cred, "protocol"),
-                        Member(cred, "sn")};
+    return ZELOQRMClientGetServerCredential(cred) ? std::optional(ServerOf(cred)) : std::nullopt;
+}
+
+std::optional<JoinedServer> FindStoredServer() {
+    Json::Value cred(Json::objectValue);
+    // Without a session the operation fails, and has filled in the rest.
+    static_cast<void>(ZELOQRMClientGetServerCredential(cred));
+    const JoinedServer server = ServerOf(cred);
+    return server.host.isString() ? std::optional(server) : std::nullopt;
 }
 
 std::optional<JoinedServer> RequireJoinedServer(Report &report, ExitCode &code) {

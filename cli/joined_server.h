@@ -25,6 +25,9 @@ bool ClearDamagedStore(Report &report);
 // A stored value as text: a text itself, anything else as JSON.
 std::string AsText(const Json::Value &value);
 
+// This appliance's own serial number, which join sends unless it is given another; "" without one.
+std::string OwnSerialNumber();
+
 struct JoinedServer {
     Json::Value host;  // null when it is not stored, as the others
     Json::Value port;
@@ -41,8 +44,11 @@ struct JoinedServer {
 // The server in force; nothing when none is stored, or the store cannot be read.
 std::optional<JoinedServer> FindJoinedServer();
 
-// The same for a command that cannot do without; when there is none, the command has failed, and
-// code is its exit code.
+// The same, also where the server's session is not stored: after a join that was killed.
+std::optional<JoinedServer> FindStoredServer();
+
+// FindJoinedServer for a command that cannot do without; when there is none, the command has
+// failed, and code is its exit code.
 std::optional<JoinedServer> RequireJoinedServer(Report &report, ExitCode &code);
 
 }  // namespace qrmctl

@@ -64,13 +64,16 @@ void Explain(Report &report) {
 ExitCode Status(bool blExplain, Report &report) {
     Report::Stage("judging the membership");
     int status = ZELOQRMClientStatus();
+    const std::optional<ErrorId> flaw = StoreFlaw();
     // The look-ups that the judgement rests on may succeed in a store that is damaged elsewhere.
-    if (StoreFlaw() == ErrorId::kStoreDamaged) {
+    if (flaw == ErrorId::kStoreDamaged) {
         status = -1;
     }
     report.Fact("status", VerdictName(status));
     if (blExplain) {
         Explain(report);
+    } else if (flaw) {
+        report.Say("The judgement is uncertain: " + StoreFlawText(*flaw) + '.');
     } else if (status < 0) {
         report.Say("The indicators of membership disagree: 'qrmctl status --explain' shows them.");
     }
@@ -83,23 +86,25 @@ void TellEntry(const std::optional<JoinedServer> &server, bool blMember, Report 
     if (!blMember) {
         return;
     }
-    if (!server) {
-        report.Member("server", Json::Value());
-        report.Say(
-            "A server may still have an entry for this appliance; which one is not stored any "
-            "more.");
-        return;
-    }
+    const std::string strOwn = OwnSerialNumber();
     Json::Value entry;
-    entry["host"] = server->host;
-    entry["port"] = server->port;
-    entry["sn"] = server->sn;
+    entry["host"] = server ? server->host : Json::Value();
+    entry["port"] = server ? server->port : Json::Value();
+    entry["sn"] = server ? server->sn : Json::Value();
+    entry["own_sn"] = strOwn.empty() ? Json::Value() : Json::Value(strOwn);
     report.Member("server", entry);
-    report.Say("The server's entry for this appliance remains: look on " + server->HostAndPort() +
-               " for " +
-               (server->sn.isNull() ? "it; its serial number there was not stored"
-                                    : "the serial number '" + AsText(server->sn) + '\'') +
-               ", and remove it there.");
+    std::string strSerial = strOwn.empty() ? "its serial number" : '\'' + strOwn + '\'';
+    if (!entry["sn"].isNull()) {
+        strSerial = '\'' + AsText(entry["sn"]) + '\'';
+    } else {
+        strSerial += " (join sends this one, unless --sn gave another)";
+    }
+    report.Say(server ? "The server's entry for this appliance remains: look on " +
+                            server->HostAndPort() + " for the serial number " + strSerial +
+                            ", and remove it there."
+                      : "The server may still have an entry for this appliance; which server it "
+                        "was is not known any more: look on yours for the serial number " +
+                            strSerial + ", and remove it there.");
 }
 
 ExitCode Leave(const LeaveRequest &request, Report &report) {
@@ -111,7 +116,7 @@ ExitCode Leave(const LeaveRequest &request, Report &report) {
                            "another program is joining or leaving: try again when it is done");
     }
     Report::Stage("looking up the joined server in the credential store");
-    const std::optional<JoinedServer> server = FindJoinedServer();
+    const std::optional<JoinedServer> server = FindStoredServer();
     const bool blDamaged = ClearDamagedStore(report);
     Report::Stage("leaving");
     const bool blJoined = ZELOQRMClientStatus() != 0;

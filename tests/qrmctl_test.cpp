@@ -2,6 +2,7 @@
 
 #include <gtest/gtest.h>
 
+#include <ctime>
 #include <filesystem>
 #include <fstream>
 #include <sstream>
@@ -388,6 +389,23 @@ TEST_F(Qrmctl, ADamagedStoreIsSetAsideByLeavingAndJoiningAlone) {
         EXPECT_EQ(Run(joinAgain).status, 0);
         EXPECT_EQ(Run({"leave"}).status, 0);
     }
+
+    // Others have taken the names of the next seconds, and a move has broken off after the journal.
+    const std::string strBegin = std::string(stored::kDatabase) + ".damaged-";
+    Write(strBegin + "20200101T000000Z-journal", "alone");
+    constexpr int kTaken = 20;
+    for (int i = 0; i < kTaken; ++i) {
+        const std::time_t second = std::time(nullptr) + i;
+        char sz[32] = {};
+        std::strftime(sz, sizeof(sz), "%Y%m%dT%H%M%SZ", std::gmtime(&second));
+        Write(strBegin + sz, "another's");
+    }
+    Write(stored::kDatabase, std::string(5000, 'x'));
+    Write(std::string(stored::kDatabase) + "-shm", "beside it");
+    const std::string strAside = RunForJson({"leave"}, 0)["set_aside"].asString();
+    EXPECT_EQ(strAside.substr(strAside.size() - 3), "Z.2");
+    EXPECT_TRUE(std::filesystem::exists(strAside + "-shm"));
+    EXPECT_EQ(RunForJson({"status", "--explain"}, 3)["set_aside"].size(), cAside + kTaken + 2);
 }
 
 TEST_F(Qrmctl, LeavingTellsWhatItCannotUndo) {
@@ -405,6 +423,30 @@ TEST_F(Qrmctl, LeavingTellsWhatItCannotUndo) {
     EXPECT_EQ(left["server"]["port"], 443);
     EXPECT_EQ(left["server"]["sn"], "SN8");
     EXPECT_EQ(left["entry_remains"], true);
+
+    // Nothing is known of the server, and yet what to look for.
+    const Json::Value joined = RunForJson(Join("0", s_strHttps), 0);
+    Write(stored::kDatabase, std::string(5000, 'x'));
+    const Json::Value lost = RunForJson({"leave"}, 0);
+    EXPECT_TRUE(lost["server"]["host"].isNull());
+    EXPECT_EQ(lost["server"]["own_sn"], joined["sn"]);
+}
+
+TEST_F(Qrmctl, AStoreThatCannotBeReadNowIsNoReasonToLeave) {
+    ASSERT_EQ(Run(Join("0", s_strHttps)).status, 0);
+    const std::string strKept = std::string(stored::kDatabase) + ".kept";
+    std::filesystem::rename(stored::kDatabase, strKept);
+    std::filesystem::create_directory(stored::kDatabase);
+    const Json::Value indicators = RunForJson({"status", "--explain"}, 4)["indicators"];
+    for (const Json::ArrayIndex i : {1U, 2U}) {
+        EXPECT_TRUE(indicators[i]["rule"].isNull());
+        EXPECT_TRUE(Holds(indicators[i]["holds"].asString(), "cannot be read now"));
+        EXPECT_FALSE(Holds(indicators[i]["remedy"].asString(), "leave"));
+    }
+    std::filesystem::remove(stored::kDatabase);
+    std::filesystem::rename(strKept, stored::kDatabase);
+    EXPECT_EQ(Run({"status"}).status, 0);
+    EXPECT_EQ(Run({"leave"}).status, 0);
 }
 
 TEST_F(Qrmctl, TheNextJoinClearsAwayAKilledOne) {

@@ -8,6 +8,7 @@
 #include <array>
 #include <cerrno>
 #include <cstdio>
+#include <cstring>
 #include <ctime>
 #include <filesystem>
 #include <system_error>
@@ -36,21 +37,41 @@ std::string TimeText() {
     return text.data();
 }
 
-// Two damages within a second get different names.
-std::string FreeName(const std::string &strPath) {
-    const std::string strFirst = strPath + kMark + TimeText();
-    std::string strName = strFirst;
-    for (int i = 2; IsThere(strName); ++i) {
-        strName = strFirst + '.' + std::to_string(i);
-    }
-    return strName;
+bool Move(const std::string &strFrom, const std::string &strTo) {
+    return renameat2(AT_FDCWD, strFrom.c_str(), AT_FDCWD, strTo.c_str(), RENAME_NOREPLACE) == 0;
 }
 
-bool IsCompanion(const std::string &strName) {
-    return std::any_of(kCompanions.begin(), kCompanions.end(), [&strName](const char *szSuffix) {
-        const std::string strSuffix = szSuffix;
-        return strName.size() >= strSuffix.size() &&
-               strName.compare(strName.size() - strSuffix.size(), strSuffix.size(), strSuffix) == 0;
+// The companions go first, so that no journal is ever at the path without its database. All or
+// nothing, with errno; only where the database has gone meanwhile its companions do not come back.
+bool MoveAll(const std::string &strPath, const std::string &strName) {
+    constexpr std::array<const char *, 4> kAll = {"-journal", "-wal", "-shm", ""};
+    std::vector<const char *> moved;
+    for (const char *szSuffix : kAll) {
+        // What has the name already belongs to another database, also where nothing would move.
+        const bool blTaken = IsThere(strName + szSuffix);
+        if (!blTaken && Move(strPath + szSuffix, strName + szSuffix)) {
+            moved.push_back(szSuffix);
+            continue;
+        }
+        const int error = blTaken ? EEXIST : errno;
+        if (error == ENOENT && *szSuffix != '\0') {
+            continue;
+        }
+        for (const char *szMoved : moved) {
+            static_cast<void>(!IsThere(strPath) || Move(strName + szMoved, strPath + szMoved));
+        }
+        errno = error;
+        return false;
+    }
+    return true;
+}
+
+// Whether the file is named by that of its database. What a broken-off move has left is not.
+bool IsBesideItsDatabase(const std::string &strPath) {
+    return std::any_of(kCompanions.begin(), kCompanions.end(), [&strPath](const char *szSuffix) {
+        const std::size_t cb = std::strlen(szSuffix);
+        return strPath.size() >= cb && strPath.compare(strPath.size() - cb, cb, szSuffix) == 0 &&
+               IsThere(strPath.substr(0, strPath.size() - cb));
     });
 }
 
@@ -62,15 +83,14 @@ bool SyncFolder(const std::string &strFolder) {
 }  // namespace
 
 bool SetAside(const std::string &strPath, std::string &strAside) {
-    const std::string strName = FreeName(strPath);
-    for (const char *szCompanion : kCompanions) {
-        if (std::rename((strPath + szCompanion).c_str(), (strName + szCompanion).c_str()) != 0 &&
-            errno != ENOENT) {
+    // Two damages within a second get different names.
+    const std::string strFirst = strPath + kMark + TimeText();
+    std::string strName = strFirst;
+    for (int i = 2; !MoveAll(strPath, strName); ++i) {
+        if (errno != EEXIST) {
             return false;
         }
-    }
-    if (std::rename(strPath.c_str(), strName.c_str()) != 0) {
-        return false;
+        strName = strFirst + '.' + std::to_string(i);
     }
     strAside = strName;
     return SyncFolder(fs::path(strPath).parent_path());
@@ -83,7 +103,8 @@ std::vector<std::string> ListSetAside(const std::string &strPath) {
     for (fs::directory_iterator entry(fs::path(strPath).parent_path(), error);
          !error && entry != fs::directory_iterator(); entry.increment(error)) {
         const std::string strName = entry->path().filename().string();
-        if (strName.compare(0, strBegin.size(), strBegin) == 0 && !IsCompanion(strName)) {
+        if (strName.compare(0, strBegin.size(), strBegin) == 0 &&
+            !IsBesideItsDatabase(entry->path().string())) {
             paths.push_back(entry->path().string());
         }
     }

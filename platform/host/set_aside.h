@@ -10,11 +10,13 @@
 namespace host {
 
 // Renames a database file, and before it what belongs to it (-journal, -wal, -shm): a journal that
-// stayed would be played into the next database at the path. Never replaces a file. Returns false
-// with errno; strAside is where the file is now.
+// stayed would be played into the next database at the path. Never replaces a file, whoever makes
+// one meanwhile. Returns false with errno; what was moved is back then, or listed below. strAside
+// is where the file is now.
 bool SetAside(const std::string &strPath, std::string &strAside);
 
-// All files that were set aside from the path, the oldest first.
+// All files that were set aside from the path, the oldest first: databases, and what belonged to
+// one that was not moved with it.
 std::vector<std::string> ListSetAside(const std::string &strPath);
 
 }  // namespace host
