@@ -405,7 +405,7 @@ TEST_F(Qrmctl, ADamagedStoreIsSetAsideByLeavingAndJoiningAlone) {
     Write(stored::kDatabase, std::string(5000, 'x'));
     Write(std::string(stored::kDatabase) + "-shm", "beside it");
     const std::string strAside = RunForJson({"leave"}, 0)["set_aside"].asString();
-    EXPECT_EQ(strAside.substr(strAside.size() - 3), "Z.2");
+    EXPECT_TRUE(Holds(strAside, "Z.")) << strAside;
     EXPECT_TRUE(std::filesystem::exists(strAside + "-shm"));
     EXPECT_EQ(RunForJson({"status", "--explain"}, 3)["set_aside"].size(), cAside + cTaken + 2);
 }
