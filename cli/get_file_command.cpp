@@ -14,13 +14,13 @@
 #include <memory>
 
 #include "commands.h"
-#include "deadline.h"
 #include "file_system.h"
 #include "input_file.h"
 #include "joined_server.h"
 #include "last_error.h"
 #include "progress.h"
 #include "web_api_request.h"
+#include "work_folder.h"
 #include "zeloqrmclient.h"
 
 namespace qrmctl {
@@ -108,41 +108,6 @@ ExitCode Tell(Outcome outcome, const std::string &strPath, const Progress &progr
 
 // --- Beside the destination ---------------------------------------------------------------------
 
-// A folder of our own beside the destination, removed with what is left in it.
-class Workplace {
-  public:
-    explicit Workplace(const fs::path &destination)
-        : m_strFolder(destination.parent_path() /
-                      ('.' + destination.filename().string() + ".XXXXXX")),
-          m_cleanup([this] { Make(); }, [this] { Remove(); }) {}
-    ~Workplace() { Remove(); }
-    Workplace(const Workplace &) = delete;
-    Workplace &operator=(const Workplace &) = delete;
-
-    bool IsUsable() const { return !m_strFolder.empty(); }
-    int Error() const { return m_error; }
-    std::string File() const { return m_strFolder + "/file"; }
-
-  private:
-    void Make() {
-        if (mkdtemp(m_strFolder.data()) == nullptr) {
-            m_error = errno;
-            m_strFolder.clear();
-        }
-    }
-    // Also while the file is being written.
-    void Remove() const {
-        std::error_code ignored;
-        if (!m_strFolder.empty()) {
-            fs::remove_all(m_strFolder, ignored);
-        }
-    }
-
-    std::string m_strFolder;
-    int m_error = 0;
-    DeadlineCleanup m_cleanup;
-};
-
 // Through links to the file itself, so that a link stays one; absolute, so that it has a folder.
 bool ResolveDestination(const std::string &strPath, fs::path &destination, std::string &strError) {
     std::error_code error;
@@ -207,16 +172,16 @@ ExitCode GetBeside(const Options &options, const JoinedServer &server, Json::Val
         params["md5"] = szMd5;
     }
     const InterruptGuard guard;
-    const Workplace workplace(destination);
+    const WorkFolder workplace(destination);
     if (!workplace.IsUsable()) {
         return report.Fail(ErrorId::kBadDestination, "cannot write beside '" + options.strPath +
                                                          "': " + std::strerror(workplace.Error()));
     }
     Report::Stage(FetchStage(options, server));
     Progress progress(!report.IsJson());
-    const Outcome outcome = Fetch(workplace.File(), options, params, progress);
+    const Outcome outcome = Fetch(workplace.Path("file"), options, params, progress);
     Report::Stage("putting the file in place");
-    if (outcome == Outcome::kFetched && !PutInPlace(workplace.File(), destination)) {
+    if (outcome == Outcome::kFetched && !PutInPlace(workplace.Path("file"), destination)) {
         return report.Fail(ErrorId::kNotReplaced, "cannot replace '" + options.strPath + "': " +
                                                       std::strerror(errno) + "; it is as it was");
     }

@@ -13,9 +13,9 @@
 #include <memory>
 
 #include "commands.h"
-#include "deadline.h"
 #include "process.h"
 #include "support_files.h"
+#include "work_folder.h"
 
 namespace qrmctl {
 namespace {
@@ -24,41 +24,6 @@ namespace fs = std::filesystem;
 
 constexpr const char *kTar = "/bin/tar";
 constexpr const char *kFolder = "qrmctl-support";
-
-// A folder of our own beside the archive, removed with what is left in it.
-class Beside {
-  public:
-    explicit Beside(const fs::path &archive)
-        : m_strFolder(archive.parent_path() / ('.' + archive.filename().string() + ".XXXXXX")),
-          m_cleanup([this] { Make(); }, [this] { Remove(); }) {}
-    ~Beside() { Remove(); }
-    Beside(const Beside &) = delete;
-    Beside &operator=(const Beside &) = delete;
-
-    bool IsUsable() const { return !m_strFolder.empty(); }
-    std::string Path(const std::string &strName) const { return m_strFolder + '/' + strName; }
-    const std::string &Folder() const { return m_strFolder; }
-    int Error() const { return m_error; }
-
-  private:
-    void Make() {
-        if (mkdtemp(m_strFolder.data()) == nullptr) {
-            m_error = errno;
-            m_strFolder.clear();
-        }
-    }
-    // Also while it is being filled.
-    void Remove() const {
-        std::error_code ignored;
-        if (!m_strFolder.empty()) {
-            fs::remove_all(m_strFolder, ignored);
-        }
-    }
-
-    std::string m_strFolder;
-    int m_error = 0;
-    DeadlineCleanup m_cleanup;
-};
 
 bool WriteFiles(const std::string &strFolder) {
     if (mkdir(strFolder.c_str(), 0700) != 0) {
@@ -112,7 +77,7 @@ ExitCode Support(const std::string &strFile, bool blForce, Report &report) {
     }
     // What is put together is nobody else's either.
     umask(077);
-    const Beside beside(archive);
+    const WorkFolder beside(archive);
     if (!beside.IsUsable()) {
         return FailFor(strFile, std::strerror(beside.Error()), report);
     }
