@@ -39,6 +39,15 @@ runs() {
     esac
 }
 
+# The daemon alone writes its id, once: whoever reads the file finds it whole.
+await_id() {
+    local try=0
+    until [ -s "$pid_file" ]; do
+        [ "$((try += 1))" -le 100 ] || fail 1 "the daemon does not write its id to '$pid_file'"
+        sleep 0.05
+    done
+}
+
 start() {
     take_turn
     if runs; then
@@ -48,8 +57,9 @@ start() {
     [ -x "$daemon" ] || fail 5 "there is no program '$daemon'"
     command exec 9>>"$pid_file" || exit 1
     flock -w 5 9 || fail 1 "cannot lock '$pid_file'"
+    : >"$pid_file"
     setsid "$daemon" </dev/null >/dev/null 2>&1 8>&- &
-    echo $! >"$pid_file"
+    await_id
     echo 'zelocache is started.'
 }
 
@@ -57,7 +67,7 @@ stop() {
     local pid try
     take_turn
     if runs; then
-        # The daemon writes its id too: a look may find the file emptied for that.
+        # A daemon whose start was cut off may be about to write its id.
         for try in 1 2 3 4 5; do
             read -r pid <"$pid_file" && grep -q zelocache "/proc/$pid/cmdline" 2>/dev/null && break
             [ "$try" -lt 5 ] ||
