@@ -130,7 +130,9 @@ bool IsWritable(const Json::Value &value) {
         return IsUtf8(TextOf(value));
     }
     for (auto member = value.begin(); member != value.end(); ++member) {
-        if ((value.isObject() && !IsUtf8(member.name())) || !IsWritable(*member)) {
+        const char *pEnd = nullptr;
+        const char *pName = member.memberName(&pEnd);
+        if (!IsUtf8({pName, static_cast<std::size_t>(pEnd - pName)}) || !IsWritable(*member)) {
             return false;
         }
     }
@@ -160,8 +162,8 @@ void SetError(std::string *pstrError, const std::string &strError) {
 
 }  // namespace
 
-bool ToString(const Json::Value &value, std::string &strText) {
-    if (IsTooDeep(value, kMaxDepth)) {
+bool ToString(const Json::Value &value, std::string &strText, int maxDepth) {
+    if (IsTooDeep(value, maxDepth)) {
         return false;
     }
     try {

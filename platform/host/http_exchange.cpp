@@ -36,6 +36,9 @@ constexpr long kStallTime_s = 30;
 // For a body in memory; one that goes to a stream may take its time as long as it moves.
 constexpr long kWholeTimeout_s = 300;
 constexpr long kStreamBuffer = 512 * 1024L;
+constexpr long kReplyBuffer = 16 * 1024L;
+// What is sent is small, while libcurl allocates and frees its buffer for each exchange.
+constexpr long kUploadBuffer = 16 * 1024L;
 
 // More idle handles than this are not kept.
 constexpr std::size_t kMaxIdle = 8;
@@ -58,6 +61,7 @@ struct FreeText {
 struct Connection {
     std::set<curl_socket_t> sockets;
     CaState caState;
+    std::array<char, CURL_ERROR_SIZE> reason = {};
     // Goes first: cleaning it up closes its sockets, which calls back to the set above.
     std::unique_ptr<CURL, CleanupEasy> pEasy;
 };
@@ -161,6 +165,33 @@ CURLcode AddAuthorities(CURL * /*pEasy*/, void *pSslContext, void * /*pContext*/
     }
 }
 
+// --- What every exchange on a handle has in common ----------------------------------------------
+
+void SetTransport(CURL *pEasy, Connection *pConnection) {
+    curl_easy_setopt(pEasy, CURLOPT_NOSIGNAL, 1L);
+    curl_easy_setopt(pEasy, CURLOPT_PROTOCOLS_STR, "http,https");
+    curl_easy_setopt(pEasy, CURLOPT_FOLLOWLOCATION, 0L);
+    curl_easy_setopt(pEasy, CURLOPT_HTTP_VERSION, static_cast<long>(CURL_HTTP_VERSION_1_1));
+    curl_easy_setopt(pEasy, CURLOPT_CONNECTTIMEOUT, kConnectTimeout_s);
+    // A name server that is silent is not waited for either.
+    curl_easy_setopt(pEasy, CURLOPT_QUICK_EXIT, 1L);
+    curl_easy_setopt(pEasy, CURLOPT_LOW_SPEED_LIMIT, kStallBytesPerSecond);
+    curl_easy_setopt(pEasy, CURLOPT_LOW_SPEED_TIME, kStallTime_s);
+    curl_easy_setopt(pEasy, CURLOPT_UPLOAD_BUFFERSIZE, kUploadBuffer);
+    curl_easy_setopt(pEasy, CURLOPT_SUPPRESS_CONNECT_HEADERS, 1L);
+    curl_easy_setopt(pEasy, CURLOPT_OPENSOCKETFUNCTION, OpenSocket);
+    curl_easy_setopt(pEasy, CURLOPT_OPENSOCKETDATA, pConnection);
+    curl_easy_setopt(pEasy, CURLOPT_CLOSESOCKETFUNCTION, CloseSocket);
+    curl_easy_setopt(pEasy, CURLOPT_CLOSESOCKETDATA, pConnection);
+    curl_easy_setopt(pEasy, CURLOPT_SSLVERSION, static_cast<long>(CURL_SSLVERSION_TLSv1_2));
+    curl_easy_setopt(pEasy, CURLOPT_SSL_VERIFYPEER, 1L);
+    curl_easy_setopt(pEasy, CURLOPT_SSL_VERIFYHOST, 2L);
+    curl_easy_setopt(pEasy, CURLOPT_SSL_CTX_FUNCTION, AddAuthorities);
+    curl_easy_setopt(pEasy, CURLOPT_WRITEFUNCTION, TakeBody);
+    curl_easy_setopt(pEasy, CURLOPT_XFERINFOFUNCTION, ShowProgress);
+    curl_easy_setopt(pEasy, CURLOPT_ERRORBUFFER, pConnection->reason.data());
+}
+
 // --- Pool ---------------------------------------------------------------------------------------
 
 // A handle borrowed from the pool, given back when the exchange is over.
@@ -176,6 +207,9 @@ class Borrowed {
             m_pConnection = std::make_unique<Connection>();
             m_pConnection->pEasy.reset(curl_easy_init());
             m_pConnection->caState = CaState::Now();
+            if (m_pConnection->pEasy != nullptr) {
+                SetTransport(m_pConnection->pEasy.get(), m_pConnection.get());
+            }
         }
         const std::lock_guard<std::mutex> lock(ThePool().mutex);
         ThePool().inUse.insert(m_pConnection.get());
@@ -183,9 +217,6 @@ class Borrowed {
     ~Borrowed() {
         if (m_pConnection == nullptr) {
             return;
-        }
-        if (m_pConnection->pEasy != nullptr) {
-            curl_easy_reset(m_pConnection->pEasy.get());
         }
         Pool &pool = ThePool();
         const std::lock_guard<std::mutex> lock(pool.mutex);
@@ -226,27 +257,7 @@ class Borrowed {
     std::unique_ptr<Connection> m_pConnection;
 };
 
-// --- Options ------------------------------------------------------------------------------------
-
-void SetTransport(CURL *pEasy, Connection *pConnection) {
-    curl_easy_setopt(pEasy, CURLOPT_NOSIGNAL, 1L);
-    curl_easy_setopt(pEasy, CURLOPT_PROTOCOLS_STR, "http,https");
-    curl_easy_setopt(pEasy, CURLOPT_FOLLOWLOCATION, 0L);
-    curl_easy_setopt(pEasy, CURLOPT_HTTP_VERSION, static_cast<long>(CURL_HTTP_VERSION_1_1));
-    curl_easy_setopt(pEasy, CURLOPT_CONNECTTIMEOUT, kConnectTimeout_s);
-    // A name server that is silent is not waited for either.
-    curl_easy_setopt(pEasy, CURLOPT_QUICK_EXIT, 1L);
-    curl_easy_setopt(pEasy, CURLOPT_LOW_SPEED_LIMIT, kStallBytesPerSecond);
-    curl_easy_setopt(pEasy, CURLOPT_LOW_SPEED_TIME, kStallTime_s);
-    curl_easy_setopt(pEasy, CURLOPT_OPENSOCKETFUNCTION, OpenSocket);
-    curl_easy_setopt(pEasy, CURLOPT_OPENSOCKETDATA, pConnection);
-    curl_easy_setopt(pEasy, CURLOPT_CLOSESOCKETFUNCTION, CloseSocket);
-    curl_easy_setopt(pEasy, CURLOPT_CLOSESOCKETDATA, pConnection);
-    curl_easy_setopt(pEasy, CURLOPT_SSLVERSION, static_cast<long>(CURL_SSLVERSION_TLSv1_2));
-    curl_easy_setopt(pEasy, CURLOPT_SSL_VERIFYPEER, 1L);
-    curl_easy_setopt(pEasy, CURLOPT_SSL_VERIFYHOST, 2L);
-    curl_easy_setopt(pEasy, CURLOPT_SSL_CTX_FUNCTION, AddAuthorities);
-}
+// --- What each exchange on a handle sets anew ---------------------------------------------------
 
 // Whether the environment names a proxy, in one of the variables that libcurl looks at. Where it
 // names none, as on most appliances, an exchange need not read the configuration.
@@ -269,16 +280,15 @@ bool SetWay(CURL *pEasy, bool blRelay) {
         curl_easy_setopt(pEasy, CURLOPT_PROXY, ("http://" + strValue).c_str());
         curl_easy_setopt(pEasy, CURLOPT_NOPROXY, "");
         curl_easy_setopt(pEasy, CURLOPT_HTTPPROXYTUNNEL, 1L);
-        curl_easy_setopt(pEasy, CURLOPT_SUPPRESS_CONNECT_HEADERS, 1L);
         return true;
     }
     const bool blEnvironment =
         NamesProxy() &&
         LookUpKey(kConfigFile, "use_proxy_environment", strValue) == LookUp::kFound &&
         strValue == "yes";
-    if (!blEnvironment) {
-        curl_easy_setopt(pEasy, CURLOPT_PROXY, "");
-    }
+    curl_easy_setopt(pEasy, CURLOPT_PROXY, blEnvironment ? nullptr : "");
+    curl_easy_setopt(pEasy, CURLOPT_NOPROXY, nullptr);
+    curl_easy_setopt(pEasy, CURLOPT_HTTPPROXYTUNNEL, 0L);
     return true;
 }
 
@@ -312,11 +322,16 @@ void SetRequest(CURL *pEasy, const HttpRequest &request, const curl_slist *pHead
     curl_easy_setopt(pEasy, CURLOPT_TIMEOUT,
                      request.timeout_s > 0 ? static_cast<long>(request.timeout_s) : wholeTimeout_s);
     curl_easy_setopt(pEasy, CURLOPT_FORBID_REUSE, request.blKeepConnection ? 0L : 1L);
-    if (request.blPost) {
-        curl_easy_setopt(pEasy, CURLOPT_POSTFIELDS, request.strBody.c_str());
-        curl_easy_setopt(pEasy, CURLOPT_POSTFIELDSIZE_LARGE,
-                         static_cast<curl_off_t>(request.strBody.size()));
+    curl_easy_setopt(pEasy, CURLOPT_BUFFERSIZE,
+                     request.pStream == nullptr ? kReplyBuffer : kStreamBuffer);
+    curl_easy_setopt(pEasy, CURLOPT_NOPROGRESS, request.pfnObserver == nullptr ? 1L : 0L);
+    if (!request.blPost) {
+        curl_easy_setopt(pEasy, CURLOPT_HTTPGET, 1L);
+        return;
     }
+    curl_easy_setopt(pEasy, CURLOPT_POSTFIELDS, request.strBody.c_str());
+    curl_easy_setopt(pEasy, CURLOPT_POSTFIELDSIZE_LARGE,
+                     static_cast<curl_off_t>(request.strBody.size()));
 }
 
 // Whether the text holds nothing but letters, digits, '.', '-', '_' and the one other character.
@@ -361,21 +376,13 @@ int Fail(int error, const HttpRequest &request, const char *szReason, int line) 
     return error;
 }
 
-int Transact(const HttpRequest &request, CURL *pEasy, HttpReply &reply) {
+int Transact(const HttpRequest &request, Connection &connection, HttpReply &reply) {
+    CURL *const pEasy = connection.pEasy.get();
     Transfer transfer{request, pEasy,
                       ReplySink(request.pStream, request.pfnWrite, request.blHasCopy)};
-    std::array<char, CURL_ERROR_SIZE> reason = {};
-    curl_easy_setopt(pEasy, CURLOPT_WRITEFUNCTION, TakeBody);
     curl_easy_setopt(pEasy, CURLOPT_WRITEDATA, &transfer);
-    curl_easy_setopt(pEasy, CURLOPT_ERRORBUFFER, reason.data());
-    if (request.pStream != nullptr) {
-        curl_easy_setopt(pEasy, CURLOPT_BUFFERSIZE, kStreamBuffer);
-    }
-    if (request.pfnObserver != nullptr) {
-        curl_easy_setopt(pEasy, CURLOPT_NOPROGRESS, 0L);
-        curl_easy_setopt(pEasy, CURLOPT_XFERINFOFUNCTION, ShowProgress);
-        curl_easy_setopt(pEasy, CURLOPT_XFERINFODATA, &transfer);
-    }
+    curl_easy_setopt(pEasy, CURLOPT_XFERINFODATA, &transfer);
+    connection.reason[0] = '\0';
     const Waiting waiting({"asking '", ServerOf(request.strUrl), "'"});
     const CURLcode result = curl_easy_perform(pEasy);
     curl_easy_getinfo(pEasy, CURLINFO_RESPONSE_CODE, &reply.status);
@@ -388,8 +395,10 @@ int Transact(const HttpRequest &request, CURL *pEasy, HttpReply &reply) {
         return Fail(sink.Error(), request, sink.Reason().c_str(), __LINE__);
     }
     if (result != CURLE_OK) {
-        return Fail(ZELO::CRED_REQ_ERR_NETWORK, request,
-                    reason[0] != '\0' ? reason.data() : curl_easy_strerror(result), __LINE__);
+        return Fail(
+            ZELO::CRED_REQ_ERR_NETWORK, request,
+            connection.reason[0] != '\0' ? connection.reason.data() : curl_easy_strerror(result),
+            __LINE__);
     }
     reply.strBody.swap(sink.Body());
     return ZELO::CRED_REQ_ERR_NONE;
@@ -404,13 +413,12 @@ int Perform(const HttpRequest &request, HttpReply &reply) {
     if (pEasy == nullptr || !BuildHeaders(request, pHeaders)) {
         return Fail(ZELO::CRED_REQ_ERR_MEMORY, request, "out of memory", __LINE__);
     }
-    SetTransport(pEasy, connection.Get());
     if (!SetWay(pEasy, request.blRelay)) {
         return Fail(ZELO::CRED_REQ_ERR_NETWORK, request,
                     "no relay: set farlink_relay=\"host:port\" in /etc/zeloinfo.conf", __LINE__);
     }
     SetRequest(pEasy, request, pHeaders.get());
-    return Transact(request, pEasy, reply);
+    return Transact(request, *connection.Get(), reply);
 }
 
 std::string BuildUrl(const std::string &strScheme, const std::string &strHost, long port,
