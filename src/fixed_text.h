@@ -7,6 +7,8 @@
 #include <cstddef>
 #include <cstdio>
 #include <cstring>
+#include <initializer_list>
+#include <string_view>
 
 // Takes away a UTF-8 character of which only the beginning is left at the end of a text that was
 // cut.
@@ -33,21 +35,42 @@ inline void CopyToFit(char *szOut, int cbOut, const char *szText) {
         return;
     }
     const auto size = static_cast<std::size_t>(cbOut);
-    if (std::snprintf(szOut, size, "%s", szText) >= cbOut) {
+    if (memccpy(szOut, szText, '\0', size) == nullptr) {
+        szOut[size - 1] = '\0';
         DropPartialCharacter(szOut);
     }
 }
 
-// A zeroed buffer of N bytes that holds zero-terminated text of at most N - 1 bytes.
-template <std::size_t N>
+// What a new buffer holds behind its empty text. Zeroes serve platform getters that write a text
+// without its end; a message takes dozens of larger buffers, for which they would be the main cost.
+enum class Behind { kZeroes, kAnything };
+
+// A buffer of N bytes that holds zero-terminated text of at most N - 1 bytes, at first none.
+template <std::size_t N, Behind behind = Behind::kZeroes>
 class FixedText {
   public:
+    FixedText() { std::memset(m_sz, 0, behind == Behind::kZeroes ? N : 1); }
+
     // For a platform getter, which fills the buffer and takes its size.
     char *Buffer() { return m_sz; }
     static constexpr int Size() { return static_cast<int>(N); }
 
     const char *sz() const { return m_sz; }
     bool Empty() const { return m_sz[0] == '\0'; }
+
+    // Joins the pieces in the buffer. Returns false, with an empty buffer, when they do not fit.
+    bool Join(std::initializer_list<std::string_view> pieces) {
+        std::size_t cb = 0;
+        for (const std::string_view piece : pieces) {
+            if (piece.size() >= N - cb) {
+                m_sz[0] = '\0';
+                return false;
+            }
+            cb += piece.copy(m_sz + cb, piece.size());
+        }
+        m_sz[cb] = '\0';
+        return true;
+    }
 
     // Formats into the buffer, cut to fit. Returns the length that the whole text has.
     std::size_t Format(const char *szFormat, ...) __attribute__((format(printf, 2, 3))) {
@@ -67,7 +90,7 @@ class FixedText {
     }
 
   private:
-    char m_sz[N] = {};
+    char m_sz[N];
 };
 
 #endif

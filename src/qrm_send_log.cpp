@@ -72,8 +72,9 @@ int FindPlaceholder(const char *szText, char *szSection, char *szKey, int limit)
                                                       : "__null != szKey");
         return -1;
     }
-    const TextCopy copy = Copy(szText);
-    char *szOpen = copy == nullptr ? nullptr : std::strchr(copy.get(), '{');
+    // Most texts hold none, and then there is nothing to copy.
+    const TextCopy copy = Copy(std::strchr(szText, '{'));
+    char *szOpen = copy.get();
     char *szColon = szOpen == nullptr ? nullptr : std::strchr(szOpen, ':');
     char *szClose = szColon == nullptr ? nullptr : std::strchr(szColon, '}');
     if (szClose == nullptr || szColon - szOpen > limit || szClose - szColon > limit) {
@@ -96,8 +97,8 @@ int FindToken(const char *szText, char *szSection, char *szKey, char *szToken, i
                                                     : "__null != szToken");
         return -1;
     }
-    const TextCopy copy = Copy(szText);
-    char *szOpen = copy == nullptr ? nullptr : std::strstr(copy.get(), kOpen);
+    const TextCopy copy = Copy(szText == nullptr ? nullptr : std::strstr(szText, kOpen));
+    char *szOpen = copy.get();
     char *szClose = szOpen == nullptr ? nullptr : std::strchr(szOpen, ')');
     if (szClose == nullptr) {
         return -1;
@@ -119,11 +120,13 @@ int FindToken(const char *szText, char *szSection, char *szKey, char *szToken, i
     return YLIBCStrTrim(szRest, szKey, kTrimmed) > 0 ? 0 : -1;
 }
 
+using ReferredText = FixedText<1024, Behind::kAnything>;
+
 // One reference as it stands in a text, and what it names.
 struct Reference {
-    FixedText<kReferenceLimit> section;
-    FixedText<kReferenceLimit> key;
-    FixedText<2 * kReferenceLimit + 4> whole;
+    FixedText<kReferenceLimit, Behind::kAnything> section;
+    FixedText<kReferenceLimit, Behind::kAnything> key;
+    FixedText<2 * kReferenceLimit + 4, Behind::kAnything> whole;
 };
 
 bool NextPlaceholder(const char *szText, Reference &reference) {
@@ -131,8 +134,7 @@ bool NextPlaceholder(const char *szText, Reference &reference) {
                              kReferenceLimit) != 0) {
         return false;
     }
-    reference.whole.Format("{%s:%s}", reference.section.sz(), reference.key.sz());
-    return true;
+    return reference.whole.Join({"{", reference.section.sz(), ":", reference.key.sz(), "}"});
 }
 
 bool NextToken(const char *szText, Reference &reference) {
@@ -143,15 +145,15 @@ bool NextToken(const char *szText, Reference &reference) {
 // Replaces references until none is found, or one cannot be replaced.
 void Expand(bool (*pfnNext)(const char *, Reference &), const char *szStringsFile, char *szText,
             int cbText) {
+    Reference reference;
+    ReferredText value;
     for (int i = 0; i < kMaxReplacements; ++i) {
-        Reference reference;
         if (!pfnNext(szText, reference)) {
             return;
         }
-        FixedText<1024> value;
         const bool blFound =
             YLIBCFileGetSectionValue(szStringsFile, reference.section.sz(), reference.key.sz(),
-                                     value.Buffer(), FixedText<1024>::Size()) >= 0;
+                                     value.Buffer(), ReferredText::Size()) >= 0;
         const char *szValue = blFound ? value.sz() : reference.key.sz();
         const bool blUnchanged = std::strcmp(szValue, reference.whole.sz()) == 0;
         if (blUnchanged || YLIBCStrReplace(szText, reference.whole.sz(), szValue, 0, cbText) <= 0) {
@@ -178,11 +180,15 @@ void GetParam(YLIBSZLIST *pslParams, int index, const char *szStringsFile, char 
 
 constexpr const char *kLanguages =
     "chs,cht,csy,dan,enu,fre,ger,hun,ita,jpn,krn,nld,nor,plk,ptb,ptg,rus,spn,sve,trk";
-constexpr const char *kStringsFile = "/usr/zelo/zeloman/webman/texts/%s/strings";
-constexpr const char *kFallbackFile = "/usr/zelo/zeloman/webman/texts/enu/strings";
+constexpr const char *kTextsFolder = "/usr/zelo/zeloman/webman/texts/";
+constexpr const char *kFallbackLanguage = "enu";
 constexpr int kLanguageListSize = 512;
 
-using MessageText = FixedText<4096>;
+using MessageText = FixedText<4096, Behind::kAnything>;
+
+void SetStringsFile(const char *szLanguage, MessageText &path) {
+    path.Join({kTextsFolder, szLanguage, "/strings"});
+}
 
 bool ReadMessage(const char *szFile, const char *szSection, const char *szKey, MessageText &text) {
     return YLIBCFileGetSectionValue(szFile, szSection, szKey, text.Buffer(), MessageText::Size()) >=
@@ -194,7 +200,7 @@ void FillMarkers(YLIBSZLIST *pslParams, const char *szStringsFile, MessageText &
         MessageText param;
         ParamGet(pslParams, i, szStringsFile, param.Buffer(), MessageText::Size());
         FixedText<8> marker;
-        if (marker.Format("{%d}", i) < sizeof(marker)) {
+        if (marker.Join({"{", std::to_string(i), "}"})) {
             static_cast<void>(
                 YLIBCStrReplace(text.Buffer(), marker.sz(), param.sz(), 0, MessageText::Size()));
         }
@@ -205,11 +211,11 @@ void FillMarkers(YLIBSZLIST *pslParams, const char *szStringsFile, MessageText &
 bool Render(const char *szLanguage, const char *szSection, const char *szKey, YLIBSZLIST *pslParams,
             MessageText &text) {
     MessageText path;
-    path.Format(kStringsFile, szLanguage);
+    SetStringsFile(szLanguage, path);
     if (szSection == nullptr) {
         CopyToFit(text.Buffer(), MessageText::Size(), szKey);
     } else if (!ReadMessage(path.sz(), szSection, szKey, text)) {
-        path.Format("%s", kFallbackFile);
+        SetStringsFile(kFallbackLanguage, path);
         if (!ReadMessage(path.sz(), szSection, szKey, text)) {
             return false;
         }

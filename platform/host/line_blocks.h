@@ -12,9 +12,10 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstddef>
+#include <memory>
 #include <optional>
-#include <string>
 #include <string_view>
+#include <utility>
 
 namespace host {
 
@@ -26,7 +27,8 @@ class LineBlocks {
           m_offset(begin),
           m_next(begin),
           m_end(end),
-          m_strBuffer(static_cast<std::size_t>(std::clamp<off_t>(end - begin, 1, kBlock)), '\0') {}
+          m_cbBuffer(static_cast<std::size_t>(std::clamp<off_t>(end - begin, 1, kBlock))),
+          m_pBuffer(new char[m_cbBuffer]) {}
 
     // The next block, which is valid until the next call; nothing after the last one, and where
     // reading ends early.
@@ -62,30 +64,32 @@ class LineBlocks {
     static constexpr off_t kBlock = off_t{64} * 1024;
     static constexpr std::size_t kLongestLine = std::size_t{16} * 1024 * 1024;
 
-    std::string_view Held() const { return {m_strBuffer.data(), m_cbHeld}; }
+    std::string_view Held() const { return {m_pBuffer.get(), m_cbHeld}; }
 
     void DropBlock() {
-        const auto begin = m_strBuffer.begin();
-        std::copy(begin + static_cast<off_t>(m_cbBlock), begin + static_cast<off_t>(m_cbHeld),
-                  begin);
+        const std::string_view rest = Held().substr(m_cbBlock);
+        std::copy(rest.begin(), rest.end(), m_pBuffer.get());
         m_offset += static_cast<off_t>(m_cbBlock);
         m_cbHeld -= m_cbBlock;
         m_cbBlock = 0;
     }
 
     bool MakeRoom() {
-        if (m_cbHeld == m_strBuffer.size()) {
-            m_strBuffer.resize(m_strBuffer.size() * 2);
+        if (m_cbHeld == m_cbBuffer) {
+            std::unique_ptr<char[]> pLarger(new char[2 * m_cbBuffer]);
+            Held().copy(pLarger.get(), m_cbHeld);
+            m_pBuffer = std::move(pLarger);
+            m_cbBuffer *= 2;
         }
-        return m_strBuffer.size() <= kLongestLine;
+        return m_cbBuffer <= kLongestLine;
     }
 
     bool Fill() {
         const std::size_t cbRoom =
-            std::min(m_strBuffer.size() - m_cbHeld, static_cast<std::size_t>(m_end - m_next));
+            std::min(m_cbBuffer - m_cbHeld, static_cast<std::size_t>(m_end - m_next));
         ssize_t cb = 0;
         do {
-            cb = pread(m_fd, &m_strBuffer[m_cbHeld], cbRoom, m_next);
+            cb = pread(m_fd, &m_pBuffer[m_cbHeld], cbRoom, m_next);
         } while (cb < 0 && errno == EINTR);
         if (cb <= 0) {
             return false;
@@ -102,7 +106,8 @@ class LineBlocks {
     bool m_blCut = false;
     std::size_t m_cbBlock = 0;  // of the block that was handed out
     std::size_t m_cbHeld = 0;   // the block and what has been read behind it
-    std::string m_strBuffer;
+    std::size_t m_cbBuffer;
+    std::unique_ptr<char[]> m_pBuffer;  // not zeroed, which would cost a part of the reading
 };
 
 }  // namespace host

@@ -106,14 +106,19 @@ bool AppendWithin(std::size_t cbMost, std::string_view piece, std::string &strTe
     return true;
 }
 
-// Appends the text with every occurrence replaced, unless it is longer than cbMost bytes. Returns
-// the number of occurrences, or -1 when it is.
+// Builds the text with every occurrence replaced, unless it is longer than cbMost bytes. Returns
+// the number of occurrences, or -1 when it is. Without an occurrence the result stays empty.
 int Replace(const char *szText, const char *szOld, std::string_view replacement, std::size_t cbMost,
             std::string &strResult) {
     const std::size_t cbOld = std::strlen(szOld);
     const char *szRest = szText;
+    const char *szMatch = std::strstr(szText, szOld);
+    if (szMatch == nullptr) {
+        return 0;
+    }
+    strResult.reserve(std::min(std::strlen(szText) + replacement.size(), cbMost));
     int occurrences = 0;
-    while (const char *szMatch = std::strstr(szRest, szOld)) {
+    for (; szMatch != nullptr; szMatch = std::strstr(szRest, szOld)) {
         if (!AppendWithin(cbMost, Between(szRest, szMatch), strResult) ||
             !AppendWithin(cbMost, replacement, strResult)) {
             return -1;
