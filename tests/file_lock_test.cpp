@@ -157,6 +157,20 @@ TEST(FileLock, IsOneLockAlsoWhenItsFileIsRemoved) {
     fs::remove(kLock);
     EXPECT_EQ(YLIBCFileUnlockByFile(handle), 0);
     EXPECT_TRUE(children::Ended(waiter));
+    // What the process has held before is worth nothing once another file has the name.
+    ASSERT_TRUE(IsFree());
+    std::ofstream("/tmp/other").flush();
+    fs::rename("/tmp/other", kLock);
+    const children::Signal held;
+    const children::Signal done;
+    const pid_t holder = children::Start([&] {
+        const int own = Take();
+        return held.Give() && done.Await() && YLIBCFileUnlockByFile(own) == 0;
+    });
+    ASSERT_TRUE(held.Await());
+    EXPECT_FALSE(IsFree());
+    EXPECT_TRUE(done.Give());
+    EXPECT_TRUE(children::Ended(holder));
 }
 
 TEST(FileLock, TrapsAreRefused) {

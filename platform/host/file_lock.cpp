@@ -11,6 +11,7 @@
 #include <chrono>
 #include <mutex>
 #include <new>
+#include <string>
 #include <thread>
 #include <utility>
 #include <vector>
@@ -31,12 +32,24 @@ constexpr int kTimeout_s = 30;
 constexpr std::chrono::microseconds kFirstWait{100};
 constexpr std::chrono::microseconds kLastWait{2000};
 
+// Of the lock files whose locks are released, these many stay open to be locked again, which takes
+// half the time of opening them anew.
+constexpr std::size_t kMaxIdle = 8;
+
+// An open lock file.
+struct OpenFile {
+    std::string strPath;
+    int fd = -1;
+    struct stat status = {};  // when it was opened
+};
+
 // All lock files that the process has open; a handle is a descriptor. Opening, closing and forking
 // exclude each other, so that a child process knows what it has to close. Never destroyed: other
 // threads may still hold locks while the process ends.
 struct OpenLocks {
     std::mutex mutex;
-    std::vector<int> descriptors;
+    std::vector<OpenFile> used;
+    std::vector<OpenFile> idle;
 };
 
 OpenLocks &TheLocks() {
@@ -53,11 +66,14 @@ void AfterForkInParent() {
 }
 
 void AfterForkInChild() {
-    for (int fd : TheLocks().descriptors) {
-        close(fd);
+    OpenLocks &locks = TheLocks();
+    for (std::vector<OpenFile> *pFiles : {&locks.used, &locks.idle}) {
+        for (const OpenFile &file : *pFiles) {
+            close(file.fd);
+        }
+        pFiles->clear();
     }
-    TheLocks().descriptors.clear();
-    TheLocks().mutex.unlock();
+    locks.mutex.unlock();
 }
 
 bool FollowForks() {
@@ -66,66 +82,117 @@ bool FollowForks() {
     return blFollows;
 }
 
-// An open lock file. What is not handed out as a handle is closed.
+template <typename IsWanted>
+std::vector<OpenFile>::iterator FindFile(std::vector<OpenFile> &files, IsWanted isWanted) {
+    return std::find_if(files.begin(), files.end(), isWanted);
+}
+
+// A lock file that is opened, or has stayed open since the process held its lock before. What is
+// not handed out as a handle is closed.
 class LockFile {
   public:
-    explicit LockFile(const char *szPath) {
+    explicit LockFile(const char *szPath) : m_szPath(szPath) {
         if (!FollowForks()) {
             throw std::bad_alloc();
         }
         OpenLocks &locks = TheLocks();
         const std::lock_guard<std::mutex> guard(locks.mutex);
-        locks.descriptors.reserve(locks.descriptors.size() + 1);
-        m_fd =
-            open(szPath, O_RDWR | O_CREAT | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC, 0600);
+        locks.used.reserve(locks.used.size() + 1);
+        locks.idle.reserve(kMaxIdle);
+        const auto idle =
+            FindFile(locks.idle, [&](const OpenFile &file) { return file.strPath == szPath; });
+        m_blWasOpen = idle != locks.idle.end();
+        OpenFile file = m_blWasOpen ? std::move(*idle) : Open(szPath);
+        if (m_blWasOpen) {
+            locks.idle.erase(idle);
+        }
+        m_fd = file.fd;
+        m_statusAtOpen = file.status;
         if (m_fd >= 0) {
-            locks.descriptors.push_back(m_fd);
+            locks.used.push_back(std::move(file));
         }
     }
     LockFile(const LockFile &) = delete;
     LockFile &operator=(const LockFile &) = delete;
-    ~LockFile() { Close(m_fd); }
+    ~LockFile() { Release(m_fd, false); }
 
     int Get() const { return m_fd; }
+    const char *Path() const { return m_szPath; }
+    bool WasOpen() const { return m_blWasOpen; }
+    const struct stat &StatusAtOpen() const { return m_statusAtOpen; }
     int HandOut() { return std::exchange(m_fd, -1); }
 
-    static bool Close(int fd) {
+    // Ends the use of the descriptor, and with it the lock. False when it is no lock file's.
+    static bool Release(int fd, bool blStayOpen) {
         OpenLocks &locks = TheLocks();
         const std::lock_guard<std::mutex> guard(locks.mutex);
-        const auto it = std::find(locks.descriptors.begin(), locks.descriptors.end(), fd);
-        if (it == locks.descriptors.end()) {
+        const auto used = FindFile(locks.used, [&](const OpenFile &file) { return file.fd == fd; });
+        if (used == locks.used.end()) {
             return false;
         }
-        locks.descriptors.erase(it);
-        close(fd);
+        OpenFile file = std::move(*used);
+        locks.used.erase(used);
+        const bool blHasRoom =
+            locks.idle.size() < kMaxIdle && FindFile(locks.idle, [&](const OpenFile &other) {
+                                                return other.strPath == file.strPath;
+                                            }) == locks.idle.end();
+        if (blStayOpen && blHasRoom && flock(fd, LOCK_UN) == 0) {
+            locks.idle.push_back(std::move(file));
+        } else {
+            close(fd);
+        }
         return true;
     }
 
   private:
+    static OpenFile Open(const char *szPath) {
+        OpenFile file;
+        file.strPath = szPath;
+        file.fd =
+            open(szPath, O_RDWR | O_CREAT | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC, 0600);
+        if (file.fd >= 0 && fstat(file.fd, &file.status) != 0) {
+            close(std::exchange(file.fd, -1));
+        }
+        return file;
+    }
+
+    const char *m_szPath;
     int m_fd = -1;
+    bool m_blWasOpen = false;
+    struct stat m_statusAtOpen = {};
 };
 
 // What a try to lock an open lock file came to.
 enum class Try { kHeld, kHeldElsewhere, kRemoved, kUnsafe, kFailed };
 
-Try TryLock(int fd) {
-    const bool blHeld = flock(fd, LOCK_EX | LOCK_NB) == 0;
+bool IsSameFile(const struct stat &a, const struct stat &b) {
+    return a.st_ino == b.st_ino && a.st_dev == b.st_dev;
+}
+
+// Reads the status of the file as it is now. False when its name has gone, or leads to another
+// file.
+bool ReadStatus(const LockFile &file, struct stat &status) {
+    if (file.WasOpen()) {
+        return lstat(file.Path(), &status) == 0 && IsSameFile(status, file.StatusAtOpen());
+    }
+    return fstat(file.Get(), &status) == 0 && status.st_nlink > 0;
+}
+
+Try TryLock(const LockFile &file) {
+    const bool blHeld = flock(file.Get(), LOCK_EX | LOCK_NB) == 0;
     if (!blHeld && errno != EWOULDBLOCK) {
         return Try::kFailed;
     }
+    // A cleaner of old files may have been there. Whoever comes next creates a new lock file.
     struct stat status = {};
-    if (fstat(fd, &status) != 0) {
-        return Try::kFailed;
+    if (!ReadStatus(file, status)) {
+        return Try::kRemoved;
     }
     if (!host::IsOwnFile(status)) {
         return Try::kUnsafe;
     }
-    // A cleaner of old files may have been there. Whoever comes next creates a new lock file.
-    if (status.st_nlink == 0) {
-        return Try::kRemoved;
-    }
     // Whoever may open the file can lock it: nobody else may.
-    if (blHeld && (status.st_mode & 07777U) != 0600 && fchmod(fd, 0600) != 0) {
+    if (blHeld && (status.st_mode & 07777U) != 0600 && fchmod(file.Get(), 0600) != 0) {
         return Try::kFailed;
     }
     return blHeld ? Try::kHeld : Try::kHeldElsewhere;
@@ -134,12 +201,23 @@ Try TryLock(int fd) {
 // Only who is next in turn tries the lock itself. Without turns a process that takes the lock over
 // and over would get it each time before those who wait, and they would wait for ever. A turn goes
 // with the open lock file.
-bool TakeTurn(int fd, short type) {
+struct flock Turn(short type) {
     struct flock turn = {};
     turn.l_type = type;
     turn.l_whence = SEEK_SET;
     turn.l_len = 1;
+    return turn;
+}
+
+bool TakeTurn(int fd, short type) {
+    struct flock turn = Turn(type);
     return fcntl(fd, F_OFD_SETLK, &turn) == 0;
+}
+
+// Whether nobody waits.
+bool IsTurnFree(int fd) {
+    struct flock turn = Turn(F_WRLCK);
+    return fcntl(fd, F_OFD_GETLK, &turn) == 0 && turn.l_type == F_UNLCK;
 }
 
 // Waits a while, not beyond the end. False when the end has come.
@@ -153,16 +231,8 @@ bool Wait(Clock::time_point end, std::chrono::microseconds wait) {
 }
 
 // Waits for the turn and then for the lock.
-Try WaitForLock(int fd, Clock::time_point end) {
-    // What is refused is not waited for.
-    struct stat status = {};
-    if (fstat(fd, &status) != 0) {
-        return Try::kFailed;
-    }
-    if (!host::IsOwnFile(status)) {
-        return Try::kUnsafe;
-    }
-    for (std::chrono::microseconds wait = kFirstWait; !TakeTurn(fd, F_WRLCK);
+Try WaitForLock(const LockFile &file, Clock::time_point end) {
+    for (std::chrono::microseconds wait = kFirstWait; !TakeTurn(file.Get(), F_WRLCK);
          wait = std::min(2 * wait, kLastWait)) {
         if (errno != EAGAIN && errno != EACCES) {
             return Try::kFailed;
@@ -171,12 +241,27 @@ Try WaitForLock(int fd, Clock::time_point end) {
             return Try::kHeldElsewhere;
         }
     }
-    Try result = TryLock(fd);
+    Try result = TryLock(file);
     while (result == Try::kHeldElsewhere && Wait(end, kFirstWait)) {
-        result = TryLock(fd);
+        result = TryLock(file);
     }
-    static_cast<void>(TakeTurn(fd, F_UNLCK));
+    static_cast<void>(TakeTurn(file.Get(), F_UNLCK));
     return result;
+}
+
+// Takes the lock, at once where nobody waits for it.
+Try TakeLock(const LockFile &file, Clock::time_point end) {
+    // What is refused is not waited for.
+    if (!host::IsOwnFile(file.StatusAtOpen())) {
+        return Try::kUnsafe;
+    }
+    if (IsTurnFree(file.Get())) {
+        const Try result = TryLock(file);
+        if (result != Try::kHeldElsewhere) {
+            return result;
+        }
+    }
+    return WaitForLock(file, end);
 }
 
 int Lock(const char *szPath, int timeout_s, int &handle) {
@@ -187,7 +272,7 @@ int Lock(const char *szPath, int timeout_s, int &handle) {
         if (file.Get() < 0) {
             return HOST_FAIL(errno == ELOOP ? YLIBC_ERR_UNSAFE_FILE : YLIBC_ERR_FILE);
         }
-        const Try result = WaitForLock(file.Get(), end);
+        const Try result = TakeLock(file, end);
         switch (result) {
             case Try::kHeld:
                 handle = file.HandOut();
@@ -226,5 +311,5 @@ int YLIBCFileLockTimeByFile(const char *szLockFile, int /*flags*/, int timeout_s
 }
 
 int YLIBCFileUnlockByFile(int handle) {
-    return LockFile::Close(handle) ? 0 : HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
+    return LockFile::Release(handle, true) ? 0 : HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
 }
