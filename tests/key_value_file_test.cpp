@@ -2,12 +2,14 @@
 
 #include "key_value_file.h"
 
+#include <fcntl.h>
 #include <gtest/gtest.h>
 #include <sys/stat.h>
 #include <sys/syscall.h>
 
 #include <algorithm>
 #include <atomic>
+#include <chrono>
 #include <filesystem>
 #include <fstream>
 #include <set>
@@ -264,6 +266,35 @@ TEST_F(KeyValueFile, WritesOnlyWhatIsNewAndWaitsOnlyForWhatOutlivesARestart) {
         EXPECT_EQ(YLIBCFileRemoveKey(szPath, "absent"), 0);
         EXPECT_EQ(Status(szPath).st_ino, inode);
         EXPECT_EQ(g_syncs, syncs);
+    }
+}
+
+TEST_F(KeyValueFile, APairThatSomebodyElseHasChangedIsWrittenAgain) {
+    const std::pair<const char *, std::function<void()>> rows[] = {
+        {"overwritten, with the old size and time",
+         [] {
+             const struct stat before = Status(kFile);
+             Write(kFile, "k=\"b\"\n");
+             const timespec times[] = {before.st_atim, before.st_mtim};
+             utimensat(AT_FDCWD, kFile, times, 0);
+         }},
+        {"replaced",
+         [] {
+             Write(kTemporary, "k=\"b\"\n");
+             fs::rename(kTemporary, kFile);
+         }},
+        {"removed", [] { fs::remove(kFile); }},
+    };
+    for (const auto &[szHow, change] : rows) {
+        // Time and again, until the file has its content for longer than a step of its times.
+        EXPECT_EQ(SetValue(kFile, "k", "a"), 0);
+        const auto end = std::chrono::steady_clock::now() + std::chrono::milliseconds(30);
+        while (std::chrono::steady_clock::now() < end) {
+            EXPECT_EQ(SetValue(kFile, "k", "a"), 0);
+        }
+        change();
+        EXPECT_EQ(SetValue(kFile, "k", "a"), 0);
+        EXPECT_EQ(Value(kFile, "k"), "a") << szHow;
     }
 }
 

@@ -16,6 +16,7 @@
 #include <utility>
 #include <vector>
 
+#include "file_state.h"
 #include "last_error.h"
 #include "trusted_file.h"
 #include "waiting.h"
@@ -165,15 +166,11 @@ class LockFile {
 // What a try to lock an open lock file came to.
 enum class Try { kHeld, kHeldElsewhere, kRemoved, kUnsafe, kFailed };
 
-bool IsSameFile(const struct stat &a, const struct stat &b) {
-    return a.st_ino == b.st_ino && a.st_dev == b.st_dev;
-}
-
 // Reads the status of the file as it is now. False when its name has gone, or leads to another
 // file.
 bool ReadStatus(const LockFile &file, struct stat &status) {
     if (file.WasOpen()) {
-        return lstat(file.Path(), &status) == 0 && IsSameFile(status, file.StatusAtOpen());
+        return lstat(file.Path(), &status) == 0 && host::IsSameFile(status, file.StatusAtOpen());
     }
     return fstat(file.Get(), &status) == 0 && status.st_nlink > 0;
 }

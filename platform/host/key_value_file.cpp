@@ -8,6 +8,7 @@
 
 #include "../file_lock.h"
 #include "file_replacement.h"
+#include "file_state.h"
 #include "hash_place.h"
 #include "key_value_lookup.h"
 #include "last_error.h"
@@ -146,59 +147,89 @@ bool Read(const char *szPath, std::string &strText) {
     }
 }
 
-// The same for a file that may be missing: it then counts as empty.
-bool ReadForChange(const char *szPath, host::FoundFile &found, std::string &strText) {
-    const host::Find find = host::FindFile(szPath, found);
+// A file as it stands before a change.
+struct OldFile {
+    host::FoundFile found;
+    std::string strText;
+    bool blSettled = false;  // the text holds for as long as the file's status does
+};
+
+// Reads a file that may be missing: it then counts as empty.
+bool ReadForChange(const char *szPath, OldFile &old) {
+    const host::Find find = host::FindFile(szPath, old.found);
+    old.blSettled = host::IsSettled(old.found.status);
     const bool blRead = find == host::Find::kNoFile ||
-                        (find == host::Find::kFile && host::ReadContent(found, strText));
+                        (find == host::Find::kFile && host::ReadContent(old.found, old.strText));
     // A file system takes longer to replace a file that is still open.
-    found.file = host::FileDescriptor();
+    old.found.file = host::FileDescriptor();
     return blRead;
 }
 
+// The pair that this thread was to set last and found in place. What is reported over and over,
+// such as the status after each request, then costs a look at the file and not its reading.
+struct StandingPair {
+    std::string strPath;
+    std::string strKey;
+    std::string strValue;
+    struct stat status = {};
+};
+
+thread_local StandingPair t_standing;
+
+bool IsStanding(const char *szPath, std::string_view key, std::string_view value) {
+    struct stat status = {};
+    return t_standing.strPath == szPath && t_standing.strKey == key &&
+           t_standing.strValue == value && lstat(szPath, &status) == 0 &&
+           host::IsUnchanged(status, t_standing.status);
+}
+
 int SetValue(const char *szPath, std::string_view key, std::string_view value) {
-    host::FoundFile found;
-    std::string strOld;
-    if (!ReadForChange(szPath, found, strOld)) {
+    if (IsStanding(szPath, key, value)) {
+        return 0;
+    }
+    OldFile old;
+    if (!ReadForChange(szPath, old)) {
         return -1;
     }
     std::string strNew;
-    strNew.reserve(strOld.size() + key.size() + 2 * value.size() + sizeof("\n=\"\"\n"));
+    strNew.reserve(old.strText.size() + key.size() + 2 * value.size() + sizeof("\n=\"\"\n"));
     Line line;
-    std::string_view rest = strOld;
+    std::string_view rest = old.strText;
     if (TakeLineWithKey(rest, key, line)) {
         if (ValueOf(line.value) == value) {
+            if (old.blSettled && host::IsOwnFile(old.found.status)) {
+                t_standing = {szPath, std::string(key), std::string(value), old.found.status};
+            }
             return 0;
         }
-        strNew.assign(strOld, 0, strOld.size() - rest.size() - line.text.size());
+        strNew.assign(old.strText, 0, old.strText.size() - rest.size() - line.text.size());
     } else {
-        strNew.append(strOld);
+        strNew.append(old.strText);
         if (!strNew.empty() && strNew.back() != '\n') {
             strNew += '\n';
         }
     }
     AppendLine(strNew, key, value);
     strNew.append(rest);
-    return host::ReplaceFile(found, strNew);
+    return host::ReplaceFile(old.found, strNew);
 }
 
 int RemoveLines(const char *szPath, std::string_view key) {
-    host::FoundFile found;
-    std::string strOld;
-    if (!ReadForChange(szPath, found, strOld)) {
+    OldFile old;
+    if (!ReadForChange(szPath, old)) {
         return -1;
     }
     std::string strNew;
-    strNew.reserve(strOld.size());
+    strNew.reserve(old.strText.size());
     Line line;
-    std::string_view rest = strOld;
+    std::string_view rest = old.strText;
     std::string_view kept = rest;
     while (TakeLineWithKey(rest, key, line)) {
         strNew.append(kept, 0, kept.size() - rest.size() - line.text.size());
         kept = rest;
     }
     strNew.append(kept);
-    return strNew.size() == strOld.size() ? 0 : host::ReplaceFile(found, strNew);
+    return strNew.size() == old.strText.size() ? 0 : host::ReplaceFile(old.found, strNew);
 }
 
 int ReadPairs(const char *szPath, YLIBSZHASH **ppHash) {

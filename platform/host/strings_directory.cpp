@@ -6,10 +6,11 @@
 
 #include <algorithm>
 #include <cstddef>
-#include <ctime>
 #include <limits>
 #include <mutex>
 #include <utility>
+
+#include "file_state.h"
 
 namespace host::strings_directory {
 namespace {
@@ -52,50 +53,6 @@ void UnlockAfterFork() {
 }
 
 const int g_forkHandlers = pthread_atfork(LockBeforeFork, UnlockAfterFork, UnlockAfterFork);
-
-bool IsSameFile(const struct stat &a, const struct stat &b) {
-    return a.st_ino == b.st_ino && a.st_dev == b.st_dev;
-}
-
-bool IsSameTime(const timespec &a, const timespec &b) {
-    return a.tv_sec == b.tv_sec && a.tv_nsec == b.tv_nsec;
-}
-
-bool IsUnchanged(const struct stat &a, const struct stat &b) {
-    return IsSameFile(a, b) && a.st_size == b.st_size && IsSameTime(a.st_mtim, b.st_mtim) &&
-           IsSameTime(a.st_ctim, b.st_ctim);
-}
-
-// From a to b; differences of more than a few seconds are all the same.
-std::int64_t Nanoseconds(const timespec &a, const timespec &b) {
-    constexpr std::int64_t kFew = 8;
-    const std::int64_t seconds = std::clamp<std::int64_t>(b.tv_sec - a.tv_sec, -kFew, kFew);
-    return seconds * 1000000000 + b.tv_nsec - a.tv_nsec;
-}
-
-// The steps in which a file's times advance: the kernel's ticks, or two seconds in a file system
-// that keeps no fractions.
-std::int64_t TimeStep(const timespec &time) {
-    timespec tick = {};
-    clock_getres(CLOCK_REALTIME_COARSE, &tick);
-    return time.tv_nsec == 0 ? Nanoseconds({0, 0}, {2, 0}) : 2 * Nanoseconds({0, 0}, tick);
-}
-
-// Reads the file's state. blSettled says whether a later change will show in it: a file that has
-// just been changed can be changed again within the same step of time.
-bool ReadState(int fd, struct stat &state, bool &blSettled) {
-    timespec before = {};
-    timespec after = {};
-    clock_gettime(CLOCK_REALTIME, &before);
-    if (fstat(fd, &state) != 0) {
-        return false;
-    }
-    clock_gettime(CLOCK_REALTIME, &after);
-    const std::int64_t step = TimeStep(state.st_ctim);
-    blSettled =
-        Nanoseconds(state.st_ctim, before) > step || Nanoseconds(after, state.st_ctim) > step;
-    return true;
-}
 
 // Takes the place of the same file's former directory, a new one, or the one used least recently.
 void Keep(const DirectoryHandle &pDirectory) {
@@ -216,10 +173,12 @@ DirectoryHandle Get(int fd) {
 
 DirectoryHandle Extend(int fd, const Directory &directory, std::string_view section) {
     struct stat state = {};
-    bool blSettled = false;
     const auto pDirectory = Copy(directory);
-    if (!ReadState(fd, state, blSettled) || !IsUnchanged(state, pDirectory->file) ||
-        !ReadOn(fd, Hash(section), *pDirectory)) {
+    if (fstat(fd, &state) != 0 || !IsUnchanged(state, pDirectory->file)) {
+        return nullptr;
+    }
+    const bool blSettled = IsSettled(state);
+    if (!ReadOn(fd, Hash(section), *pDirectory)) {
         return nullptr;
     }
     pDirectory->entries.shrink_to_fit();
