@@ -7,6 +7,7 @@
 #include "joined_server.h"
 #include "json_text.h"
 #include "platform_handles.h"
+#include "server_request.h"
 #include "zeloqrmclient.h"
 
 namespace qrmctl {
@@ -102,9 +103,8 @@ ExitCode Push(const Options &options, Report &report) {
     const char *szSection = options.strSection == "-" ? nullptr : options.strSection.c_str();
     if (ZELOQRMClientLog(level, szSection, options.strKey.c_str(), params.Get(),
                          options.blExtraInfo ? options.strExtraInfo.c_str() : nullptr) != 0) {
-        return report.FailExchange(
-            ErrorId::kLogNotConfirmed,
-            "the server has not confirmed the log entry: run 'qrmctl doctor'; -v shows the reason");
+        return FailRequest(ErrorId::kLogNotConfirmed, "the server has not confirmed the log entry",
+                           ": run 'qrmctl doctor'; -v shows the reason", report);
     }
     report.Say("The server has the log entry.");
     return report.Done();

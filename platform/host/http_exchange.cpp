@@ -379,6 +379,7 @@ int Transact(const HttpRequest &request, CURL *pEasy, HttpReply &reply) {
     const Waiting waiting({"asking '", ServerOf(request.strUrl), "'"});
     const CURLcode result = curl_easy_perform(pEasy);
     curl_easy_getinfo(pEasy, CURLINFO_RESPONSE_CODE, &reply.status);
+    reply.strBody.swap(transfer.sink.Body());
     if (transfer.blStopped) {
         return Fail(ZELO::CRED_REQ_ERR_STOPPED, request, "the program ended it", __LINE__);
     }
@@ -391,7 +392,6 @@ int Transact(const HttpRequest &request, CURL *pEasy, HttpReply &reply) {
         return Fail(ZELO::CRED_REQ_ERR_NETWORK, request,
                     reason[0] != '\0' ? reason.data() : curl_easy_strerror(result), __LINE__);
     }
-    reply.strBody.swap(sink.Body());
     return ZELO::CRED_REQ_ERR_NONE;
 }
 
