@@ -140,6 +140,15 @@ TEST_F(QrmctlCall, ALogEntryAndAnIdleTimeAreTakenAsTheyAreTyped) {
     Run({"log", "9", "-", "text"}, 1);
     EXPECT_EQ(Run({"log", "err", "nosuch", "text"}, 1)["error_id"], "no-such-text");
     EXPECT_EQ(s_pServer->Log().size(), 1U);
+    const std::string strLong(3000, 'x');
+    for (const Arguments &texts :
+         {Arguments{strLong + strLong}, {"{0}", strLong + strLong}, {"{0}{0}", strLong}}) {
+        Arguments command = {"log", "err", "-"};
+        command.insert(command.end(), texts.begin(), texts.end());
+        const Json::Value warnings = Run(command, 0)["warnings"];
+        EXPECT_NE(warnings[0].asString().find("6000 bytes"), std::string::npos);
+        EXPECT_EQ(warnings.size(), 1U);
+    }
 
     for (const char *szTime : {"0", "525600"}) {
         Run({"idle", "set", szTime}, 0);
