@@ -1,23 +1,22 @@
 // qrmctl call and update: requests to the joined server.
 
-#include <limits>
 #include <memory>
 
 #include "commands.h"
 #include "input_file.h"
 #include "joined_server.h"
 #include "json_text.h"
-#include "lost_reply.h"
+#include "server_request.h"
+#include "web_api_request.h"
 #include "zeloqrmclient.h"
 
 namespace qrmctl {
 namespace {
 
+using ZELO::CredRequestUtil::LatestAnswer;
+
 struct Options {
-    std::string strApi;
-    std::string strMethod;
-    int version = 1;
-    std::string strParams;
+    ApiCall call;
     bool blCached = false;
     std::string strHost;
 };
@@ -26,7 +25,7 @@ ExitCode Call(const Options &options, Report &report) {
     Json::Value params;
     std::string strError;
     Report::Stage("reading the parameters");
-    if (!ReadParams(options.strParams, params, strError)) {
+    if (!ReadParams(options.call.strParams, params, strError)) {
         return report.Fail(ErrorId::kBadInput, strError);
     }
     ExitCode code = kFailed;
@@ -34,20 +33,29 @@ ExitCode Call(const Options &options, Report &report) {
     if (!server) {
         return code;
     }
-    Report::Stage("calling " + options.strApi + ' ' + options.strMethod + " at " +
-                  server->Address());
+    const ApiCall &call = options.call;
+    Report::Stage("calling " + call.strApi + ' ' + call.strMethod + " at " + server->Address());
     Json::Value reply;
-    if (ZELOQRMClientSendWebapi(reply, options.strApi, options.version, options.strMethod, params,
+    if (ZELOQRMClientSendWebapi(reply, call.strApi, call.version, call.strMethod, params,
                                 options.blCached) != 0) {
-        return FailRequest(ErrorId::kNoReply,
-                           "no usable reply from the server at " + server->Address() +
-                               ": run 'qrmctl doctor', which tries the way to it step by step; -v "
-                               "shows the reason",
-                           *server, options.strApi, report);
+        // A code without a reply comes of the look for the API's path.
+        return LatestAnswer().errorCode != 0
+                   ? FailRequest(ErrorId::kRefused,
+                                 "the server does not serve the API '" + call.strApi + '\'', "",
+                                 report)
+                   : FailRequest(ErrorId::kNoReply,
+                                 "no usable reply from the server at " + server->Address(),
+                                 ": run 'qrmctl doctor', which tries the way to it step by step; "
+                                 "-v shows the reason",
+                                 report);
     }
     report.Document("reply", reply);
     if (!json_text::IsTrue(json_text::Member(reply, "success"))) {
-        return FailRefused(reply, "the call", report);
+        const int code = json_text::ErrorCode(reply);
+        report.Member("server_code", code);
+        report.Member("server_error", ServerErrorName(code));
+        return FailRequest(ErrorId::kRefused, "the server refused the call",
+                           ", and its reply has no error code", report);
     }
     return report.Done();
 }
@@ -64,11 +72,13 @@ ExitCode Update(const Options &options, Report &report) {
     }
     Report::Stage("updating this appliance's entry at " + server->Address());
     if (ZELOQRMClientSendSetClient(info) != 0) {
+        constexpr int kNoSuchApi = 102;
         return FailRequest(
-            ErrorId::kUpdateFailed,
-            "the server did not take the update, or a fact of this appliance is missing: run "
-            "'qrmctl doctor'; -v shows the reason",
-            *server, "ZELO.QRM.RPC.ClientInfo", report);
+            LatestAnswer().errorCode == kNoSuchApi ? ErrorId::kRefused : ErrorId::kUpdateFailed,
+            "the server did not take the update",
+            ", or a fact of this appliance is missing: run 'qrmctl doctor'; -v "
+            "shows the reason",
+            report);
     }
     report.Say("The server's entry for this appliance is up to date.");
     return report.Done();
@@ -79,16 +89,7 @@ ExitCode Update(const Options &options, Report &report) {
 void AddCall(CommandHandle program, Action &action) {
     const CommandHandle command = program.Add("call", "Call a Web API of the joined server");
     const auto pOptions = std::make_shared<Options>();
-    command.Text("API", pOptions->strApi, "Web API, such as ZELO.QRM.RPC").Required();
-    command.Text("METHOD", pOptions->strMethod, "Its method").Required();
-    command.Number("--version", pOptions->version, "Version of the API")
-        .ValueName("N")
-        .Between(1, std::numeric_limits<int>::max())
-        .ShowsDefault();
-    command
-        .Text("--params", pOptions->strParams,
-              "Parameters: a JSON object, or @FILE with one (@- for standard input)")
-        .ValueName("JSON");
+    AddApiCall(command, pOptions->call);
     command.Flag("--cached", pOptions->blCached,
                  "Use the records that this process has loaded before");
     command.RunsWhenChosen([pOptions, &action] {

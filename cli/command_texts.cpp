@@ -54,7 +54,8 @@ constexpr Text kTexts[] = {
      "    --params '{\"name\": \"update\", \"size\": 100000}'"},
     {"log",
      "The message is sent in every language of the interface, its markers {0}, {1} and so on "
-     "filled with the parameters. A parameter may name an interface text, as {section:key}.",
+     "filled with the parameters. A parameter may name an interface text, as {section:key}. "
+     "A warning says what does not fit into the 4095 bytes of a message.",
      "qrmctl log warning - 'Disk {0} is warm' 3\n"
      "qrmctl log --render info common ok"},
     {"info",

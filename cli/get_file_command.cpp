@@ -10,7 +10,6 @@
 #include <cstdlib>
 #include <cstring>
 #include <filesystem>
-#include <limits>
 #include <memory>
 
 #include "commands.h"
@@ -19,6 +18,7 @@
 #include "joined_server.h"
 #include "last_error.h"
 #include "progress.h"
+#include "server_request.h"
 #include "web_api_request.h"
 #include "work_folder.h"
 #include "zeloqrmclient.h"
@@ -30,10 +30,7 @@ namespace fs = std::filesystem;
 
 struct Options {
     std::string strPath;
-    std::string strApi;
-    std::string strMethod;
-    int version = 1;
-    std::string strParams;
+    ApiCall call;
     bool blInPlace = false;
 };
 
@@ -75,12 +72,12 @@ bool Observe(void *pContext, long long cbWritten, long long cbExpected) {
 
 enum class Outcome { kFetched, kUnchanged, kFailed };
 
-Outcome Fetch(const std::string &strPath, const Options &options, Json::Value &params,
+Outcome Fetch(const std::string &strPath, const ApiCall &call, Json::Value &params,
               Progress &progress) {
     ZELO::CredRequestUtil::SetProgressObserver(Observe, &progress);
     YLIBCErrSetEx(YLIBC_ERR_NONE, "", 0);
     const int result =
-        ZELOQRMClientGetFile(strPath, options.strApi, options.version, options.strMethod, params);
+        ZELOQRMClientGetFile(strPath, call.strApi, call.version, call.strMethod, params);
     ZELO::CredRequestUtil::SetProgressObserver(nullptr, nullptr);
     progress.Clear();
     if (result != 0) {
@@ -94,11 +91,11 @@ ExitCode Tell(Outcome outcome, const std::string &strPath, const Progress &progr
     if (outcome == Outcome::kFailed) {
         return g_interrupted != 0
                    ? report.Fail(ErrorId::kInterrupted, "interrupted")
-                   : report.FailExchange(
-                         ErrorId::kFetchFailed,
-                         "the file could not be fetched: can this appliance reach the "
-                         "server ('qrmctl doctor' says), does that have the file, and is "
-                         "there room for it? -v shows the reason");
+                   : FailRequest(ErrorId::kFetchFailed,
+                                 "the file could not be fetched from the server",
+                                 ": can this appliance reach it ('qrmctl doctor' says), does it "
+                                 "have the file, and is there room for it? -v shows the reason",
+                                 report);
     }
     report.Fact("path", strPath);
     report.Fact("unchanged", outcome == Outcome::kUnchanged);
@@ -153,8 +150,8 @@ bool PutInPlace(const std::string &strFile, const fs::path &destination) {
     return blDurable && std::rename(strFile.c_str(), destination.c_str()) == 0;
 }
 
-std::string FetchStage(const Options &options, const JoinedServer &server) {
-    return "fetching the file from " + options.strApi + ' ' + options.strMethod + " at " +
+std::string FetchStage(const ApiCall &call, const JoinedServer &server) {
+    return "fetching the file from " + call.strApi + ' ' + call.strMethod + " at " +
            server.Address();
 }
 
@@ -177,9 +174,9 @@ ExitCode GetBeside(const Options &options, const JoinedServer &server, Json::Val
         return report.Fail(ErrorId::kBadDestination, "cannot write beside '" + options.strPath +
                                                          "': " + std::strerror(workplace.Error()));
     }
-    Report::Stage(FetchStage(options, server));
+    Report::Stage(FetchStage(options.call, server));
     Progress progress(!report.IsJson());
-    const Outcome outcome = Fetch(workplace.Path("file"), options, params, progress);
+    const Outcome outcome = Fetch(workplace.Path("file"), options.call, params, progress);
     Report::Stage("putting the file in place");
     if (outcome == Outcome::kFetched && !PutInPlace(workplace.Path("file"), destination)) {
         return report.Fail(ErrorId::kNotReplaced, "cannot replace '" + options.strPath + "': " +
@@ -192,7 +189,7 @@ ExitCode GetFile(const Options &options, Report &report) {
     Json::Value params;
     std::string strError;
     Report::Stage("reading the parameters");
-    if (!ReadParams(options.strParams, params, strError)) {
+    if (!ReadParams(options.call.strParams, params, strError)) {
         return report.Fail(ErrorId::kBadInput, strError);
     }
     ExitCode code = kFailed;
@@ -203,11 +200,11 @@ ExitCode GetFile(const Options &options, Report &report) {
     if (!options.blInPlace) {
         return GetBeside(options, *server, params, report);
     }
-    Report::Stage(FetchStage(options, *server));
+    Report::Stage(FetchStage(options.call, *server));
     Report::Remedy("'" + options.strPath + "' holds what had arrived; fetch it again");
     Progress progress(!report.IsJson());
     const InterruptGuard guard;
-    const Outcome outcome = Fetch(options.strPath, options, params, progress);
+    const Outcome outcome = Fetch(options.strPath, options.call, params, progress);
     if (outcome == Outcome::kUnchanged) {
         report.Warn("the copy at '" + options.strPath + "' was current, and is empty now");
     }
@@ -220,16 +217,7 @@ void AddGetFile(CommandHandle program, Action &action) {
     const CommandHandle command = program.Add("get-file", "Fetch a file from the joined server");
     const auto pOptions = std::make_shared<Options>();
     command.Text("PATH", pOptions->strPath, "Where to put the file").ValueName("FILE").Required();
-    command.Text("API", pOptions->strApi, "Web API that sends it").Required();
-    command.Text("METHOD", pOptions->strMethod, "Its method").Required();
-    command.Number("--version", pOptions->version, "Version of the API")
-        .ValueName("N")
-        .Between(1, std::numeric_limits<int>::max())
-        .ShowsDefault();
-    command
-        .Text("--params", pOptions->strParams,
-              "Parameters: a JSON object, or @FILE with one (@- for standard input)")
-        .ValueName("JSON");
+    AddApiCall(command, pOptions->call);
     command.Flag("--in-place", pOptions->blInPlace, "Write to PATH itself, which is emptied first");
     command.RunsWhenChosen([pOptions, &action] {
         action = [pOptions](Report &report) { return GetFile(*pOptions, report); };

@@ -16,6 +16,8 @@
 #include "json_text.h"
 #include "key_value_file.h"
 #include "membership.h"
+#include "server_request.h"
+#include "web_api_request.h"
 #include "zeloqrmclient.h"
 
 namespace qrmctl {
@@ -124,8 +126,8 @@ std::vector<Step> Steps(const Json::Value &joinInfo) {
     const std::string strSerial = joinInfo["sn"].asString();
     return {
         {"joining: the server's answer",
-         "the server did not accept the join (check token and serial number), gave no reply (see "
-         "'qrmctl doctor'), or its address could not be stored; -v shows which",
+         "the server gave no usable reply to the join (see 'qrmctl doctor'), or its address could "
+         "not be stored; -v shows which",
          [&joinInfo] { return ZELOQRMClientSendCreateClient(joinInfo) == 0; }},
         {"storing the serial number", "the serial number could not be stored",
          [strSerial] { return StoreSerial(strSerial); }},
@@ -152,7 +154,19 @@ bool Undo() {
     return LeaveWholly(request) && LeaveWholly(LeaveRequest());
 }
 
-ExitCode FailAndUndo(const std::string &strError, Report &report) {
+ExitCode FailAndUndo(const char *szFailed, bool blJoined, Report &report) {
+    std::string strError = szFailed;
+    std::string strAnswer;
+    // The join itself is the one step that asks the server.
+    if (FindRefusal(report, strAnswer)) {
+        strError = "the server did not accept the join: it answered with " + strAnswer;
+        if (ZELO::CredRequestUtil::LatestAnswer().errorCode != 0) {
+            strError += "; check token and serial number";
+        }
+    }
+    if (blJoined) {
+        strError += "; the membership before has ended";
+    }
     return Undo() ? report.Fail(ErrorId::kJoinFailed, strError + "; nothing of it stays stored")
                   : report.Fail(ErrorId::kJoinNotUndone,
                                 strError +
@@ -187,9 +201,7 @@ ExitCode Enrol(const Json::Value &joinInfo, bool blJoined, Report &report) {
     for (const Step &step : Steps(joinInfo)) {
         Report::Stage(step.szStage);
         if (!step.Take()) {
-            const std::string strBefore =
-                blJoined ? std::string("; the membership before has ended") : std::string();
-            return FailAndUndo(step.szFailed + strBefore, report);
+            return FailAndUndo(step.szFailed, blJoined, report);
         }
     }
     TellServer(joinInfo["sn"], report);

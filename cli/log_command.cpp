@@ -1,5 +1,6 @@
 // qrmctl log: pushes a log entry to the joined server, or shows what it would say.
 
+#include <algorithm>
 #include <memory>
 #include <vector>
 
@@ -7,6 +8,7 @@
 #include "joined_server.h"
 #include "json_text.h"
 #include "platform_handles.h"
+#include "server_request.h"
 #include "zeloqrmclient.h"
 
 namespace qrmctl {
@@ -56,6 +58,58 @@ bool Convert(const Options &options, YLIBSZLIST *pslParams, Json::Value &texts) 
     return ConvertLog(szSection, options.strKey.c_str(), pslParams, texts) == 0;
 }
 
+// The library cuts a text to so many bytes, and leaves a marker whose parameter does not fit.
+constexpr std::size_t kMaxText = 4095;
+
+void WarnOfCut(const std::string &strWhat, const std::string &strText, Report &report) {
+    if (strText.size() > kMaxText) {
+        report.Warn(strWhat + " has " + std::to_string(strText.size()) +
+                    " bytes: it is cut to at most " + std::to_string(kMaxText));
+    }
+}
+
+// How long the text would be with the value in place of the markers that are still in it.
+std::size_t SizeFilled(const std::string &strText, const std::string &strMarker,
+                       const std::string &strValue) {
+    std::size_t cb = strText.size();
+    for (std::size_t at = 0; (at = strText.find(strMarker, at)) != std::string::npos;
+         at += strMarker.size()) {
+        cb = cb - strMarker.size() + strValue.size();
+    }
+    return cb;
+}
+
+void WarnOfLeftMarker(const std::string &strMarker, const Json::Value &texts,
+                      const Json::Value &values, Report &report) {
+    std::size_t cb = 0;
+    const std::vector<std::string> languages = texts.getMemberNames();
+    const auto language =
+        std::find_if(languages.begin(), languages.end(), [&](const std::string &strLanguage) {
+            cb = SizeFilled(texts[strLanguage].asString(), strMarker,
+                            json_text::Member(values, strLanguage.c_str()).asString());
+            return cb > kMaxText;
+        });
+    if (language != languages.end()) {
+        report.Warn("with the parameter of " + strMarker + " the message has " +
+                    std::to_string(cb) + " bytes in '" + *language + "', more than " +
+                    std::to_string(kMaxText) + ": the marker is left in it");
+    }
+}
+
+void WarnOfLosses(const Options &options, const Json::Value &texts, YLIBSZLIST *pslParams,
+                  Report &report) {
+    if (options.strSection == "-") {
+        WarnOfCut("the message", options.strKey, report);
+    }
+    for (std::size_t i = 0; i < options.params.size(); ++i) {
+        const std::string strMarker = '{' + std::to_string(i) + '}';
+        WarnOfCut("the parameter of " + strMarker, options.params[i], report);
+        Json::Value values;  // the parameter alone, as each language has it
+        static_cast<void>(ConvertLog(nullptr, strMarker.c_str(), pslParams, values));
+        WarnOfLeftMarker(strMarker, texts, values, report);
+    }
+}
+
 ExitCode Render(const Json::Value &texts, Report &report) {
     if (report.IsJson()) {
         report.Fact("log", texts);
@@ -94,6 +148,7 @@ ExitCode Push(const Options &options, Report &report) {
                                                      "' in the section '" + options.strSection +
                                                      "', nothing was sent");
     }
+    WarnOfLosses(options, texts, params.Get(), report);
     if (options.blRender) {
         return Render(texts, report);
     }
@@ -102,9 +157,8 @@ ExitCode Push(const Options &options, Report &report) {
     const char *szSection = options.strSection == "-" ? nullptr : options.strSection.c_str();
     if (ZELOQRMClientLog(level, szSection, options.strKey.c_str(), params.Get(),
                          options.blExtraInfo ? options.strExtraInfo.c_str() : nullptr) != 0) {
-        return report.FailExchange(
-            ErrorId::kLogNotConfirmed,
-            "the server has not confirmed the log entry: run 'qrmctl doctor'; -v shows the reason");
+        return FailRequest(ErrorId::kLogNotConfirmed, "the server has not confirmed the log entry",
+                           ": run 'qrmctl doctor'; -v shows the reason", report);
     }
     report.Say("The server has the log entry.");
     return report.Done();

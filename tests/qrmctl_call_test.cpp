@@ -71,6 +71,49 @@ TEST_F(QrmctlCall, ACallPrintsTheReplyAndSaysWhetherItSucceeded) {
     Run({"notify", "QRMClientDetachSuccess", "novalue"}, 1);
 }
 
+TEST_F(QrmctlCall, ARefusalIsToldWithTheServersCodeAndStatus) {
+    std::ofstream("/tmp/token") << joined::kToken;
+    Arguments join = {"join",         "--server",   "localhost", "--http-port", "0",
+                      "--token-file", "/tmp/token", "--again",   "--https-port"};
+    join.push_back(std::to_string(s_pServer->HttpsPort()));
+    const std::string strRefusal = R"({"success":false,"error":{"code":105}})";
+    const Arguments call = {"call", "ZELO.QRM.RPC", "info"};
+    const Arguments log = {"log", "err", "-", "text"};
+    const struct {
+        Arguments arguments;
+        const char *szApi;
+        const char *szMethod;
+        int status;
+        std::string strBody;
+        const char *szErrorId;
+        Json::Value serverCode;  // null: none
+    } rows[] = {
+        {call, "ZELO.QRM.RPC", "info", 403, "<html>", "no-reply", {}},
+        {call, "ZELO.QRM.RPC", "info", 500, "{}", "refused", 0},
+        {call, "ZELO.QRM.RPC", "info", 200, "<html>", "no-reply", {}},
+        {call, "ZELO.QRM.RPC", "discover", 503, "", "no-reply", {}},
+        {log, "ZELO.QRM.RPC.Log", "push", 200, strRefusal, "log-not-confirmed", 105},
+        {log, "ZELO.QRM.RPC.Log", "push", 403, "", "log-not-confirmed", {}},
+        {GetFile(), kFileApi, "get", 403, strRefusal, "fetch-failed", 105},
+        {GetFile(), kFileApi, "get", 500, std::string(70000, ' '), "fetch-failed", {}},
+        {{"update"}, "ZELO.QRM.RPC.ClientInfo", "update", 200, strRefusal, "update-failed", 105},
+        {join, "ZELO.QRM.RPC", "join", 200, strRefusal, "join-failed", 105}};
+    for (const auto &row : rows) {
+        SCOPED_TRACE(testing::PrintToString(row.arguments) + std::to_string(row.status));
+        devserver::NextAnswer answer;
+        answer.method = row.szMethod;
+        answer.status = row.status;
+        answer.body = row.strBody;
+        s_pServer->AnswerNext(row.szApi, answer);
+        const Json::Value result = Run(row.arguments, 1);
+        EXPECT_EQ(result["error_id"], row.szErrorId);
+        EXPECT_EQ(result["server_code"], row.serverCode);
+        EXPECT_EQ(result["http_status"], row.status == 200 ? Json::Value() : row.status);
+        const std::string strCode = result["server_code"].asString();
+        EXPECT_NE(result["error"].asString().find(strCode), std::string::npos);
+    }
+}
+
 TEST_F(QrmctlCall, WithoutAServerEveryRequestSaysToJoin) {
     fs::remove_all(stored::kFolder);
     for (const Arguments &arguments :
@@ -97,6 +140,15 @@ TEST_F(QrmctlCall, ALogEntryAndAnIdleTimeAreTakenAsTheyAreTyped) {
     Run({"log", "9", "-", "text"}, 1);
     EXPECT_EQ(Run({"log", "err", "nosuch", "text"}, 1)["error_id"], "no-such-text");
     EXPECT_EQ(s_pServer->Log().size(), 1U);
+    const std::string strLong(3000, 'x');
+    for (const Arguments &texts :
+         {Arguments{strLong + strLong}, {"{0}", strLong + strLong}, {"{0}{0}", strLong}}) {
+        Arguments command = {"log", "err", "-"};
+        command.insert(command.end(), texts.begin(), texts.end());
+        const Json::Value warnings = Run(command, 0)["warnings"];
+        EXPECT_NE(warnings[0].asString().find("6000 bytes"), std::string::npos);
+        EXPECT_EQ(warnings.size(), 1U);
+    }
 
     for (const char *szTime : {"0", "525600"}) {
         Run({"idle", "set", szTime}, 0);

@@ -277,7 +277,7 @@ TEST_F(Qrmctl, AJoinIsStoredWholeOrNotAtAll) {
         const char *szRequests;
     } rows[] = {
         {Join(s_strHttp, s_strHttps), "", strSecure, szSecure},
-        {Join("0", s_strHttps, "wrong"), "check token", "", szSecure},
+        {Join("0", s_strHttps, "wrong"), "(wrong-token); check token", "", szSecure},
         {Join("0", "1"), "nothing was changed", "", ""},
         {Join(s_strHttp, "0"), "--allow-http", "", ""},
         {Join(s_strHttp, s_strHttp), "check address", "", ""},

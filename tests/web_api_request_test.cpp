@@ -202,6 +202,7 @@ TEST_F(Request, PathsAreLearntOnceAndForgottenWhenTheyAreGone) {
     };
     call(200);
     call(404);
+    EXPECT_EQ(ZELO::CredRequestUtil::LatestAnswer().httpStatus, 404);
     EXPECT_EQ(m_pServer->Requests().size(), 3U) << "one discovery, two calls";
     call(200);
     EXPECT_EQ(m_pServer->Requests().size(), 5U) << "asked again after the 404";
@@ -223,6 +224,7 @@ TEST_F(Request, TheCallersTimeLimitEndsAnExchange) {
     answer.delay_ms = 30000;
     m_pServer->AnswerNext(kApi, answer);
     EXPECT_FALSE(request.Process(true, 1));
+    EXPECT_EQ(ZELO::CredRequestUtil::LatestAnswer().httpStatus, 0) << "none arrived";
     EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_NETWORK));
 }
 

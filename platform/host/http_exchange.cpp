@@ -386,6 +386,7 @@ int Transact(const HttpRequest &request, Connection &connection, HttpReply &repl
     const Waiting waiting({"asking '", ServerOf(request.strUrl), "'"});
     const CURLcode result = curl_easy_perform(pEasy);
     curl_easy_getinfo(pEasy, CURLINFO_RESPONSE_CODE, &reply.status);
+    reply.strBody.swap(transfer.sink.Body());
     if (transfer.blStopped) {
         return Fail(ZELO::CRED_REQ_ERR_STOPPED, request, "the program ended it", __LINE__);
     }
@@ -400,7 +401,6 @@ int Transact(const HttpRequest &request, Connection &connection, HttpReply &repl
             connection.reason[0] != '\0' ? connection.reason.data() : curl_easy_strerror(result),
             __LINE__);
     }
-    reply.strBody.swap(sink.Body());
     return ZELO::CRED_REQ_ERR_NONE;
 }
 

@@ -42,8 +42,8 @@ struct HttpReply {
 // Performs the exchange. Returns CRED_REQ_ERR_NONE when a whole reply arrived, whatever its status
 // (with a stream: one of 2xx, and written whole). Otherwise returns another value of
 // CRED_REQ_ERROR, sets the last error and writes one log line with the URL and the reason; reply
-// then holds the status as far as there was one. That the caller's copy is current is worth no log
-// line.
+// then holds the status, and what came of the body into memory, as far as there was one. That the
+// caller's copy is current is worth no log line.
 int Perform(const HttpRequest &request, HttpReply &reply);
 
 // Builds an URL; the host may be a name, an IPv4 or an IPv6 address, the query empty or

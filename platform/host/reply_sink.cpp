@@ -8,6 +8,7 @@ namespace host {
 namespace {
 
 constexpr std::size_t kMaxBody = 16UL * 1024 * 1024;
+constexpr std::size_t kMaxEnvelope = 64UL * 1024;
 constexpr long kStatusUnchanged = 304;
 
 bool IsSuccess(long status) {
@@ -43,8 +44,12 @@ bool ReplySink::Take(const char *pData, std::size_t cb, long status) noexcept {
         return Keep(pData, cb);
     }
     if (!IsSuccess(status)) {
-        // An error page is read to its end, so that the connection stays usable, but not for ever.
+        // An error page is read to its end, so that the connection stays usable, but not for ever;
+        // its beginning may say why.
         m_cbPassedOver += cb;
+        if (m_cbPassedOver <= kMaxEnvelope && !Keep(pData, cb)) {
+            return false;
+        }
         return m_cbPassedOver <= kMaxBody ||
                Fail(ZELO::CRED_REQ_ERR_STATUS, "the server answered with an error, without end");
     }

@@ -30,6 +30,8 @@ class ReplySink {
     const std::string &Reason() const { return m_strReason; }
 
     long long Written() const { return m_cbWritten; }
+
+    // What is in memory: the body, or with a stream the beginning of an error page.
     std::string &Body() { return m_strBody; }
 
   private:

@@ -133,6 +133,28 @@ struct Observer {
 
 thread_local Observer t_observer;
 
+// Of no type that is destroyed with its thread: requests may be sent until the very end.
+thread_local CredRequestUtil::Answer t_answer;
+
+// Hardly any reply of a call that went well speaks of an error: those are not read twice.
+int RefusalCode(const std::string &strBody) {
+    Json::Value envelope;
+    return strBody.find("\"error\"") != std::string::npos &&
+                   json_text::FromString(strBody, envelope) &&
+                   !json_text::IsTrue(json_text::Member(envelope, "success"))
+               ? json_text::ErrorCode(envelope)
+               : 0;
+}
+
+// Performs the exchange, and keeps what the thread may be asked for.
+int Ask(const host::HttpRequest &request, host::HttpReply &reply) {
+    t_answer = {};
+    const int result = host::Perform(request, reply);
+    t_answer.httpStatus = static_cast<int>(reply.status);
+    t_answer.errorCode = RefusalCode(reply.strBody);
+    return result;
+}
+
 // A server without a path for the API: says why. The query names nothing that helps, and it came
 // from a caller.
 std::string NoPath(const std::string &strUrl, const std::string &strReason, int line) {
@@ -155,7 +177,7 @@ std::string Discover(const Server &server, const std::string &api) {
         HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
         return {};
     }
-    if (host::Perform(request, reply) != CRED_REQ_ERR_NONE) {
+    if (Ask(request, reply) != CRED_REQ_ERR_NONE) {
         return {};
     }
     if (reply.status != kStatusOk) {
@@ -272,11 +294,13 @@ struct CredRequest::Impl {
             return CRED_REQ_ERR_ARGUMENT;
         }
         host::HttpReply reply;
-        const int result = host::Perform(request, reply);
+        const int result = Ask(request, reply);
         if (reply.status == kStatusNotFound) {
             Paths().Forget(strPathKey);
         }
-        strResponse.swap(reply.strBody);
+        if (result == CRED_REQ_ERR_NONE) {
+            strResponse.swap(reply.strBody);
+        }
         return result;
     }
 };
@@ -301,6 +325,10 @@ bool CredRequestUtil::SetWebAPIURL(const ZELO_CRED *pCred, const std::string &ap
 
 void CredRequestUtil::SetProgressObserver(ProgressObserver pfnObserver, void *pContext) {
     t_observer = {pfnObserver, pContext};
+}
+
+CredRequestUtil::Answer CredRequestUtil::LatestAnswer() {
+    return t_answer;
 }
 
 CredRequest *CredRequest::CreateWebAPIRequest(const ZELO_CRED *pCred, const ZELO_CRED_SESS *pSess,

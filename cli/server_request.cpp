@@ -1,0 +1,48 @@
+#include "server_request.h"
+
+#include <limits>
+
+#include "web_api_request.h"
+
+namespace qrmctl {
+
+void AddApiCall(CommandHandle command, ApiCall &call) {
+    command.Text("API", call.strApi, "Web API, such as ZELO.QRM.RPC").Required();
+    command.Text("METHOD", call.strMethod, "Its method").Required();
+    command.Number("--version", call.version, "Version of the API")
+        .ValueName("N")
+        .Between(1, std::numeric_limits<int>::max())
+        .ShowsDefault();
+    command
+        .Text("--params", call.strParams,
+              "Parameters: a JSON object, or @FILE with one (@- for standard input)")
+        .ValueName("JSON");
+}
+
+bool FindRefusal(Report &report, std::string &strAnswer) {
+    constexpr int kStatusOk = 200;
+    const ZELO::CredRequestUtil::Answer answer = ZELO::CredRequestUtil::LatestAnswer();
+    strAnswer.clear();
+    if (answer.errorCode != 0) {
+        const std::string strName = ServerErrorName(answer.errorCode);
+        report.Member("server_code", answer.errorCode);
+        report.Member("server_error", strName);
+        strAnswer = "error code " + std::to_string(answer.errorCode) + " (" + strName + ')';
+    }
+    if (answer.httpStatus != 0 && answer.httpStatus != kStatusOk) {
+        report.Member("http_status", answer.httpStatus);
+        const std::string strStatus = "HTTP status " + std::to_string(answer.httpStatus);
+        strAnswer += strAnswer.empty() ? strStatus + "; look at the server" : ", " + strStatus;
+    }
+    return !strAnswer.empty();
+}
+
+ExitCode FailRequest(ErrorId id, const std::string &strWhat, const std::string &strReasons,
+                     Report &report) {
+    std::string strAnswer;
+    return FindRefusal(report, strAnswer)
+               ? report.Fail(id, strWhat + ": it answered with " + strAnswer)
+               : report.FailExchange(id, strWhat + strReasons);
+}
+
+}  // namespace qrmctl

@@ -1,0 +1,35 @@
+// A request to the joined server: what a command line says of it, and why the server refused it.
+
+#ifndef QRMCTL_SERVER_REQUEST_H
+#define QRMCTL_SERVER_REQUEST_H
+
+#include <string>
+
+#include "commands.h"
+#include "report.h"
+
+namespace qrmctl {
+
+// Which method of which Web API is called, and with what.
+struct ApiCall {
+    std::string strApi;
+    std::string strMethod;
+    int version = 1;
+    std::string strParams;  // for ReadParams (input_file.h)
+};
+
+// Lets the command take them.
+void AddApiCall(CommandHandle command, ApiCall &call);
+
+// For a request that failed: whether the server's answer to the latest exchange says why. Then
+// strAnswer names its error code and its HTTP status, and the report has them as members.
+bool FindRefusal(Report &report, std::string &strAnswer);
+
+// Ends the command after a request that failed: with strWhat, which names the server, and with its
+// answer, or, when that says nothing, with the reasons that there may be.
+ExitCode FailRequest(ErrorId id, const std::string &strWhat, const std::string &strReasons,
+                     Report &report);
+
+}  // namespace qrmctl
+
+#endif
