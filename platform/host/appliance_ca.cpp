@@ -28,6 +28,7 @@ namespace fs = std::filesystem;
 
 constexpr const char *kFile = "appliance_ca";
 constexpr const char *kFolder = "/usr/zelo/etc/ssl/ca.d";
+constexpr std::chrono::seconds kLookInterval{1};
 
 struct FreeBio {
     void operator()(BIO *pBio) const { BIO_free(pBio); }
@@ -130,9 +131,14 @@ CaState CaState::Now() {
     return state;
 }
 
-bool CaState::Holds() const {
-    return std::all_of(m_entries.begin(), m_entries.end(),
-                       [](const auto &entry) { return Look(entry.first) == entry.second; });
+bool CaState::Holds() {
+    const auto isUnchanged = [](const auto &entry) { return Look(entry.first) == entry.second; };
+    const auto now = std::chrono::steady_clock::now();
+    if (now - m_looked < kLookInterval) {
+        return m_entries.empty() || isUnchanged(m_entries.front());
+    }
+    m_looked = now;
+    return std::all_of(m_entries.begin(), m_entries.end(), isUnchanged);
 }
 
 bool CaState::Version::operator==(const Version &other) const {

@@ -7,6 +7,7 @@
 #include <openssl/x509.h>
 #include <sys/types.h>
 
+#include <chrono>
 #include <ctime>
 #include <string>
 #include <utility>
@@ -25,9 +26,10 @@ class CaState {
     // The state that the folder is in now.
     static CaState Now();
 
-    // Whether the folder is still in this state. Looks at the files by their names, which is much
-    // cheaper than reading the folder again.
-    bool Holds() const;
+    // Whether the folder is still in this state. Looks at the folder itself, which shows what
+    // comes, goes or is replaced, and at most once a second at each file, which may have been
+    // written to.
+    bool Holds();
 
   private:
     struct Version {
@@ -43,6 +45,7 @@ class CaState {
 
     // The folder and its files.
     std::vector<std::pair<std::string, Version>> m_entries;
+    std::chrono::steady_clock::time_point m_looked = std::chrono::steady_clock::now();
 };
 
 }  // namespace host

@@ -25,7 +25,7 @@ constexpr const char *kDiscoveryPath = "/qrm/discover";
 constexpr long kStatusOk = 200;
 constexpr long kStatusNotFound = 404;
 constexpr std::size_t kMaxPath = 1024;
-constexpr std::size_t kMaxPaths = 256;
+constexpr std::size_t kMaxUrls = 256;
 
 // A server as its credential record describes it.
 struct Server {
@@ -37,6 +37,9 @@ struct Server {
     std::string Key(const std::string &api) const {
         return (blRelay ? "fld" : strScheme) + ' ' + std::to_string(port) + ' ' + strHost + ' ' +
                api;
+    }
+    std::string Url(const std::string &strPath) const {
+        return host::BuildUrl(strScheme, strHost, port, strPath, "");
     }
 };
 
@@ -55,45 +58,45 @@ bool ReadServer(const ZELO_CRED *pCred, Server &server) {
     return !server.strHost.empty();
 }
 
-// The paths that this process has learnt, by server and API. A fork waits for its mutex, so that
-// the child finds it free.
-class PathCache {
+// The URLs that this process has learnt, by server and API. A fork waits for its mutex, so that the
+// child finds it free.
+class UrlCache {
   public:
-    PathCache() {
-        pthread_atfork([] { Paths().m_mutex.lock(); }, [] { Paths().m_mutex.unlock(); },
-                       [] { Paths().m_mutex.unlock(); });
+    UrlCache() {
+        pthread_atfork([] { Urls().m_mutex.lock(); }, [] { Urls().m_mutex.unlock(); },
+                       [] { Urls().m_mutex.unlock(); });
     }
 
     // Never destroyed, so that it serves until the very end of a process.
-    static PathCache &Paths() {
-        static auto *const pPaths = new PathCache;
-        return *pPaths;
+    static UrlCache &Urls() {
+        static auto *const pUrls = new UrlCache;
+        return *pUrls;
     }
 
     std::string Find(const std::string &strKey) {
         const std::lock_guard<std::mutex> lock(m_mutex);
-        const auto at = m_paths.find(strKey);
-        return at == m_paths.end() ? std::string() : at->second;
+        const auto at = m_urls.find(strKey);
+        return at == m_urls.end() ? std::string() : at->second;
     }
-    void Learn(const std::string &strKey, const std::string &strPath) {
+    void Learn(const std::string &strKey, const std::string &strUrl) {
         const std::lock_guard<std::mutex> lock(m_mutex);
-        if (m_paths.size() >= kMaxPaths) {
-            m_paths.clear();
+        if (m_urls.size() >= kMaxUrls) {
+            m_urls.clear();
         }
-        m_paths[strKey] = strPath;
+        m_urls[strKey] = strUrl;
     }
     void Forget(const std::string &strKey) {
         const std::lock_guard<std::mutex> lock(m_mutex);
-        m_paths.erase(strKey);
+        m_urls.erase(strKey);
     }
 
   private:
     std::mutex m_mutex;
-    std::map<std::string, std::string> m_paths;
+    std::map<std::string, std::string> m_urls;
 };
 
-PathCache &Paths() {
-    return PathCache::Paths();
+UrlCache &Urls() {
+    return UrlCache::Urls();
 }
 
 // Runs the body; short memory becomes the failure value.
@@ -124,6 +127,21 @@ bool IsPath(const std::string &strPath) {
 bool IsHeaderValue(const std::string &strToken) {
     return std::all_of(strToken.begin(), strToken.end(),
                        [](unsigned char c) { return c > ' ' && c != 0x7F; });
+}
+
+// The text as a JSON text. A name of letters, digits and dots, as nearly all are, only needs
+// quotes.
+std::string Quoted(const std::string &strText) {
+    const bool blPlain = std::all_of(strText.begin(), strText.end(), [](char c) {
+        return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || (c >= '0' && c <= '9') ||
+               c == '.';
+    });
+    if (blPlain) {
+        return '"' + strText + '"';
+    }
+    std::string strQuoted;
+    json_text::ToString(strText, strQuoted);
+    return strQuoted;
 }
 
 struct Observer {
@@ -197,7 +215,7 @@ std::string Discover(const Server &server, const std::string &api) {
     if (szPath == nullptr || !IsPath(szPath)) {
         return NoPath(request.strUrl, "names no path that can be used", __LINE__);
     }
-    Paths().Learn(server.Key(api), szPath);
+    Urls().Learn(server.Key(api), server.Url(szPath));
     return szPath;
 }
 
@@ -205,7 +223,7 @@ std::string Discover(const Server &server, const std::string &api) {
 
 struct CredRequest::Impl {
     std::string strUrl;
-    std::string strPathKey;
+    std::string strUrlKey;
     bool blRelay = false;
     std::string strApi;
     int version = 0;
@@ -232,15 +250,15 @@ struct CredRequest::Impl {
             HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
             return false;
         }
-        strPathKey = server.Key(api);
-        std::string strPath = Paths().Find(strPathKey);
-        if (strPath.empty()) {
-            strPath = Discover(server, api);
+        strUrlKey = server.Key(api);
+        strUrl = Urls().Find(strUrlKey);
+        if (strUrl.empty()) {
+            const std::string strPath = Discover(server, api);
+            if (strPath.empty()) {
+                return false;
+            }
+            strUrl = server.Url(strPath);
         }
-        if (strPath.empty()) {
-            return false;
-        }
-        strUrl = host::BuildUrl(server.strScheme, server.strHost, server.port, strPath, "");
         blRelay = server.blRelay;
         strApi = api;
         version = ver;
@@ -257,20 +275,16 @@ struct CredRequest::Impl {
         }
     }
 
-    // Around the values, whose texts JsonCpp writes: a JSON value of the whole, made for one call,
-    // takes as much time as the parameters of many.
+    // Around the values: a JSON value of the whole, made for one call, takes as much time as the
+    // parameters of many.
     bool BuildBody(std::string &strBody) const {
-        std::string strApiText;
-        std::string strMethodText;
         std::string strParams;
         // The parameters stand one level below the whole.
-        if (!json_text::ToString(strApi, strApiText) ||
-            !json_text::ToString(strMethod, strMethodText) ||
-            !json_text::ToString(params, strParams, json_text::kMaxDepth - 1)) {
+        if (!json_text::ToString(params, strParams, json_text::kMaxDepth - 1)) {
             return false;
         }
-        strBody = R"({"api":)" + strApiText + R"(,"method":)" + strMethodText + R"(,"params":)" +
-                  strParams + R"(,"version":)" + std::to_string(version) + '}';
+        strBody = R"({"api":)" + Quoted(strApi) + R"(,"method":)" + Quoted(strMethod) +
+                  R"(,"params":)" + strParams + R"(,"version":)" + std::to_string(version) + '}';
         return true;
     }
 
@@ -296,7 +310,7 @@ struct CredRequest::Impl {
         host::HttpReply reply;
         const int result = Ask(request, reply);
         if (reply.status == kStatusNotFound) {
-            Paths().Forget(strPathKey);
+            Urls().Forget(strUrlKey);
         }
         if (result == CRED_REQ_ERR_NONE) {
             strResponse.swap(reply.strBody);
