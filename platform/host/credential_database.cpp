@@ -78,6 +78,30 @@ void ReadRow(const Run &run, ZELO_CRED &cred) {
     cred.modifyTime_s = run.OptionalNumber(8);
 }
 
+// What was read last in answer to a question, and in which state of the store. The store's mutex
+// guards it. Requests that load their records anew each time then cost a look at the file each.
+template <typename Question, typename Answer>
+struct Kept {
+    sqlite::State state;
+    Question question = {};
+    Answer answer = {};
+};
+
+template <typename Question, typename Answer>
+bool IsKept(const Kept<Question, Answer> &kept, const Question &question, Answer &answer) {
+    const sqlite::Glance glance(g_database);
+    if (!glance.Shows(kept.state) || kept.question != question) {
+        return false;
+    }
+    answer = kept.answer;
+    return true;
+}
+
+// Never destroyed, so that they serve until the very end of a process.
+Kept<std::string, long> &g_keptId = *new Kept<std::string, long>;
+Kept<long, ZELO_CRED> &g_keptCredential = *new Kept<long, ZELO_CRED>;
+Kept<long, ZELO_CRED_SESS> &g_keptSession = *new Kept<long, ZELO_CRED_SESS>;
+
 // How many credentials an application has in one version of the store. The store's mutex guards it.
 struct Count {
     std::string strApplication;
@@ -113,11 +137,15 @@ Result RemoveById(StatementKind kind, long id) {
 }  // namespace
 
 Result ReadCredential(long id, ZELO_CRED &cred) {
+    if (IsKept(g_keptCredential, id, cred)) {
+        return Result::kDone;
+    }
     Run run(g_database, kReadCredential, false);
     run.Bind(1, id);
     const Result result = run.Step();
     if (result == Result::kDone) {
         ReadRow(run, cred);
+        g_keptCredential = {run.FileState(), id, cred};
     }
     return result;
 }
@@ -145,6 +173,9 @@ Result ReadAll(std::vector<ZELO_CRED> &creds) {
 
 Result FindId(const char *szApplication, long &id) {
     const std::string strApplication = szApplication;
+    if (IsKept(g_keptId, strApplication, id)) {
+        return Result::kDone;
+    }
     Run run(g_database, kFindId, false);
     run.Bind(1, strApplication);
     const Result result = run.Step();
@@ -155,6 +186,7 @@ Result FindId(const char *szApplication, long &id) {
         return Result::kAbsent;
     }
     id = run.Number(0);
+    g_keptId = {run.FileState(), strApplication, id};
     return Result::kDone;
 }
 
@@ -196,6 +228,9 @@ std::vector<std::string> ListSetAside() {
 }
 
 Result ReadSession(long id, ZELO_CRED_SESS &sess) {
+    if (IsKept(g_keptSession, id, sess)) {
+        return Result::kDone;
+    }
     Run run(g_database, kReadSession, false);
     run.Bind(1, id);
     const Result result = run.Step();
@@ -203,6 +238,7 @@ Result ReadSession(long id, ZELO_CRED_SESS &sess) {
         sess.id = run.Number(0);
         sess.accessToken = run.OptionalText(1);
         sess.csrfToken = run.OptionalText(2);
+        g_keptSession = {run.FileState(), id, sess};
     }
     return result;
 }

@@ -2,6 +2,7 @@
 
 #include "../key_value_file.h"
 
+#include <mutex>
 #include <new>
 #include <string_view>
 #include <vector>
@@ -165,22 +166,44 @@ bool ReadForChange(const char *szPath, OldFile &old) {
     return blRead;
 }
 
-// The pair that this thread was to set last and found in place. What is reported over and over,
-// such as the status after each request, then costs a look at the file and not its reading.
+// The pair that was to be set last and was found in place. What is reported over and over, such as
+// the status after each request, then costs a look at the file and not its reading. Never
+// destroyed, so that it serves until the very end of a process. Who finds the mutex taken, as it
+// may stay in a child process, does without.
 struct StandingPair {
+    std::mutex mutex;
     std::string strPath;
     std::string strKey;
     std::string strValue;
     struct stat status = {};
 };
 
-thread_local StandingPair t_standing;
+StandingPair &TheStandingPair() {
+    static auto *const pPair = new StandingPair;
+    return *pPair;
+}
 
 bool IsStanding(const char *szPath, std::string_view key, std::string_view value) {
+    const StandingPair &pair = TheStandingPair();
     struct stat status = {};
-    return t_standing.strPath == szPath && t_standing.strKey == key &&
-           t_standing.strValue == value && lstat(szPath, &status) == 0 &&
-           host::IsUnchanged(status, t_standing.status);
+    const std::unique_lock<std::mutex> lock(TheStandingPair().mutex, std::try_to_lock);
+    return lock.owns_lock() && pair.strPath == szPath && pair.strKey == key &&
+           pair.strValue == value && lstat(szPath, &status) == 0 &&
+           host::IsUnchanged(status, pair.status);
+}
+
+void RememberStanding(const char *szPath, std::string_view key, std::string_view value,
+                      const OldFile &old) {
+    StandingPair &pair = TheStandingPair();
+    const std::unique_lock<std::mutex> lock(pair.mutex, std::try_to_lock);
+    if (!lock.owns_lock() || !old.blSettled || !host::IsOwnFile(old.found.status)) {
+        return;
+    }
+    pair.strPath.clear();  // for as long as the rest is not whole
+    pair.strKey = key;
+    pair.strValue = value;
+    pair.status = old.found.status;
+    pair.strPath = szPath;
 }
 
 int SetValue(const char *szPath, std::string_view key, std::string_view value) {
@@ -197,9 +220,7 @@ int SetValue(const char *szPath, std::string_view key, std::string_view value) {
     std::string_view rest = old.strText;
     if (TakeLineWithKey(rest, key, line)) {
         if (ValueOf(line.value) == value) {
-            if (old.blSettled && host::IsOwnFile(old.found.status)) {
-                t_standing = {szPath, std::string(key), std::string(value), old.found.status};
-            }
+            RememberStanding(szPath, key, value, old);
             return 0;
         }
         strNew.assign(old.strText, 0, old.strText.size() - rest.size() - line.text.size());

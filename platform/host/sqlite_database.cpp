@@ -7,11 +7,13 @@
 #include <syslog.h>
 #include <unistd.h>
 
+#include <array>
 #include <atomic>
 #include <cerrno>
 #include <cstring>
 #include <vector>
 
+#include "file_state.h"
 #include "last_error.h"
 #include "set_aside.h"
 
@@ -68,8 +70,7 @@ bool ReadPragma(sqlite3 *pDb, const char *szPragma, int &value, int &error) {
 // The statements go before the database that they belong to.
 struct Connection {
     unsigned serial = ++g_connections;  // tells it from every other one of the process
-    dev_t device = 0;
-    ino_t inode = 0;
+    struct stat file = {};              // at the latest use
     bool blHasSchema = false;
     DatabaseHandle pDb;
     std::vector<StatementHandle> statements;
@@ -179,10 +180,8 @@ Result Database::CheckFormat() {
     return Result::kDone;
 }
 
-Result Database::Open(dev_t device, ino_t inode) {
+Result Database::Open() {
     m_pConnection = std::make_unique<Connection>();
-    m_pConnection->device = device;
-    m_pConnection->inode = inode;
     m_pConnection->statements.resize(m_store.cStatements);
     sqlite3 *pRaw = nullptr;
     const int error = sqlite3_open_v2(m_store.szPath, &pRaw,
@@ -242,11 +241,11 @@ Result Database::Connect(bool blWrite) {
         return Result::kFailed;
     }
     Result result = Result::kDone;
-    if (m_pConnection == nullptr || m_pConnection->device != status.st_dev ||
-        m_pConnection->inode != status.st_ino) {
+    if (m_pConnection == nullptr || !IsSameFile(m_pConnection->file, status)) {
         m_pConnection.reset();
-        result = Open(status.st_dev, status.st_ino);
+        result = Open();
     }
+    m_pConnection->file = status;
     if (result == Result::kDone && !m_pConnection->blHasSchema) {
         result = CheckFormat();
         if (result == Result::kAbsent && blWrite) {
@@ -296,8 +295,7 @@ Result Database::SetAsideIfDamaged(std::string &strAside) {
     }
     // A copy that was restored meanwhile is another file.
     struct stat now = {};
-    if (lstat(m_store.szPath, &now) != 0 || now.st_ino != judged.st_ino ||
-        now.st_dev != judged.st_dev) {
+    if (lstat(m_store.szPath, &now) != 0 || !IsSameFile(now, judged)) {
         return Result::kAbsent;
     }
     if (!SetAside(m_store.szPath, strAside)) {
@@ -306,6 +304,38 @@ Result Database::SetAsideIfDamaged(std::string &strAside) {
     syslog(LOG_WARNING, "%s:%d %s '%s' was damaged or of another format: it is '%s' now", kFile,
            __LINE__, m_store.szName, m_store.szPath, strAside.c_str());
     return Result::kDone;
+}
+
+// The count stands in the file's header. It is read on the connection's own descriptor: to close
+// another one would drop SQLite's locks.
+bool Database::ReadChanges(std::uint32_t &changes) const {
+    constexpr int kPlace = 24;
+    std::array<unsigned char, 4> bytes = {};
+    sqlite3_file *pFile = nullptr;
+    if (sqlite3_file_control(m_pConnection->pDb.get(), "main", SQLITE_FCNTL_FILE_POINTER, &pFile) !=
+            SQLITE_OK ||
+        pFile->pMethods == nullptr ||
+        pFile->pMethods->xRead(pFile, bytes.data(), bytes.size(), kPlace) != SQLITE_OK) {
+        return false;
+    }
+    changes = 0;
+    for (const unsigned char byte : bytes) {
+        changes = changes << 8U | byte;
+    }
+    return true;
+}
+
+// --- Glance -------------------------------------------------------------------------------------
+
+Glance::Glance(Database &database) : m_lock(database.m_mutex, std::try_to_lock) {
+    m_blKnown = m_lock.owns_lock() && database.m_pConnection != nullptr &&
+                lstat(database.m_store.szPath, &m_now.file) == 0 &&
+                IsSameFile(m_now.file, database.m_pConnection->file) &&
+                database.ReadChanges(m_now.changes);
+}
+
+bool Glance::Shows(const State &state) const {
+    return m_blKnown && m_now.changes == state.changes && IsUnchanged(m_now.file, state.file);
 }
 
 // --- Run ----------------------------------------------------------------------------------------
@@ -401,6 +431,14 @@ std::uint64_t Run::Version() const {
     unsigned version = 0;
     sqlite3_file_control(m_pDb, "main", SQLITE_FCNTL_DATA_VERSION, &version);
     return std::uint64_t{m_database.m_pConnection->serial} << 32U | version;
+}
+
+State Run::FileState() const {
+    State state;
+    if (m_database.ReadChanges(state.changes)) {
+        state.file = m_database.m_pConnection->file;
+    }
+    return state;
 }
 
 long Run::LastId() const {

@@ -11,6 +11,7 @@
 #ifndef ZELO_HOST_SQLITE_DATABASE_H
 #define ZELO_HOST_SQLITE_DATABASE_H
 
+#include <sys/stat.h>
 #include <sys/types.h>
 
 #include <cstddef>
@@ -41,6 +42,13 @@ struct Store {
     std::size_t cStatements;
 };
 
+// The state of a store's file. What was read in a state holds for as long as the file is in it:
+// each process's change counts the changes up, and another file in its place has another status.
+struct State {
+    struct stat file = {};
+    std::uint32_t changes = 0;
+};
+
 struct Connection;
 
 // The process's access to one store. Made once, while the library is loaded, and never destroyed,
@@ -58,6 +66,7 @@ class Database {
     Result SetAsideIfDamaged(std::string &strAside);
 
   private:
+    friend class Glance;
     friend class Run;
 
     static void CloseAllBeforeFork();
@@ -65,12 +74,13 @@ class Database {
 
     // The caller of these holds the mutex.
     Result Connect(bool blWrite);
-    Result Open(dev_t device, ino_t inode);
+    Result Open();
     Result CreateFile() const;
     Result TightenModes(mode_t fileMode) const;
     Result CheckFormat();
     Result CheckWhole();
     Result CreateSchema();
+    bool ReadChanges(std::uint32_t &changes) const;
     Result Fail(int sqliteError, const char *szWhat, int line) const;
     Result FailErrno(int line) const;
 
@@ -78,6 +88,21 @@ class Database {
     std::mutex m_mutex;
     std::unique_ptr<Connection> m_pConnection;
     Database *m_pNext = nullptr;  // all databases are in one chain, for the fork handlers
+};
+
+// A look at the store's file that takes no lock of the store, and the mutex for as long as it
+// lives, unless that is taken. It waits for nobody.
+class Glance {
+  public:
+    explicit Glance(Database &database);
+
+    // Whether the file is in the state. False where that cannot be told at once.
+    bool Shows(const State &state) const;
+
+  private:
+    std::unique_lock<std::mutex> m_lock;
+    bool m_blKnown = false;
+    State m_now;
 };
 
 // One run of a prepared statement: takes the mutex and the connection, gives both back when it goes
@@ -118,6 +143,10 @@ class Run {
     // The version of the store that the row belongs to: any process's change, and another file in
     // the store's place, make another one.
     std::uint64_t Version() const;
+
+    // The state of the file that the row belongs to; one that no file is in where it cannot be
+    // told.
+    State FileState() const;
 
     long LastId() const;
     int Changes() const;
