@@ -5,6 +5,7 @@
 #define ZELO_HOST_APPLIANCE_CA_H
 
 #include <openssl/x509.h>
+#include <sys/stat.h>
 #include <sys/types.h>
 
 #include <chrono>
@@ -12,6 +13,8 @@
 #include <string>
 #include <utility>
 #include <vector>
+
+#include "file_descriptor.h"
 
 namespace host {
 
@@ -38,10 +41,16 @@ class CaState {
         off_t size = 0;
         timespec changed = {};
 
+        Version() = default;
+        explicit Version(const struct stat &status);
         bool operator==(const Version &other) const;
     };
     static Version Look(const std::string &strPath);
+    Version LookAtFolder() const;
     void Add(const std::string &strPath) { m_entries.emplace_back(strPath, Look(strPath)); }
+
+    FileDescriptor m_folder;  // none where there was no folder
+    Version m_folderVersion;
 
     // The folder and its files.
     std::vector<std::pair<std::string, Version>> m_entries;

@@ -239,6 +239,7 @@ bool Wait(Clock::time_point end, std::chrono::microseconds wait) {
 
 // Waits for the turn and then for the lock.
 Try WaitForLock(const LockFile &file, Clock::time_point end) {
+    const host::Waiting waiting({"waiting for the lock '", file.Path(), "'"});
     for (std::chrono::microseconds wait = kFirstWait; !TakeTurn(file.Get(), F_WRLCK);
          wait = std::min(2 * wait, kLastWait)) {
         if (errno != EAGAIN && errno != EACCES) {
@@ -274,7 +275,6 @@ Try TakeLock(const LockFile &file, Clock::time_point end) {
 int Lock(const char *szPath, int timeout_s, int &handle) {
     const Clock::time_point end = Clock::now() + std::chrono::seconds(timeout_s);
     for (;;) {
-        const host::Waiting waiting({"waiting for the lock '", szPath, "'"});
         LockFile file(szPath);
         if (file.Get() < 0) {
             return HOST_FAIL(errno == ELOOP ? YLIBC_ERR_UNSAFE_FILE : YLIBC_ERR_FILE);

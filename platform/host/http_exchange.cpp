@@ -61,6 +61,7 @@ struct FreeText {
 struct Connection {
     std::set<curl_socket_t> sockets;
     CaState caState;
+    bool blNamesProxy = false;  // whether the environment did when the handle was made
     std::array<char, CURL_ERROR_SIZE> reason = {};
     // Goes first: cleaning it up closes its sockets, which calls back to the set above.
     std::unique_ptr<CURL, CleanupEasy> pEasy;
@@ -103,6 +104,7 @@ void AbandonInChild() {
             close(fd);
         }
         pConnection->sockets.clear();
+        pConnection->caState = CaState();
     }
     pool.mutex.unlock();
 }
@@ -192,6 +194,15 @@ void SetTransport(CURL *pEasy, Connection *pConnection) {
     curl_easy_setopt(pEasy, CURLOPT_ERRORBUFFER, pConnection->reason.data());
 }
 
+// Whether the environment names a proxy, in one of the variables that libcurl looks at. Where it
+// names none, as on most appliances, an exchange need not read the configuration.
+bool NamesProxy() {
+    constexpr std::array<const char *, 5> kVariables = {"http_proxy", "https_proxy", "HTTPS_PROXY",
+                                                        "all_proxy", "ALL_PROXY"};
+    return std::any_of(kVariables.begin(), kVariables.end(),
+                       [](const char *szName) { return std::getenv(szName) != nullptr; });
+}
+
 // --- Pool ---------------------------------------------------------------------------------------
 
 // A handle borrowed from the pool, given back when the exchange is over.
@@ -207,6 +218,7 @@ class Borrowed {
             m_pConnection = std::make_unique<Connection>();
             m_pConnection->pEasy.reset(curl_easy_init());
             m_pConnection->caState = CaState::Now();
+            m_pConnection->blNamesProxy = NamesProxy();
             if (m_pConnection->pEasy != nullptr) {
                 SetTransport(m_pConnection->pEasy.get(), m_pConnection.get());
             }
@@ -259,18 +271,10 @@ class Borrowed {
 
 // --- What each exchange on a handle sets anew ---------------------------------------------------
 
-// Whether the environment names a proxy, in one of the variables that libcurl looks at. Where it
-// names none, as on most appliances, an exchange need not read the configuration.
-bool NamesProxy() {
-    constexpr std::array<const char *, 5> kVariables = {"http_proxy", "https_proxy", "HTTPS_PROXY",
-                                                        "all_proxy", "ALL_PROXY"};
-    return std::any_of(kVariables.begin(), kVariables.end(),
-                       [](const char *szName) { return std::getenv(szName) != nullptr; });
-}
-
 // Chooses the way: through the relay, as the environment says where the configuration allows it, or
 // direct. False when the relay is asked for and none is named.
-bool SetWay(CURL *pEasy, bool blRelay) {
+bool SetWay(const Connection &connection, bool blRelay) {
+    CURL *const pEasy = connection.pEasy.get();
     std::string strValue;
     if (blRelay) {
         if (LookUpKey(kConfigFile, "farlink_relay", strValue) != LookUp::kFound ||
@@ -283,7 +287,7 @@ bool SetWay(CURL *pEasy, bool blRelay) {
         return true;
     }
     const bool blEnvironment =
-        NamesProxy() &&
+        connection.blNamesProxy &&
         LookUpKey(kConfigFile, "use_proxy_environment", strValue) == LookUp::kFound &&
         strValue == "yes";
     curl_easy_setopt(pEasy, CURLOPT_PROXY, blEnvironment ? nullptr : "");
@@ -413,7 +417,7 @@ int Perform(const HttpRequest &request, HttpReply &reply) {
     if (pEasy == nullptr || !BuildHeaders(request, pHeaders)) {
         return Fail(ZELO::CRED_REQ_ERR_MEMORY, request, "out of memory", __LINE__);
     }
-    if (!SetWay(pEasy, request.blRelay)) {
+    if (!SetWay(*connection.Get(), request.blRelay)) {
         return Fail(ZELO::CRED_REQ_ERR_NETWORK, request,
                     "no relay: set farlink_relay=\"host:port\" in /etc/zeloinfo.conf", __LINE__);
     }

@@ -278,9 +278,9 @@ struct CredRequest::Impl {
     // Around the values: a JSON value of the whole, made for one call, takes as much time as the
     // parameters of many.
     bool BuildBody(std::string &strBody) const {
-        std::string strParams;
+        std::string strParams = "{}";
         // The parameters stand one level below the whole.
-        if (!json_text::ToString(params, strParams, json_text::kMaxDepth - 1)) {
+        if (!params.empty() && !json_text::ToString(params, strParams, json_text::kMaxDepth - 1)) {
             return false;
         }
         strBody = R"({"api":)" + Quoted(strApi) + R"(,"method":)" + Quoted(strMethod) +
