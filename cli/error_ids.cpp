@@ -78,7 +78,7 @@ const std::vector<ErrorEntry> &AllErrors() {
         {ErrorId::kStoreDamaged, "store-damaged", kFailed,
          "the credential store is damaged or of another format; it is left as it is"},
         {ErrorId::kStoreUnreadable, "store-unreadable", kFailed,
-         "the credential store cannot be read now, and is not damaged"},
+         "a store cannot be read now, damage apart, or cannot be set aside"},
         {ErrorId::kUpdateFailed, "update-failed", kFailed,
          "the server did not take the update, or a fact of the appliance is missing"},
         {ErrorId::kUsage, "usage", kUsage, "the command line is wrong; nothing was done"},

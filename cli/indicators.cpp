@@ -92,18 +92,25 @@ std::string StoredFor(long id) {
     return blHost ? std::string("stored, for ") + host.sz() : "stored";
 }
 
+// What is told of a store that does not say what it holds.
+void TellFlaw(Indicator &indicator, ErrorId flaw) {
+    if (flaw == ErrorId::kStoreDamaged) {
+        indicator.strHolds = "damaged store; 'qrmctl leave' sets it aside";
+        indicator.strRemedy = "qrmctl leave, which sets the store aside, then qrmctl join";
+    } else {
+        // Nothing is known of what it holds: leaving might end a good membership.
+        indicator.rule = 0;
+        indicator.strHolds = "cannot be read now (-v shows the reason)";
+        indicator.strRemedy =
+            "wait for the program that holds the store, or mend its mode; then try again";
+    }
+}
+
 Indicator ReadCredential(const Flag &flag, std::optional<ErrorId> &flaw, const char *szName,
                          const char *szApplication, int rule) {
     Indicator indicator;
     indicator.strName = szName;
     const long id = FindId(szApplication, flaw);
-    if (flaw == ErrorId::kStoreUnreadable) {
-        // Nothing is known of the credential: leaving might end a good membership.
-        indicator.strHolds = "cannot be read now (-v shows the reason)";
-        indicator.strRemedy =
-            "wait for the program that holds the store, or mend its mode; then try again";
-        return indicator;
-    }
     if (flag.blNo && id >= 0) {
         Break(indicator, rule);
     } else if (flag.blYes && id < 0) {
@@ -111,8 +118,7 @@ Indicator ReadCredential(const Flag &flag, std::optional<ErrorId> &flaw, const c
     }
     indicator.strHolds = id < 0 ? "not stored" : StoredFor(id);
     if (flaw) {
-        indicator.strHolds = "damaged store; 'qrmctl leave' sets it aside";
-        indicator.strRemedy = "qrmctl leave, which sets the store aside, then qrmctl join";
+        TellFlaw(indicator, *flaw);
     }
     return indicator;
 }
@@ -136,6 +142,7 @@ Indicator ReadDaemon(const Flag &flag) {
 Indicator ReadSessions(const Flag &flag) {
     ZELO_CGI_CONTEXT context = {};
     const bool blReady = ZeloCgiInit("", &context) != 0;
+    const ErrorId flaw = LastStoreFlaw();
     bool blExists = false;
     std::string strSessions;
     for (const char *szSession : kClientSessions) {
@@ -148,11 +155,14 @@ Indicator ReadSessions(const Flag &flag) {
 
     Indicator indicator;
     indicator.strName = "web sessions";
-    indicator.strHolds = !blReady ? "cannot be read" : blExists ? strSessions : "none";
+    indicator.strHolds = blExists ? strSessions : "none";
     if (flag.blNo && blExists) {
         Break(indicator, 7);
     } else if (flag.blYes && !blExists) {
         Break(indicator, 8);
+    }
+    if (!blReady) {
+        TellFlaw(indicator, flaw);
     }
     return indicator;
 }

@@ -284,8 +284,11 @@ ExitCode Join(const Options &options, Report &report) {
         return report.Fail(ErrorId::kBusy,
                            "another program is joining or leaving: try again when it is done");
     }
-    Report::Stage("looking for damage in the credential store");
-    ClearDamagedStore(report);
+    Report::Stage("looking for damage in the stores");
+    bool blServerLost = false;
+    if (const auto code = ClearDamagedStores(report, blServerLost)) {
+        return *code;
+    }
     Report::Stage("judging the membership");
     const bool blJoined = ZELOQRMClientStatus() == 1;
     report.Member("was_joined", blJoined);

@@ -1,20 +1,23 @@
 #include "joined_server.h"
 
 #include "credential_store.h"
+#include "fixed_text.h"
 #include "json_text.h"
 #include "last_error.h"
 #include "membership.h"
 #include "serial_number.h"
+#include "web_session.h"
 #include "zeloqrmclient.h"
 
 namespace qrmctl {
 
-std::optional<ErrorId> StoreFlaw() {
-    if (IsStoreReadable()) {
-        return std::nullopt;
-    }
+ErrorId LastStoreFlaw() {
     return YLIBCErrGet() == YLIBC_ERR_STORE_DAMAGED ? ErrorId::kStoreDamaged
                                                     : ErrorId::kStoreUnreadable;
+}
+
+std::optional<ErrorId> StoreFlaw() {
+    return IsStoreReadable() ? std::nullopt : std::optional(LastStoreFlaw());
 }
 
 std::string StoreFlawText(ErrorId flaw) {
@@ -24,15 +27,51 @@ std::string StoreFlawText(ErrorId flaw) {
                : "the credential store cannot be read; -v shows the reason";
 }
 
-bool ClearDamagedStore(Report &report) {
-    std::string strPath;
-    if (!SetAsideDamagedStore(strPath)) {
-        return false;
+namespace {
+
+struct StoreOfMembership {
+    const char *szName;
+    const char *szMember;  // of the report: where it was set aside
+    int (*SetAside)(char *, int);
+};
+
+constexpr StoreOfMembership kCredentials = {"the credential store", "set_aside",
+                                            ZELOCredStoreSetAside};
+constexpr StoreOfMembership kSessions = {"the web session store", "sessions_set_aside",
+                                         ZeloCgiStoreSetAside};
+
+// As ClearDamagedStores, for one store; blDamaged tells whether it was set aside.
+std::optional<ExitCode> ClearDamaged(const StoreOfMembership &store, Report &report,
+                                     bool &blDamaged) {
+    FixedText<1024> path;
+    const int result = store.SetAside(path.Buffer(), FixedText<1024>::Size());
+    const std::string strPath = path.sz();
+    blDamaged = result == 1;
+    if (result < 0) {
+        const char *szRemedy =
+            YLIBCErrGet() == YLIBC_ERR_STORE_BUSY
+                ? "another program keeps it locked, wait for that one and try again"
+                : "see to what stands there, its rights and the disk, and try again; -v shows the "
+                  "reason";
+        return report.Fail(ErrorId::kStoreUnreadable,
+                           std::string(store.szName) + " '" + strPath +
+                               "' can neither be used nor set aside: " + szRemedy);
     }
-    report.Member("set_aside", strPath);
-    report.Warn("the credential store was damaged or of another format: it is set aside as '" +
-                strPath + "', an empty one takes its place");
-    return true;
+    if (blDamaged) {
+        report.Member(store.szMember, strPath);
+        report.Warn(std::string(store.szName) +
+                    " was damaged or of another format: it is set aside as '" + strPath +
+                    "', an empty one takes its place");
+    }
+    return std::nullopt;
+}
+
+}  // namespace
+
+std::optional<ExitCode> ClearDamagedStores(Report &report, bool &blServerLost) {
+    bool blSessionsLost = false;
+    const auto code = ClearDamaged(kCredentials, report, blServerLost);
+    return code ? code : ClearDamaged(kSessions, report, blSessionsLost);
 }
 
 std::string AsText(const Json::Value &value) {

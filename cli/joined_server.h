@@ -12,15 +12,19 @@
 
 namespace qrmctl {
 
+// Which of the two flaws the platform operation that has just failed has found in its store.
+ErrorId LastStoreFlaw();
+
 // What is wrong with the credential store; nothing when it can be read, an empty one included.
 std::optional<ErrorId> StoreFlaw();
 
 // A sentence about that flaw.
 std::string StoreFlawText(ErrorId flaw);
 
-// For the commands that may begin anew: sets a damaged store aside, and says where it is. Returns
-// whether there was one.
-bool ClearDamagedStore(Report &report);
+// For the commands that may begin anew: sets a damaged credential store or web session store aside,
+// and says where it is; blServerLost tells whether the stored server went with it. A store that can
+// neither be used nor set aside fails the command, with the exit code that is returned.
+std::optional<ExitCode> ClearDamagedStores(Report &report, bool &blServerLost);
 
 // A stored value as text: a text itself, anything else as JSON.
 std::string AsText(const Json::Value &value);

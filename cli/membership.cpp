@@ -115,15 +115,6 @@ bool IsStoreReadable() {
     return count >= 0;
 }
 
-bool SetAsideDamagedStore(std::string &strPath) {
-    FixedText<1024> path;
-    if (ZELOCredStoreSetAside(path.Buffer(), FixedText<1024>::Size()) != 1) {
-        return false;
-    }
-    strPath = path.sz();
-    return true;
-}
-
 std::vector<std::string> StoresSetAside() {
     constexpr int kListSize = 1024;
     std::vector<std::string> paths;

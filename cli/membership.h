@@ -63,11 +63,7 @@ class MembershipTurn {
 // look-ups, and nothing in it could be removed.
 bool IsStoreReadable();
 
-// Sets a damaged credential store aside, so that leaving and joining can go on; strPath is where it
-// is now. False when nothing is damaged, or it cannot be set aside.
-bool SetAsideDamagedStore(std::string &strPath);
-
-// Where damaged stores were set aside, now and earlier.
+// Where damaged credential stores were set aside, now and earlier.
 std::vector<std::string> StoresSetAside();
 
 struct LeaveRequest {

@@ -117,7 +117,10 @@ ExitCode Leave(const LeaveRequest &request, Report &report) {
     }
     Report::Stage("looking up the joined server in the credential store");
     const std::optional<JoinedServer> server = FindStoredServer();
-    const bool blDamaged = ClearDamagedStore(report);
+    bool blServerLost = false;
+    if (const auto code = ClearDamagedStores(report, blServerLost)) {
+        return *code;
+    }
     Report::Stage("leaving");
     const bool blJoined = ZELOQRMClientStatus() != 0;
     if (!LeaveWholly(request)) {
@@ -128,7 +131,7 @@ ExitCode Leave(const LeaveRequest &request, Report &report) {
     report.Fact("was_joined", blJoined);
     report.Say(blJoined ? "This appliance has left the server."
                         : "This appliance was not joined; nothing of a join is left.");
-    TellEntry(server, blJoined || blDamaged, report);
+    TellEntry(server, blJoined || blServerLost, report);
     return report.Done();
 }
 

@@ -13,6 +13,9 @@ namespace {
 // Each open connection, idle or not, keeps one of the threads.
 constexpr std::size_t kThreads = 32;
 constexpr time_t kIdleConnection_s = 60;
+// How long a client may be silent in the middle of its handshake or its request, or take nothing of
+// a reply. On a busy machine a process may wait for seconds before it goes on.
+constexpr time_t kSilentClient_s = 60;
 constexpr std::size_t kMaxRequestBody = 16UL << 20U;
 constexpr const char *kAnyPath = "[\\s\\S]*";
 
@@ -61,6 +64,8 @@ void SetUp(httplib::Server &server, const LoopbackListener::Handler &handler) {
     server.set_tcp_nodelay(true);
     server.set_keep_alive_max_count(std::numeric_limits<std::size_t>::max());
     server.set_keep_alive_timeout(kIdleConnection_s);
+    server.set_read_timeout(kSilentClient_s);
+    server.set_write_timeout(kSilentClient_s);
     server.set_payload_max_length(kMaxRequestBody);
     server.new_task_queue = [] { return new httplib::ThreadPool(kThreads); };
     // The library's own choice would share a port with another server instead of failing.

@@ -115,9 +115,9 @@ ZELO_PLATFORM_API int ZELOCredRemoveByID(long id);
 // Looks through the whole store; where it is damaged, renames its file to one in the same folder
 // whose name says when, and never replaces another. The store is empty then.
 //
-// Returns 1 when it was set aside, with the new path in szPath, a buffer of cbPath bytes; 0 when
-// nothing is damaged; a negative value when that could not be found out or done; the operation may
-// be called again then.
+// Returns 1 when it was set aside, 0 when nothing is damaged, a negative value when that could not
+// be found out or done; the operation may be called again then. szPath, a buffer of cbPath bytes,
+// gets the path at which the file is now, moved or not.
 ZELO_PLATFORM_API int ZELOCredStoreSetAside(char *szPath, int cbPath);
 
 // Appends the paths of all files that were set aside and are still there, the oldest first. Returns

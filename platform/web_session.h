@@ -48,6 +48,11 @@ ZELO_PLATFORM_API int ZeloCgiAddSessionByIndex(ZELO_CGI_CONTEXT *pContext, int i
 ZELO_PLATFORM_API int ZeloCgiRemoveSessionByIndex(ZELO_CGI_CONTEXT *pContext, int index,
                                                   const char *szName);
 
+// Sets a damaged store of the sessions aside, by the rules, with the arguments and the results of
+// ZELOCredStoreSetAside (credential_store.h); it needs no context. The store is empty then: who had
+// a session signs in again.
+ZELO_PLATFORM_API int ZeloCgiStoreSetAside(char *szPath, int cbPath);
+
 // Releases what the context holds and fills it with zeros. A context that was never made ready, or
 // was released before, and null are no errors. The sessions stay.
 ZELO_PLATFORM_API void ZeloCgiFree(ZELO_CGI_CONTEXT *pContext);

@@ -65,6 +65,7 @@ bool DevServerProcess::Start(std::string &strReason) {
 Json::Value DevServerProcess::Ask(const std::string &strMethod, const std::string &strPath,
                                   const std::string &strBody) const {
     httplib::Client client("127.0.0.1", m_ports.http);
+    client.set_read_timeout(60);  // a busy machine may keep the server from answering
     httplib::Request request;
     request.method = strMethod;
     request.path = strPath;

@@ -1,6 +1,8 @@
 // qrmctl as its user runs it, against the development server and the box's own store.
 
+#include <fcntl.h>
 #include <gtest/gtest.h>
+#include <unistd.h>
 
 #include <ctime>
 #include <filesystem>
@@ -408,6 +410,71 @@ TEST_F(Qrmctl, ADamagedStoreIsSetAsideByLeavingAndJoiningAlone) {
     EXPECT_TRUE(Holds(strAside, "Z.")) << strAside;
     EXPECT_TRUE(std::filesystem::exists(strAside + "-shm"));
     EXPECT_EQ(RunForJson({"status", "--explain"}, 3)["set_aside"].size(), cAside + cTaken + 2);
+}
+
+TEST_F(Qrmctl, ADamagedWebSessionStoreIsNoDeadEnd) {
+    constexpr const char *kSessions = "/usr/zelo/etc/sessions/sessions.db";
+    const auto read = [](const std::string &strFile) {
+        std::ifstream file(strFile, std::ios::binary);
+        return std::string(std::istreambuf_iterator<char>(file), {});
+    };
+    const auto inSchema = [](const std::string &strFile) { return strFile.find("CREATE TABLE"); };
+    const struct {
+        const char *szDamage;
+        std::function<std::string(std::string)> damage;
+        bool blSetAside;
+    } rows[] = {
+        {"text", [](const std::string &) { return std::string("no database"); }, true},
+        {"cut", [](const std::string &strFile) { return strFile.substr(0, 4000); }, true},
+        {"the schema",
+         [&](std::string strFile) { return strFile.replace(inSchema(strFile), 6, "CREASE"); },
+         true},
+        {"empty", [](const std::string &) { return std::string(); }, false}};
+    const Arguments join = Join("0", s_strHttps);
+    for (const auto &row : rows) {
+        for (const Arguments &mend : {Arguments{"leave"}, join}) {
+            SCOPED_TRACE(row.szDamage + (' ' + mend.front()));
+            ASSERT_EQ(Run(join).status, 0);
+            const std::string strDamaged = row.damage(read(kSessions));
+            Write(kSessions, strDamaged);
+            const Outcome explained = Run({"status", "--explain"});
+            EXPECT_EQ(explained.status, 4);
+            EXPECT_EQ(Holds(explained.strOut, "qrmctl leave, which sets the store aside"),
+                      row.blSetAside)
+                << explained.strOut;
+            EXPECT_EQ(read(kSessions), strDamaged) << "reading leaves it as it is";
+
+            const Json::Value mended = RunForJson(mend, 0);
+            EXPECT_EQ(mended.isMember("sessions_set_aside"), row.blSetAside);
+            const std::string strAside = mended["sessions_set_aside"].asString();
+            EXPECT_EQ(read(strAside), strDamaged);
+            EXPECT_TRUE(Holds(mended["warnings"].toStyledString(), strAside));
+            EXPECT_EQ(Run({"status"}).status, mend == join ? 0 : 3);
+        }
+    }
+
+    // What is no damage stays, and nothing is left or joined.
+    ASSERT_EQ(Run(join).status, 0);
+    const std::string strKept = std::string(kSessions) + ".kept";
+    std::filesystem::rename(kSessions, strKept);
+    std::filesystem::create_directory(kSessions);
+    for (const Arguments &arguments : {Arguments{"leave"}, join}) {
+        const Json::Value failed = RunForJson(arguments, 1);
+        EXPECT_EQ(failed["error_id"], "store-unreadable");
+        EXPECT_TRUE(Holds(failed["error"].asString(), kSessions));
+    }
+    std::filesystem::remove(kSessions);
+    std::filesystem::rename(strKept, kSessions);
+    // SQLite's own locks: no other process may begin to read.
+    struct flock lock = {};
+    lock.l_type = F_WRLCK;
+    lock.l_start = 0x40000000;
+    lock.l_len = 512;
+    const int database = open(kSessions, O_RDWR | O_CLOEXEC);
+    ASSERT_EQ(fcntl(database, F_SETLK, &lock), 0);
+    EXPECT_TRUE(Holds(RunForJson({"leave"}, 1)["error"].asString(), "keeps it locked"));
+    ASSERT_EQ(close(database), 0);
+    EXPECT_EQ(Run({"status"}).status, 0);
 }
 
 TEST_F(Qrmctl, LeavingTellsWhatItCannotUndo) {

@@ -19,9 +19,9 @@
 
 namespace run_program {
 
-// Waits until it is so, for at most 20 s; returns whether it became so.
+// Waits until it is so, for at most 60 s; returns whether it became so.
 inline bool Until(const std::function<bool()> &isSo) {
-    const auto end = std::chrono::steady_clock::now() + std::chrono::seconds(20);
+    const auto end = std::chrono::steady_clock::now() + std::chrono::seconds(60);
     while (!isSo()) {
         if (std::chrono::steady_clock::now() > end) {
             return false;

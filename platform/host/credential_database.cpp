@@ -219,8 +219,8 @@ Result RemoveCredential(long id) {
     return RemoveById(kRemoveCredential, id);
 }
 
-Result SetAsideIfDamaged(std::string &strAside) {
-    return g_database.SetAsideIfDamaged(strAside);
+int SetAsideIfDamaged(char *szPath, int cbPath) {
+    return g_database.SetAsideIfDamaged(szPath, cbPath);
 }
 
 std::vector<std::string> ListSetAside() {

@@ -32,7 +32,7 @@ Result WriteCredential(ZELO_CRED &cred);
 Result RemoveCredential(long id);
 
 // sqlite::Database::SetAsideIfDamaged, and the files that it has set aside, the oldest first.
-Result SetAsideIfDamaged(std::string &strAside);
+int SetAsideIfDamaged(char *szPath, int cbPath);
 std::vector<std::string> ListSetAside();
 
 Result ReadSession(long id, ZELO_CRED_SESS &sess);

@@ -229,18 +229,7 @@ int ZELOCredRemoveByID(long id) {
 }
 
 int ZELOCredStoreSetAside(char *szPath, int cbPath) {
-    if (szPath == nullptr || cbPath <= 0) {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    return NoThrow([&] {
-        std::string strPath;
-        const Result result = database::SetAsideIfDamaged(strPath);
-        if (result != Result::kDone) {
-            return result == Result::kAbsent ? 0 : -1;
-        }
-        static_cast<void>(host::CopyText(strPath, szPath, cbPath));
-        return 1;
-    });
+    return database::SetAsideIfDamaged(szPath, cbPath);
 }
 
 int ZELOCredStoreListSetAside(YLIBSZLIST **ppslPaths) {

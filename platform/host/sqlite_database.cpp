@@ -11,11 +11,13 @@
 #include <atomic>
 #include <cerrno>
 #include <cstring>
+#include <new>
 #include <vector>
 
 #include "file_state.h"
 #include "last_error.h"
 #include "set_aside.h"
+#include "text_buffer.h"
 
 namespace host::sqlite {
 namespace {
@@ -275,7 +277,7 @@ Result Database::CheckWhole() {
     return blWhole ? Result::kDone : Fail(SQLITE_CORRUPT, "", __LINE__);
 }
 
-Result Database::SetAsideIfDamaged(std::string &strAside) {
+Result Database::MoveIfDamaged(std::string &strPath) {
     const Waiting waiting = NameWait(m_store);
     const std::lock_guard<std::mutex> lock(m_mutex);
     struct stat judged = {};
@@ -298,12 +300,26 @@ Result Database::SetAsideIfDamaged(std::string &strAside) {
     if (lstat(m_store.szPath, &now) != 0 || !IsSameFile(now, judged)) {
         return Result::kAbsent;
     }
-    if (!SetAside(m_store.szPath, strAside)) {
+    if (!SetAside(m_store.szPath, strPath)) {
         return FailErrno(__LINE__);
     }
     syslog(LOG_WARNING, "%s:%d %s '%s' was damaged or of another format: it is '%s' now", kFile,
-           __LINE__, m_store.szName, m_store.szPath, strAside.c_str());
+           __LINE__, m_store.szName, m_store.szPath, strPath.c_str());
     return Result::kDone;
+}
+
+int Database::SetAsideIfDamaged(char *szPath, int cbPath) {
+    if (szPath == nullptr || cbPath <= 0) {
+        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
+    }
+    try {
+        std::string strPath = m_store.szPath;
+        const Result result = MoveIfDamaged(strPath);
+        static_cast<void>(CopyText(strPath, szPath, cbPath));
+        return result == Result::kDone ? 1 : result == Result::kAbsent ? 0 : -1;
+    } catch (const std::bad_alloc &) {
+        return HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
+    }
 }
 
 // The count stands in the file's header. It is read on the connection's own descriptor: to close

@@ -61,9 +61,10 @@ class Database {
     Database &operator=(const Database &) = delete;
 
     // Looks through the whole store, and sets its file aside when that is damaged or of another
-    // format (set_aside.h). kDone: strAside is where it is now. kAbsent: nothing is damaged. A
-    // store that cannot be judged, such as a busy one, fails and stays.
-    Result SetAsideIfDamaged(std::string &strAside);
+    // format (set_aside.h). For an operation with C linkage: throws nothing, and returns 1 when it
+    // was set aside, 0 when nothing is damaged, -1 with the last error for a store that cannot be
+    // judged, such as a busy one, or not be moved: it stays. szPath tells where the file is then.
+    int SetAsideIfDamaged(char *szPath, int cbPath);
 
   private:
     friend class Glance;
@@ -79,6 +80,7 @@ class Database {
     Result TightenModes(mode_t fileMode) const;
     Result CheckFormat();
     Result CheckWhole();
+    Result MoveIfDamaged(std::string &strPath);
     Result CreateSchema();
     bool ReadChanges(std::uint32_t &changes) const;
     Result Fail(int sqliteError, const char *szWhat, int line) const;

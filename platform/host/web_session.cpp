@@ -90,6 +90,10 @@ int ZeloCgiRemoveSessionByIndex(ZELO_CGI_CONTEXT *pContext, int index, const cha
     return RunOnSession(pContext, index, szName, kRemove);
 }
 
+int ZeloCgiStoreSetAside(char *szPath, int cbPath) {
+    return g_database.SetAsideIfDamaged(szPath, cbPath);
+}
+
 void ZeloCgiFree(ZELO_CGI_CONTEXT *pContext) {
     if (pContext != nullptr) {
         *pContext = ZELO_CGI_CONTEXT();
