@@ -2,14 +2,17 @@
 
 #include "strings_directory.h"
 
+#include <fcntl.h>
 #include <pthread.h>
 
 #include <algorithm>
+#include <chrono>
 #include <cstddef>
 #include <limits>
 #include <mutex>
 #include <utility>
 
+#include "file_descriptor.h"
 #include "file_state.h"
 
 namespace host::strings_directory {
@@ -31,12 +34,25 @@ struct Place {
     DirectoryHandle pDirectory;
 };
 
+using Clock = std::chrono::steady_clock;
+
+// A look at a name, and the file that it led to, open but not for reading.
+struct Look {
+    std::string strPath;
+    Clock::time_point when;
+    FileDescriptor file;
+    struct stat state = {};
+};
+
+constexpr std::chrono::milliseconds kLookInterval{1};
+
 // Never destroyed, so that it serves until the very end of a process. The lock is never held while
 // a file is read.
 struct Table {
     std::mutex mutex;
     unsigned long uses = 0;
     std::vector<Place> places;
+    std::vector<Look> looks;  // as many at most as places
 };
 
 Table &TheTable() {
@@ -128,6 +144,21 @@ void DropTexts(const Directory &directory, std::size_t cbAdded) {
     texts.erase(texts.begin(), keepFrom);
 }
 
+// The look at the path, or a new one in place of the one that is longest ago.
+Look &LookFor(const char *szPath, std::vector<Look> &looks) {
+    auto look = std::find_if(looks.begin(), looks.end(),
+                             [&](const Look &other) { return other.strPath == szPath; });
+    if (look == looks.end() && looks.size() < kMaxDirectories) {
+        look = looks.insert(looks.end(), Look());
+    } else if (look == looks.end()) {
+        look = std::min_element(looks.begin(), looks.end(),
+                                [](const Look &a, const Look &b) { return a.when < b.when; });
+        *look = Look();
+    }
+    look->strPath = szPath;
+    return *look;
+}
+
 // What is known of the file already.
 std::shared_ptr<Directory> Copy(const Directory &directory) {
     const std::lock_guard<std::mutex> lock(TheTable().mutex);
@@ -143,6 +174,31 @@ std::uint32_t Hash(std::string_view name) {
         hash = (hash ^ static_cast<unsigned char>(c)) * 16777619U;
     }
     return hash;
+}
+
+bool ReadState(const char *szPath, struct stat &state) {
+    Table &table = TheTable();
+    const std::lock_guard<std::mutex> lock(table.mutex);
+    const Clock::time_point now = Clock::now();
+    Look &look = LookFor(szPath, table.looks);
+    // One without a name has been replaced or removed.
+    if (now - look.when < kLookInterval && fstat(look.file.Get(), &state) == 0 &&
+        state.st_nlink > 0) {
+        return true;
+    }
+    look.when = {};
+    if (stat(szPath, &state) != 0 || !S_ISREG(state.st_mode)) {
+        look.file = FileDescriptor();
+        return false;
+    }
+    if (!look.file.IsOpen() || !IsSameFile(look.state, state)) {
+        look.file = FileDescriptor(open(szPath, O_PATH | O_CLOEXEC));
+        if (fstat(look.file.Get(), &look.state) != 0 || !IsSameFile(look.state, state)) {
+            return true;  // it is another one again
+        }
+    }
+    look.when = now;
+    return true;
 }
 
 DirectoryHandle Find(const struct stat &state) {

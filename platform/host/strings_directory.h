@@ -53,6 +53,11 @@ using DirectoryHandle = std::shared_ptr<const Directory>;
 
 std::uint32_t Hash(std::string_view name);
 
+// Reads the state of the file at the path, as far as it is a regular one. Of a file that is asked
+// for again within a millisecond the state is read without looking for its name: that one of the
+// folders above it was replaced shows a millisecond late, all else at once.
+bool ReadState(const char *szPath, struct stat &state);
+
 // The kept directory of the file in the given state; null when there is none.
 DirectoryHandle Find(const struct stat &state);
 

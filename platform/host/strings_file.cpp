@@ -149,7 +149,7 @@ Result Search(const Question &question, const directory::Directory &directory,
 // Answers from what is kept, as long as the file at the path is the one that it came from.
 Result SearchKept(const char *szPath, const Question &question, std::string &strValue) {
     struct stat state = {};
-    if (stat(szPath, &state) != 0) {
+    if (!directory::ReadState(szPath, state)) {
         return Result::kUnread;
     }
     const auto pDirectory = directory::Find(state);
