@@ -56,6 +56,13 @@ struct FreeText {
     void operator()(char *sz) const { curl_free(sz); }
 };
 
+// The headers of an exchange as libcurl takes them.
+struct HeaderList {
+    bool blPost = false;
+    std::vector<std::string> own;  // the request's
+    std::unique_ptr<curl_slist, FreeList> pList;
+};
+
 // A handle with the connections that it keeps. The sockets are known by number, so that a child
 // process can close its copies without a word on the wire.
 struct Connection {
@@ -63,6 +70,7 @@ struct Connection {
     CaState caState;
     bool blNamesProxy = false;  // whether the environment did when the handle was made
     std::array<char, CURL_ERROR_SIZE> reason = {};
+    HeaderList headers;  // of the latest exchange; the next one mostly has the same
     // Goes first: cleaning it up closes its sockets, which calls back to the set above.
     std::unique_ptr<CURL, CleanupEasy> pEasy;
 };
@@ -296,25 +304,35 @@ bool SetWay(const Connection &connection, bool blRelay) {
     return true;
 }
 
-bool AppendHeader(std::unique_ptr<curl_slist, FreeList> &pList, const char *szHeader) {
-    curl_slist *pLonger = curl_slist_append(pList.get(), szHeader);
+bool Append(HeaderList &headers, const char *szHeader) {
+    curl_slist *pLonger = curl_slist_append(headers.pList.get(), szHeader);
     if (pLonger == nullptr) {
         return false;
     }
-    static_cast<void>(pList.release());
-    pList.reset(pLonger);
+    static_cast<void>(headers.pList.release());
+    headers.pList.reset(pLonger);
     return true;
 }
 
-bool BuildHeaders(const HttpRequest &request, std::unique_ptr<curl_slist, FreeList> &pList) {
-    bool blAll = AppendHeader(pList, "Accept: application/json");
+bool BuildHeaders(const HttpRequest &request, HeaderList &headers) {
+    if (headers.pList != nullptr && headers.blPost == request.blPost &&
+        headers.own == request.headers) {
+        return true;
+    }
+    HeaderList built;
+    bool blAll = Append(built, "Accept: application/json");
     if (request.blPost) {
         // No waiting for a "100 Continue" that some servers never send.
-        blAll = blAll && AppendHeader(pList, "Content-Type: application/json") &&
-                AppendHeader(pList, "Expect:");
+        blAll =
+            blAll && Append(built, "Content-Type: application/json") && Append(built, "Expect:");
     }
     for (const std::string &strHeader : request.headers) {
-        blAll = blAll && AppendHeader(pList, strHeader.c_str());
+        blAll = blAll && Append(built, strHeader.c_str());
+    }
+    if (blAll) {
+        built.blPost = request.blPost;
+        built.own = request.headers;
+        headers = std::move(built);
     }
     return blAll;
 }
@@ -413,15 +431,14 @@ int Transact(const HttpRequest &request, Connection &connection, HttpReply &repl
 int Perform(const HttpRequest &request, HttpReply &reply) {
     const Borrowed connection;
     CURL *const pEasy = connection.Easy();
-    std::unique_ptr<curl_slist, FreeList> pHeaders;
-    if (pEasy == nullptr || !BuildHeaders(request, pHeaders)) {
+    if (pEasy == nullptr || !BuildHeaders(request, connection.Get()->headers)) {
         return Fail(ZELO::CRED_REQ_ERR_MEMORY, request, "out of memory", __LINE__);
     }
     if (!SetWay(*connection.Get(), request.blRelay)) {
         return Fail(ZELO::CRED_REQ_ERR_NETWORK, request,
                     "no relay: set farlink_relay=\"host:port\" in /etc/zeloinfo.conf", __LINE__);
     }
-    SetRequest(pEasy, request, pHeaders.get());
+    SetRequest(pEasy, request, connection.Get()->headers.pList.get());
     return Transact(request, *connection.Get(), reply);
 }
 
