@@ -12,7 +12,6 @@
 #include <mutex>
 #include <utility>
 
-#include "file_descriptor.h"
 #include "file_state.h"
 
 namespace host::strings_directory {
@@ -36,12 +35,11 @@ struct Place {
 
 using Clock = std::chrono::steady_clock;
 
-// A look at a name, and the file that it led to, open but not for reading.
+// A look at a name, and the file that it led to.
 struct Look {
     std::string strPath;
     Clock::time_point when;
-    FileDescriptor file;
-    struct stat state = {};
+    OpenFile file;
 };
 
 constexpr std::chrono::milliseconds kLookInterval{1};
@@ -176,50 +174,44 @@ std::uint32_t Hash(std::string_view name) {
     return hash;
 }
 
-bool ReadState(const char *szPath, struct stat &state) {
+std::optional<OpenFile> Open(const char *szPath) {
     Table &table = TheTable();
     const std::lock_guard<std::mutex> lock(table.mutex);
     const Clock::time_point now = Clock::now();
     Look &look = LookFor(szPath, table.looks);
+    OpenFile &file = look.file;
     // One without a name has been replaced or removed.
-    if (now - look.when < kLookInterval && fstat(look.file.Get(), &state) == 0 &&
-        state.st_nlink > 0) {
-        return true;
+    if (now - look.when < kLookInterval && fstat(file.pDescriptor->Get(), &file.state) == 0 &&
+        file.state.st_nlink > 0) {
+        return file;
     }
     look.when = {};
-    if (stat(szPath, &state) != 0 || !S_ISREG(state.st_mode)) {
-        look.file = FileDescriptor();
-        return false;
-    }
-    if (!look.file.IsOpen() || !IsSameFile(look.state, state)) {
-        look.file = FileDescriptor(open(szPath, O_PATH | O_CLOEXEC));
-        if (fstat(look.file.Get(), &look.state) != 0 || !IsSameFile(look.state, state)) {
-            return true;  // it is another one again
+    struct stat named = {};
+    if (file.pDescriptor == nullptr || stat(szPath, &named) != 0 ||
+        !IsSameFile(named, file.state)) {
+        // Should a FIFO stand at the path, its writer is not waited for.
+        file.pDescriptor = std::make_shared<const FileDescriptor>(
+            open(szPath, O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
+        if (fstat(file.pDescriptor->Get(), &named) != 0 || !S_ISREG(named.st_mode)) {
+            file.pDescriptor.reset();
+            return std::nullopt;
         }
     }
+    file.state = named;
     look.when = now;
-    return true;
+    return file;
 }
 
-DirectoryHandle Find(const struct stat &state) {
+DirectoryHandle Get(const struct stat &state) {
     Table &table = TheTable();
-    const std::lock_guard<std::mutex> lock(table.mutex);
-    for (Place &place : table.places) {
-        if (IsUnchanged(place.pDirectory->file, state)) {
-            place.lastUse = ++table.uses;
-            return place.pDirectory;
+    {
+        const std::lock_guard<std::mutex> lock(table.mutex);
+        for (Place &place : table.places) {
+            if (IsUnchanged(place.pDirectory->file, state)) {
+                place.lastUse = ++table.uses;
+                return place.pDirectory;
+            }
         }
-    }
-    return nullptr;
-}
-
-DirectoryHandle Get(int fd) {
-    struct stat state = {};
-    if (fstat(fd, &state) != 0 || !S_ISREG(state.st_mode)) {
-        return nullptr;
-    }
-    if (auto pKept = Find(state)) {
-        return pKept;
     }
     const auto pDirectory = std::make_shared<Directory>();
     pDirectory->file = state;

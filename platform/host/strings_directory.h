@@ -14,10 +14,12 @@
 #include <cstddef>
 #include <cstdint>
 #include <memory>
+#include <optional>
 #include <string>
 #include <string_view>
 #include <vector>
 
+#include "file_descriptor.h"
 #include "line_blocks.h"
 #include "strings_text.h"
 
@@ -53,17 +55,20 @@ using DirectoryHandle = std::shared_ptr<const Directory>;
 
 std::uint32_t Hash(std::string_view name);
 
-// Reads the state of the file at the path, as far as it is a regular one. Of a file that is asked
+// A regular file that is open for reading, and the state that it is in.
+struct OpenFile {
+    std::shared_ptr<const FileDescriptor> pDescriptor;
+    struct stat state = {};
+};
+
+// Opens the file at the path, or takes the descriptor that is kept of it. Of a file that is asked
 // for again within a millisecond the state is read without looking for its name: that one of the
-// folders above it was replaced shows a millisecond late, all else at once.
-bool ReadState(const char *szPath, struct stat &state);
+// folders above it was replaced shows a millisecond late, all else at once. Nothing when there is
+// no regular file that can be read.
+std::optional<OpenFile> Open(const char *szPath);
 
-// The kept directory of the file in the given state; null when there is none.
-DirectoryHandle Find(const struct stat &state);
-
-// The directory of the file as it is now: the kept one, or one that is still empty. Null when it is
-// no regular file.
-DirectoryHandle Get(int fd);
+// The directory of the file in the state: the kept one, or one that is still empty.
+DirectoryHandle Get(const struct stat &state);
 
 // The directory with the next section of the name, and those before it; with all sections, or as
 // many as fit, when there is none. Null when the file changed meanwhile or cannot be read so far.

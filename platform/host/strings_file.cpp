@@ -2,7 +2,6 @@
 
 #include "../strings_file.h"
 
-#include <fcntl.h>
 #include <sys/stat.h>
 
 #include <new>
@@ -11,7 +10,6 @@
 #include <string_view>
 #include <utility>
 
-#include "file_descriptor.h"
 #include "last_error.h"
 #include "line_blocks.h"
 #include "strings_directory.h"
@@ -31,13 +29,13 @@ namespace text = host::strings_text;
 enum class Result {
     kFound,
     kAbsent,
-    kUnread,  // the file has to be opened to know
+    kUnread,  // the file cannot be read
     kBeyond,  // the directory does not reach so far yet
     kChanged  // the file is not what the directory describes
 };
 
 struct Question {
-    int fd;  // negative: the file is not open
+    int fd;
     std::string_view section;
     std::string_view key;
 };
@@ -93,9 +91,6 @@ Result SearchSection(const Question &question, const directory::Directory &direc
         const Result result = CheckSection(*pText, question);
         return result == Result::kFound ? SearchLines(*pText, question, strValue) : result;
     }
-    if (question.fd < 0) {
-        return Result::kUnread;
-    }
     const off_t end = index + 1 < entries.size() ? entries[index + 1].begin : directory.end;
     const auto keep = [&](std::string_view lines) { directory::KeepText(directory, index, lines); };
     return SearchPart(question, entries[index].begin, end, keep, strValue);
@@ -139,54 +134,38 @@ Result Search(const Question &question, const directory::Directory &directory,
     if (directory.end == directory.file.st_size) {
         return Result::kAbsent;
     }
-    if (!directory.blFull) {
-        return Result::kBeyond;
-    }
-    return question.fd < 0 ? Result::kUnread
-                           : SearchRest(question, directory.end, directory.file.st_size, strValue);
+    return directory.blFull ? SearchRest(question, directory.end, directory.file.st_size, strValue)
+                            : Result::kBeyond;
 }
 
-// Answers from what is kept, as long as the file at the path is the one that it came from.
-Result SearchKept(const char *szPath, const Question &question, std::string &strValue) {
-    struct stat state = {};
-    if (!directory::ReadState(szPath, state)) {
-        return Result::kUnread;
+// Answers from the file's directory, which grows as far as it has to.
+Result SearchFile(const Question &question, const struct stat &state, std::string &strValue) {
+    auto pDirectory = directory::Get(state);
+    Result result = Result::kBeyond;
+    while (pDirectory != nullptr &&
+           (result = Search(question, *pDirectory, strValue)) == Result::kBeyond) {
+        pDirectory = directory::Extend(question.fd, *pDirectory, question.section);
     }
-    const auto pDirectory = directory::Find(state);
-    return pDirectory == nullptr ? Result::kUnread : Search(question, *pDirectory, strValue);
+    if (pDirectory != nullptr && result == Result::kChanged) {
+        directory::Forget(*pDirectory);
+    }
+    return pDirectory == nullptr ? Result::kChanged : result;
 }
 
-Result SearchFile(const Question &question, std::string &strValue) {
+Result Read(const char *szPath, std::string_view section, std::string_view key,
+            std::string &strValue) {
     for (int attempt = 0; attempt < kAttempts; ++attempt) {
-        auto pDirectory = directory::Get(question.fd);
-        Result result = Result::kBeyond;
-        while (pDirectory != nullptr &&
-               (result = Search(question, *pDirectory, strValue)) == Result::kBeyond) {
-            pDirectory = directory::Extend(question.fd, *pDirectory, question.section);
+        const auto file = directory::Open(szPath);
+        if (!file) {
+            return Result::kUnread;
         }
-        if (pDirectory == nullptr) {
-            continue;
-        }
+        const Result result =
+            SearchFile({file->pDescriptor->Get(), section, key}, file->state, strValue);
         if (result != Result::kChanged) {
             return result;
         }
-        directory::Forget(*pDirectory);
     }
     return Result::kUnread;
-}
-
-Result Read(const char *szPath, Question question, std::string &strValue) {
-    const Result result = SearchKept(szPath, question, strValue);
-    if (result == Result::kFound || result == Result::kAbsent) {
-        return result;
-    }
-    // Should a FIFO stand at the path, its writer is not waited for.
-    const host::FileDescriptor file(open(szPath, O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
-    if (!file.IsOpen()) {
-        return Result::kUnread;
-    }
-    question.fd = file.Get();
-    return SearchFile(question, strValue);
 }
 
 }  // namespace
@@ -199,7 +178,7 @@ int YLIBCFileGetSectionValue(const char *szPath, const char *szSection, const ch
     }
     try {
         std::string strValue;
-        switch (Read(szPath, {-1, szSection, szKey}, strValue)) {
+        switch (Read(szPath, szSection, szKey, strValue)) {
             case Result::kFound:
                 return host::CopyWholeCharacters(strValue, szValue, cbValue);
             case Result::kAbsent:
