@@ -2,15 +2,19 @@
 
 #include "../key_value_file.h"
 
+#include <fcntl.h>
+
 #include <mutex>
 #include <new>
 #include <string_view>
+#include <utility>
 #include <vector>
 
 #include "../file_lock.h"
 #include "file_replacement.h"
 #include "file_state.h"
 #include "hash_place.h"
+#include "kept_file.h"
 #include "key_value_lookup.h"
 #include "last_error.h"
 #include "text_buffer.h"
@@ -159,11 +163,14 @@ struct OldFile {
 bool ReadForChange(const char *szPath, OldFile &old) {
     const host::Find find = host::FindFile(szPath, old.found);
     old.blSettled = host::IsSettled(old.found.status);
-    const bool blRead = find == host::Find::kNoFile ||
-                        (find == host::Find::kFile && host::ReadContent(old.found, old.strText));
+    return find == host::Find::kNoFile ||
+           (find == host::Find::kFile && host::ReadContent(old.found, old.strText));
+}
+
+int Replace(OldFile &old, const std::string &strNew) {
     // A file system takes longer to replace a file that is still open.
     old.found.file = host::FileDescriptor();
-    return blRead;
+    return host::ReplaceFile(old.found, strNew);
 }
 
 // The pair that was to be set last and was found in place. What is reported over and over, such as
@@ -176,6 +183,7 @@ struct StandingPair {
     std::string strKey;
     std::string strValue;
     struct stat status = {};
+    host::KeptFile file;
 };
 
 StandingPair &TheStandingPair() {
@@ -184,26 +192,35 @@ StandingPair &TheStandingPair() {
 }
 
 bool IsStanding(const char *szPath, std::string_view key, std::string_view value) {
-    const StandingPair &pair = TheStandingPair();
+    StandingPair &pair = TheStandingPair();
+    const std::unique_lock<std::mutex> lock(pair.mutex, std::try_to_lock);
+    if (!lock.owns_lock() || pair.strPath != szPath) {
+        return false;
+    }
     struct stat status = {};
-    const std::unique_lock<std::mutex> lock(TheStandingPair().mutex, std::try_to_lock);
-    return lock.owns_lock() && pair.strPath == szPath && pair.strKey == key &&
-           pair.strValue == value && lstat(szPath, &status) == 0 &&
-           host::IsUnchanged(status, pair.status);
+    if (pair.strKey == key && pair.strValue == value &&
+        pair.file.Holds(szPath, AT_SYMLINK_NOFOLLOW, status) &&
+        host::IsUnchanged(status, pair.status)) {
+        return true;
+    }
+    // A file system takes longer to replace a file that is still open.
+    pair.file.Drop();
+    return false;
 }
 
 void RememberStanding(const char *szPath, std::string_view key, std::string_view value,
-                      const OldFile &old) {
+                      OldFile &old) {
     StandingPair &pair = TheStandingPair();
     const std::unique_lock<std::mutex> lock(pair.mutex, std::try_to_lock);
     if (!lock.owns_lock() || !old.blSettled || !host::IsOwnFile(old.found.status)) {
         return;
     }
-    pair.strPath.clear();  // for as long as the rest is not whole
+    pair.file.Drop();  // for as long as the rest is not whole
+    pair.strPath = szPath;
     pair.strKey = key;
     pair.strValue = value;
     pair.status = old.found.status;
-    pair.strPath = szPath;
+    pair.file.Keep(std::move(old.found.file), old.found.status);
 }
 
 int SetValue(const char *szPath, std::string_view key, std::string_view value) {
@@ -232,7 +249,7 @@ int SetValue(const char *szPath, std::string_view key, std::string_view value) {
     }
     AppendLine(strNew, key, value);
     strNew.append(rest);
-    return host::ReplaceFile(old.found, strNew);
+    return Replace(old, strNew);
 }
 
 int RemoveLines(const char *szPath, std::string_view key) {
@@ -250,7 +267,7 @@ int RemoveLines(const char *szPath, std::string_view key) {
         kept = rest;
     }
     strNew.append(kept);
-    return strNew.size() == old.strText.size() ? 0 : host::ReplaceFile(old.found, strNew);
+    return strNew.size() == old.strText.size() ? 0 : Replace(old, strNew);
 }
 
 int ReadPairs(const char *szPath, YLIBSZHASH **ppHash) {

@@ -6,13 +6,13 @@
 #include <pthread.h>
 
 #include <algorithm>
-#include <chrono>
 #include <cstddef>
 #include <limits>
 #include <mutex>
 #include <utility>
 
 #include "file_state.h"
+#include "kept_file.h"
 
 namespace host::strings_directory {
 namespace {
@@ -33,16 +33,11 @@ struct Place {
     DirectoryHandle pDirectory;
 };
 
-using Clock = std::chrono::steady_clock;
-
-// A look at a name, and the file that it led to.
-struct Look {
+struct KeptStrings {
+    unsigned long lastUse = 0;
     std::string strPath;
-    Clock::time_point when;
-    OpenFile file;
+    KeptFile file;
 };
-
-constexpr std::chrono::milliseconds kLookInterval{1};
 
 // Never destroyed, so that it serves until the very end of a process. The lock is never held while
 // a file is read.
@@ -50,7 +45,7 @@ struct Table {
     std::mutex mutex;
     unsigned long uses = 0;
     std::vector<Place> places;
-    std::vector<Look> looks;  // as many at most as places
+    std::vector<KeptStrings> files;  // as many at most as places
 };
 
 Table &TheTable() {
@@ -142,19 +137,20 @@ void DropTexts(const Directory &directory, std::size_t cbAdded) {
     texts.erase(texts.begin(), keepFrom);
 }
 
-// The look at the path, or a new one in place of the one that is longest ago.
-Look &LookFor(const char *szPath, std::vector<Look> &looks) {
-    auto look = std::find_if(looks.begin(), looks.end(),
-                             [&](const Look &other) { return other.strPath == szPath; });
-    if (look == looks.end() && looks.size() < kMaxDirectories) {
-        look = looks.insert(looks.end(), Look());
-    } else if (look == looks.end()) {
-        look = std::min_element(looks.begin(), looks.end(),
-                                [](const Look &a, const Look &b) { return a.when < b.when; });
-        *look = Look();
+// What is kept for the path, or a new place for it, of the one used least recently.
+KeptStrings &PlaceFor(const char *szPath, std::vector<KeptStrings> &files) {
+    auto kept = std::find_if(files.begin(), files.end(),
+                             [&](const KeptStrings &other) { return other.strPath == szPath; });
+    if (kept == files.end() && files.size() < kMaxDirectories) {
+        kept = files.insert(files.end(), KeptStrings());
+    } else if (kept == files.end()) {
+        kept = std::min_element(
+            files.begin(), files.end(),
+            [](const KeptStrings &a, const KeptStrings &b) { return a.lastUse < b.lastUse; });
+        kept->file.Drop();
     }
-    look->strPath = szPath;
-    return *look;
+    kept->strPath = szPath;
+    return *kept;
 }
 
 // What is known of the file already.
@@ -177,29 +173,20 @@ std::uint32_t Hash(std::string_view name) {
 std::optional<OpenFile> Open(const char *szPath) {
     Table &table = TheTable();
     const std::lock_guard<std::mutex> lock(table.mutex);
-    const Clock::time_point now = Clock::now();
-    Look &look = LookFor(szPath, table.looks);
-    OpenFile &file = look.file;
-    // One without a name has been replaced or removed.
-    if (now - look.when < kLookInterval && fstat(file.pDescriptor->Get(), &file.state) == 0 &&
-        file.state.st_nlink > 0) {
-        return file;
+    KeptStrings &kept = PlaceFor(szPath, table.files);
+    kept.lastUse = ++table.uses;
+    struct stat state = {};
+    if (kept.file.Holds(szPath, 0, state)) {
+        return OpenFile{kept.file.Descriptor(), state};
     }
-    look.when = {};
-    struct stat named = {};
-    if (file.pDescriptor == nullptr || stat(szPath, &named) != 0 ||
-        !IsSameFile(named, file.state)) {
-        // Should a FIFO stand at the path, its writer is not waited for.
-        file.pDescriptor = std::make_shared<const FileDescriptor>(
-            open(szPath, O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
-        if (fstat(file.pDescriptor->Get(), &named) != 0 || !S_ISREG(named.st_mode)) {
-            file.pDescriptor.reset();
-            return std::nullopt;
-        }
+    kept.file.Drop();
+    // Should a FIFO stand at the path, its writer is not waited for.
+    FileDescriptor file(open(szPath, O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
+    if (fstat(file.Get(), &state) != 0 || !S_ISREG(state.st_mode)) {
+        return std::nullopt;
     }
-    file.state = named;
-    look.when = now;
-    return file;
+    kept.file.Keep(std::move(file), state);
+    return OpenFile{kept.file.Descriptor(), state};
 }
 
 DirectoryHandle Get(const struct stat &state) {
