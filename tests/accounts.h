@@ -3,19 +3,16 @@
 #ifndef ZELO_TESTS_ACCOUNTS_H
 #define ZELO_TESTS_ACCOUNTS_H
 
-#include <sys/stat.h>
-
 #include <cstdlib>
 #include <cstring>
 #include <filesystem>
-#include <fstream>
 #include <map>
 #include <memory>
-#include <sstream>
 #include <string>
 #include <utility>
 #include <vector>
 
+#include "files.h"
 #include "user_group.h"
 
 namespace accounts {
@@ -25,18 +22,12 @@ using Names = std::vector<std::string>;
 using User = std::unique_ptr<ZELO_USER, decltype(&ZELOUserFree)>;
 using Group = std::unique_ptr<ZELO_GROUP, decltype(&ZELOGroupFree)>;
 
-inline std::string Content(const std::string &strPath) {
-    std::ostringstream text;
-    text << std::ifstream(strPath, std::ios::binary).rdbuf();
-    return text.str();
-}
-
 // The account files that there are.
 inline Files ReadFiles() {
     Files files;
     for (const char *szName : {"passwd", "shadow", "group", "gshadow"}) {
         if (std::filesystem::exists(std::string("/etc/") + szName)) {
-            files[szName] = Content(std::string("/etc/") + szName);
+            files[szName] = files::FileText(std::string("/etc/") + szName);
         }
     }
     return files;
@@ -47,19 +38,14 @@ inline void WriteFiles(const Files &files) {
         std::filesystem::remove(std::string("/etc/") + szName);
     }
     for (const auto &[strName, strContent] : files) {
-        std::ofstream("/etc/" + strName, std::ios::binary) << strContent;
+        files::WriteFile("/etc/" + strName, strContent);
     }
-}
-
-inline unsigned Mode(const std::string &strPath) {
-    struct stat status = {};
-    return stat(strPath.c_str(), &status) == 0 ? status.st_mode & 07777U : 0;
 }
 
 // What the system's own checks of the account files have to say.
 inline std::string Findings() {
     const int status = std::system("{ pwck -r && grpck -r; } >/tmp/findings 2>&1");
-    return Content("/tmp/findings") + (status == 0 ? "" : "failed");
+    return files::FileText("/tmp/findings") + (status == 0 ? "" : "failed");
 }
 
 inline int Add(const User &pUser) {

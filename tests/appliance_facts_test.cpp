@@ -65,18 +65,4 @@ TEST(HostName, IsCutToItsBuffer) {
     EXPECT_EQ(status, 0);
 }
 
-TEST(ClientDescription, AnUnreadableFactChangesNothing) {
-    Write("/etc.defaults/VERSION", "majorversion=6\nbuildnumber=1\n");
-    Json::Value description;
-    EXPECT_FALSE(client_description::ReadVersion(description));
-    EXPECT_TRUE(description.isNull());
-    Write("/etc/zeloinfo.conf", "admin_port=80x\nsecure_admin_port=x\nrunHTTPS=\"Yes\"\n");
-    long port = -1;
-    EXPECT_TRUE(client_description::ReadAdminPort(port));
-    EXPECT_EQ(port, 80);
-    EXPECT_TRUE(client_description::ReadSecureAdminPort(port));
-    EXPECT_EQ(port, 0);
-    EXPECT_FALSE(client_description::IsHttpsServed());
-}
-
 }  // namespace

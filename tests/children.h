@@ -6,8 +6,10 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <csignal>
 #include <functional>
+#include <vector>
 
 namespace children {
 
@@ -27,9 +29,26 @@ inline bool Ended(pid_t pid) {
     return WIFEXITED(status) && WEXITSTATUS(status) == 0;
 }
 
-inline void Kill(pid_t pid) {
+// Runs the body in a process of its own.
+inline bool InOne(const std::function<bool()> &body) {
+    return Ended(Start(body));
+}
+
+// Runs the body in so many processes at once, each with its number. True when it was in all.
+inline bool InEach(int processes, const std::function<bool(int process)> &body) {
+    std::vector<pid_t> pids(static_cast<std::size_t>(processes));
+    for (int process = 0; process < processes; ++process) {
+        pids[static_cast<std::size_t>(process)] = Start([&] { return body(process); });
+    }
+    return std::count_if(pids.begin(), pids.end(), Ended) == processes;
+}
+
+// False for one that had ended by itself.
+inline bool Kill(pid_t pid) {
     kill(pid, SIGKILL);
-    waitpid(pid, nullptr, 0);
+    int status = 0;
+    waitpid(pid, &status, 0);
+    return WIFSIGNALED(status);
 }
 
 // With this one process tells another that it has come to a point.

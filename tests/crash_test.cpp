@@ -9,8 +9,6 @@
 #include "membership_state.h"
 #include "zeloqrmclient.h"
 
-DevServerProcess *joined::Joined::s_pServer = nullptr;
-
 namespace {
 
 using Arguments = std::vector<std::string>;
@@ -86,10 +84,8 @@ class Crash : public joined::Joined {
         return strAll;
     }
 
-    static accounts::Files s_without;
+    inline static accounts::Files s_without;
 };
-
-accounts::Files Crash::s_without;
 
 TEST_F(Crash, OneLeaveClearsAwayAJoinThatWasKilledAnywhere) {
     const Arguments join = {"join",

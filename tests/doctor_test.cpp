@@ -13,6 +13,7 @@
 #include <map>
 
 #include "dev_server.h"
+#include "files.h"
 #include "json_text.h"
 #include "run_program.h"
 #include "stored.h"
@@ -20,6 +21,8 @@
 namespace {
 
 namespace fs = std::filesystem;
+using files::FileText;
+using files::Holds;
 using run_program::Outcome;
 using Arguments = std::vector<std::string>;
 using devserver::kDay;
@@ -40,15 +43,6 @@ void Write(const std::string &strFile, const std::string &strText) {
     std::ofstream(strFile) << strText;
 }
 
-std::string Read(const std::string &strFile) {
-    std::ifstream file(strFile, std::ios::binary);
-    return {std::istreambuf_iterator<char>(file), std::istreambuf_iterator<char>()};
-}
-
-bool Holds(const std::string &strText, const std::string &strPart) {
-    return strText.find(strPart) != std::string::npos;
-}
-
 // A moment as a Date header has it.
 std::string HttpDate(std::time_t time) {
     char sz[64] = {};
@@ -65,7 +59,7 @@ std::map<std::string, std::string> Everything() {
         const bool blFile = S_ISREG(status.st_mode);
         files[path] = std::to_string(status.st_mode) +
                       (blFile ? ' ' + std::to_string(status.st_mtim.tv_sec) + '.' +
-                                    std::to_string(status.st_mtim.tv_nsec) + ' ' + Read(path)
+                                    std::to_string(status.st_mtim.tv_nsec) + ' ' + FileText(path)
                               : "");
     };
     for (const char *szFolder : {"/etc", "/tmp"}) {
@@ -349,7 +343,7 @@ class Support : public Doctor {
                   0);
     }
     static std::string Unpacked(const std::string &strName) {
-        return Read("/tmp/unpacked/qrmctl-support/" + strName);
+        return FileText("/tmp/unpacked/qrmctl-support/" + strName);
     }
 };
 
@@ -396,7 +390,7 @@ TEST_F(Support, NoSecretLeavesTheAppliance) {
     std::string strAll =
         run_program::Run({"/bin/gzip", "-dc", "/tmp/folder/archive"}).strOut + outcome.strOut;
     for (const auto &entry : fs::directory_iterator("/tmp/unpacked/qrmctl-support")) {
-        strAll += Read(entry.path());
+        strAll += FileText(entry.path());
     }
     for (const std::string &strSecret : secrets) {
         EXPECT_FALSE(Holds(strAll, strSecret)) << strSecret;
@@ -504,7 +498,7 @@ TEST_F(Support, WhatMayHoldUnknownTokensIsLeftOut) {
 TEST_F(Support, AnArchiveReplacesAFileOnlyWhenTold) {
     Write("/tmp/folder/archive", "mine");
     EXPECT_TRUE(Holds(Run().strErr, "--force"));
-    EXPECT_EQ(Read("/tmp/folder/archive"), "mine");
+    EXPECT_EQ(FileText("/tmp/folder/archive"), "mine");
     EXPECT_EQ(Run({"--force"}).status, 0);
     Unpack();
     EXPECT_NE(Unpacked("README.txt"), "");

@@ -4,13 +4,13 @@
 #define ZELO_TESTS_JOINED_H
 
 #include <gtest/gtest.h>
-#include <sys/stat.h>
 
 #include <filesystem>
 #include <fstream>
 #include <string>
 
 #include "dev_server_process.h"
+#include "files.h"
 #include "seam.h"
 #include "stored.h"
 
@@ -22,30 +22,19 @@ constexpr const char *kInfoFile = "/tmp/qrm_client.info";
 constexpr const char *kJournal = "/var/log/notifications.jsonl";
 constexpr const char *kCaFile = "/usr/zelo/etc/ssl/ca.d/server.pem";
 
-inline std::string FileText(const std::string &strPath) {
-    std::ifstream file(strPath);
-    return {std::istreambuf_iterator<char>(file), std::istreambuf_iterator<char>()};
-}
+using files::FileText;
+using seam::Messages;
 
 inline int CountLines(const std::string &strPath) {
-    const std::string strText = FileText(strPath);
-    return static_cast<int>(std::count(strText.begin(), strText.end(), '\n'));
-}
-
-// All messages of an outcome, one line each.
-inline std::string Messages(const seam::Outcome &outcome) {
-    std::string strAll;
-    for (const seam::LogLine &log : outcome.logs) {
-        strAll += (strAll.empty() ? "" : "\n") + log.strMessage;
-    }
-    return strAll;
+    return static_cast<int>(files::FileLines(strPath).size());
 }
 
 class Joined : public testing::Test {
   protected:
-    static void SetUpTestSuite() {
+    static void SetUpTestSuite() { Serve(kToken); }
+    static void Serve(const char *szToken) {
         devserver::Options options;
-        options.token = kToken;
+        options.token = szToken;
         s_pServer = new DevServerProcess(options);
         std::string strReason;
         ASSERT_TRUE(s_pServer->Start(strReason)) << strReason;
@@ -75,6 +64,16 @@ class Joined : public testing::Test {
         stored::AddSession(id, kToken, "csrf-9876543210");
     }
 
+    // What the server answers to the next request; any one of the API for the method "".
+    static void Answer(const char *szApi, const char *szMethod, const std::string &strBody,
+                       int status = 200) {
+        devserver::NextAnswer answer;
+        answer.method = szMethod;
+        answer.status = status;
+        answer.body = strBody;
+        s_pServer->AnswerNext(szApi, answer);
+    }
+
     // Such as "status=success marker=no notified=0".
     static std::string State() {
         const std::string strInfo = FileText(kInfoFile);
@@ -87,7 +86,7 @@ class Joined : public testing::Test {
                " notified=" + std::to_string(CountLines(kJournal));
     }
 
-    static DevServerProcess *s_pServer;
+    inline static DevServerProcess *s_pServer = nullptr;
 };
 
 }  // namespace joined

@@ -7,15 +7,13 @@
 #include <sys/stat.h>
 #include <sys/syscall.h>
 
-#include <algorithm>
 #include <atomic>
 #include <chrono>
 #include <filesystem>
-#include <fstream>
 #include <set>
-#include <sstream>
 
 #include "children.h"
+#include "files.h"
 #include "last_error.h"
 
 namespace {
@@ -32,6 +30,9 @@ namespace {
 
 namespace fs = std::filesystem;
 using Set = std::set<std::string>;
+using files::FileLines;
+using files::FileText;
+using files::WriteFile;
 using std::string_literals::operator""s;
 
 constexpr const char *kFolder = "/tmp/shared";
@@ -48,16 +49,6 @@ class KeyValueFile : public testing::Test {
         chmod(kFolder, 01777);
     }
 };
-
-void Write(const std::string &strPath, const std::string &strText) {
-    std::ofstream(strPath, std::ios::binary) << strText;
-}
-
-std::string Content(const std::string &strPath) {
-    std::ostringstream text;
-    text << std::ifstream(strPath, std::ios::binary).rdbuf();
-    return text.str();
-}
 
 Set Names(const char *szFolder) {
     Set names;
@@ -86,48 +77,35 @@ int SetValue(const char *szPath, const std::string &strKey, const std::string &s
 // Sets keys in so many processes at once; false when one of them has failed.
 bool SetInProcesses(int processes, int keys,
                     const std::function<bool(const std::string &strKey)> &set) {
-    std::set<pid_t> pids;
-    for (int process = 0; process < processes; ++process) {
-        pids.insert(children::Start([&, process] {
-            bool blAll = true;
-            for (int i = 0; i < keys; ++i) {
-                blAll = set(std::to_string(process) + '.' + std::to_string(i)) && blAll;
-            }
-            return blAll;
-        }));
-    }
-    return std::count_if(pids.begin(), pids.end(), children::Ended) == processes;
-}
-
-Set Lines(const char *szPath) {
-    Set lines;
-    std::istringstream text(Content(szPath));
-    for (std::string strLine; std::getline(text, strLine);) {
-        lines.insert(strLine);
-    }
-    return lines;
+    return children::InEach(processes, [&](int process) {
+        bool blAll = true;
+        for (int i = 0; i < keys; ++i) {
+            blAll = set(std::to_string(process) + '.' + std::to_string(i)) && blAll;
+        }
+        return blAll;
+    });
 }
 
 TEST_F(KeyValueFile, ReadsEveryFormOfALine) {
     const std::string strLong(60000, 'v');
-    Write(kFile,
-          "# plain=comment\n"
-          "  #blank=comment\n"
-          "plain=value one\n"
-          "quoted=\"value two\"\r\n"
-          " spaced = \t\"three\"  \n"
-          "escaped=\"a \\\"b\\\" \\\\ c\"\n"
-          "empty=\n"
-          "emptyquoted=\"\"\n"
-          "no line\n"
-          "=no key\n"
-          "open=\"never closed\n"
-          "equals=a=b\n"
-          "zero=a\0b\n"
-          "zero\0=c\n"
-          "plain=second\n"
-          "long="s +
-              strLong + "\nlast=no line feed");
+    WriteFile(kFile,
+              "# plain=comment\n"
+              "  #blank=comment\n"
+              "plain=value one\n"
+              "quoted=\"value two\"\r\n"
+              " spaced = \t\"three\"  \n"
+              "escaped=\"a \\\"b\\\" \\\\ c\"\n"
+              "empty=\n"
+              "emptyquoted=\"\"\n"
+              "no line\n"
+              "=no key\n"
+              "open=\"never closed\n"
+              "equals=a=b\n"
+              "zero=a\0b\n"
+              "zero\0=c\n"
+              "plain=second\n"
+              "long="s +
+                  strLong + "\nlast=no line feed");
     const struct {
         const char *szKey;
         std::string strValue;
@@ -157,7 +135,7 @@ TEST_F(KeyValueFile, ReadsEveryFormOfALine) {
 }
 
 TEST_F(KeyValueFile, GivesAllPairsInOrderAndOfAKeyTheFirst) {
-    Write(kFile, "b=1\n#c=2\njunk\n a = \"x \\\" y\" \nb=3\nold=new\nempty=\n=4\n");
+    WriteFile(kFile, "b=1\n#c=2\njunk\n a = \"x \\\" y\" \nb=3\nold=new\nempty=\n=4\n");
     YLIBSZHASH *pHash = YLIBCSzHashAlloc(16);
     YLIBCSzHashSetValue(&pHash, "old", "old");
     YLIBCSzHashSetValue(&pHash, "own", "stays");
@@ -174,7 +152,7 @@ TEST_F(KeyValueFile, GivesAllPairsInOrderAndOfAKeyTheFirst) {
 }
 
 TEST_F(KeyValueFile, CutsAndRefuses) {
-    Write(kFile, "key=0123456789\n");
+    WriteFile(kFile, "key=0123456789\n");
     char sz[5] = "xxxx";
     EXPECT_EQ(YLIBCFileGetKeyValue(kFile, "key", sz, sizeof(sz), 0), 4);
     EXPECT_STREQ(sz, "0123");
@@ -190,7 +168,7 @@ TEST_F(KeyValueFile, CutsAndRefuses) {
 }
 
 TEST_F(KeyValueFile, ValuesComeBackAsTheyWentIn) {
-    Write(kFile, "odd=first\nother=stays\n");
+    WriteFile(kFile, "odd=first\nother=stays\n");
     for (const std::string &strValue :
          {"plain"s, ""s, " blanks at both ends\t"s, "\"quoted\""s, "\""s, "\\"s, "ends in \\"s,
           "a\\\"b\\\\\"c"s, "# no comment"s, "a=b"s, "\x01\x7f\xff"s, std::string(50000, '"')}) {
@@ -203,7 +181,7 @@ TEST_F(KeyValueFile, ValuesComeBackAsTheyWentIn) {
 }
 
 TEST_F(KeyValueFile, WhatTheFormatCannotHoldIsRefused) {
-    Write(kFile, "key=value\n");
+    WriteFile(kFile, "key=value\n");
     const std::pair<const char *, const char *> rows[] = {
         {"key", "a\nother=b"}, {"key", "a\r"}, {"k\ney", "a"},  {"key\n", "a"},
         {"ke=y", "a"},         {"", "a"},      {"#key", "a"},   {" key", "a"},
@@ -216,7 +194,7 @@ TEST_F(KeyValueFile, WhatTheFormatCannotHoldIsRefused) {
             EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_INVALID_ARGUMENT));
         }
     }
-    EXPECT_EQ(Content(kFile), "key=value\n");
+    EXPECT_EQ(FileText(kFile), "key=value\n");
     EXPECT_EQ(Names("/etc"), namesBefore);
 }
 
@@ -238,12 +216,12 @@ TEST_F(KeyValueFile, AChangeLeavesAllOtherLinesAndTheModeAsTheyWere) {
     const mode_t umaskBefore = umask(077);
     for (const auto &row : rows) {
         for (mode_t mode : {0644U, 0600U, 0666U, 0640U}) {
-            Write(kFile, row.strBefore);
+            WriteFile(kFile, row.strBefore);
             chmod(kFile, mode);
             EXPECT_EQ(row.szValue == nullptr ? YLIBCFileRemoveKey(kFile, "k")
                                              : SetValue(kFile, "k", row.szValue),
                       0);
-            EXPECT_EQ(Content(kFile), row.strAfter);
+            EXPECT_EQ(FileText(kFile), row.strAfter);
             EXPECT_EQ(Status(kFile).st_mode & 07777U, mode);
         }
     }
@@ -274,13 +252,13 @@ TEST_F(KeyValueFile, APairThatSomebodyElseHasChangedIsWrittenAgain) {
         {"overwritten, with the old size and time",
          [] {
              const struct stat before = Status(kFile);
-             Write(kFile, "k=\"b\"\n");
+             WriteFile(kFile, "k=\"b\"\n");
              const timespec times[] = {before.st_atim, before.st_mtim};
              utimensat(AT_FDCWD, kFile, times, 0);
          }},
         {"replaced",
          [] {
-             Write(kTemporary, "k=\"b\"\n");
+             WriteFile(kTemporary, "k=\"b\"\n");
              fs::rename(kTemporary, kFile);
          }},
         {"removed", [] { fs::remove(kFile); }},
@@ -309,7 +287,7 @@ TEST_F(KeyValueFile, InASharedFolderTrapsAreLeftAlone) {
     };
     fs::remove("/etc/to-shared.conf");
     fs::create_symlink(kFile, "/etc/to-shared.conf");
-    Write(kVictim, "k=secret\n");
+    WriteFile(kVictim, "k=secret\n");
     for (const auto &[szTrap, set] : traps) {
         SCOPED_TRACE(szTrap);
         SetUp();
@@ -326,26 +304,26 @@ TEST_F(KeyValueFile, InASharedFolderTrapsAreLeftAlone) {
         SetUp();
         set(kTemporary);
         EXPECT_EQ(SetValue(kFile, "k", "v"), 0);
-        EXPECT_EQ(Content(kFile), "k=\"v\"\n");
+        EXPECT_EQ(FileText(kFile), "k=\"v\"\n");
         EXPECT_EQ(Names(kFolder), (Set{"a.conf", ".a.conf.zelo-new"}));
     }
-    EXPECT_EQ(Content(kVictim), "k=secret\n");
+    EXPECT_EQ(FileText(kVictim), "k=secret\n");
     EXPECT_FALSE(fs::exists("/tmp/lured"));
 }
 
 TEST_F(KeyValueFile, ElsewhereLinksAreFollowedAndStay) {
     fs::remove_all("/etc/a");
     fs::create_directories("/etc/a/b");
-    Write("/etc/a/real.conf", "k=old\n");
+    WriteFile("/etc/a/real.conf", "k=old\n");
     fs::create_symlink("/etc/a/b/second", "/etc/a/first");
     fs::create_symlink("../real.conf", "/etc/a/b/second");
     fs::create_symlink("b/made.conf", "/etc/a/dangling");
     fs::create_symlink("loop", "/etc/a/loop");
     EXPECT_EQ(Value("/etc/a/first", "k"), "old");
     EXPECT_EQ(SetValue("/etc/a/first", "k", "new"), 0);
-    EXPECT_EQ(Content("/etc/a/real.conf"), "k=\"new\"\n");
+    EXPECT_EQ(FileText("/etc/a/real.conf"), "k=\"new\"\n");
     EXPECT_EQ(SetValue("/etc/a/dangling", "k", "v"), 0);
-    EXPECT_EQ(Content("/etc/a/b/made.conf"), "k=\"v\"\n");
+    EXPECT_EQ(FileText("/etc/a/b/made.conf"), "k=\"v\"\n");
     EXPECT_LT(SetValue("/etc/a/loop", "k", "v"), 0);
     for (const char *szLink : {"/etc/a/first", "/etc/a/b/second", "/etc/a/dangling"}) {
         EXPECT_TRUE(S_ISLNK(Status(szLink).st_mode)) << szLink;
@@ -354,24 +332,24 @@ TEST_F(KeyValueFile, ElsewhereLinksAreFollowedAndStay) {
 
 TEST_F(KeyValueFile, WritersOfThePlatformsSettingsExcludeEachOther) {
     Set names = Names("/etc");
-    const std::size_t linesBefore = Lines("/etc/zeloinfo.conf").size();
+    const std::size_t linesBefore = FileLines("/etc/zeloinfo.conf").size();
     EXPECT_TRUE(SetInProcesses(
         4, 10, [](const auto &strKey) { return YLIBCINFOSetKeyValue(strKey.c_str(), "v") == 0; }));
-    EXPECT_EQ(Lines("/etc/zeloinfo.conf").size(), linesBefore + 40);
+    EXPECT_EQ(FileLines("/etc/zeloinfo.conf").size(), linesBefore + 40);
     names.insert(".zeloinfo.conf.lock");
     EXPECT_EQ(Names("/etc"), names);
 }
 
 TEST_F(KeyValueFile, WritersWithoutALockLeaveWholeFiles) {
     const std::string strRest = std::string(200000, '#') + "\nend=here\n";
-    Write(kFile, "k=0\n" + strRest);
+    WriteFile(kFile, "k=0\n" + strRest);
     const auto writeOn = [](const std::string &strKey) {
         return SetValue(kFile, "k", strKey) == 0;
     };
     const pid_t pid = children::Start([&] { return SetInProcesses(3, 150, writeOn); });
     int status = -1;
     while (waitpid(pid, &status, WNOHANG) == 0) {
-        const std::string strContent = Content(kFile);
+        const std::string strContent = FileText(kFile);
         ASSERT_EQ(strContent.substr(strContent.find('\n') + 1), strRest);
     }
     EXPECT_EQ(status, 0);

@@ -5,9 +5,7 @@
 #include <gtest/gtest.h>
 #include <json/reader.h>
 #include <sys/stat.h>
-#include <sys/wait.h>
 #include <syslog.h>
-#include <unistd.h>
 
 #include <cstdarg>
 #include <cstdio>
@@ -17,12 +15,15 @@
 #include <set>
 #include <vector>
 
+#include "children.h"
+#include "files.h"
 #include "last_error.h"
 #include "strings_file.h"
 
 namespace {
 
 namespace fs = std::filesystem;
+using files::FileLines;
 
 constexpr const char *kJournal = "/var/log/notifications.jsonl";
 constexpr const char *kFormerJournal = "/var/log/notifications.jsonl.1";
@@ -43,15 +44,6 @@ int Send(const char *szTag, const Variables &variables = {}) {
     return result;
 }
 
-std::vector<std::string> Lines(const char *szPath) {
-    std::ifstream file(szPath);
-    std::vector<std::string> lines;
-    for (std::string strLine; std::getline(file, strLine);) {
-        lines.push_back(strLine);
-    }
-    return lines;
-}
-
 Json::Value Parse(const std::string &strLine) {
     Json::Value entry;
     EXPECT_TRUE(Json::Reader().parse(strLine, entry)) << strLine;
@@ -59,9 +51,7 @@ Json::Value Parse(const std::string &strLine) {
 }
 
 void Hook(const std::string &strName, const std::string &strScript, mode_t mode = 0755) {
-    const std::string strPath = std::string(kHooks) + "/" + strName;
-    std::ofstream(strPath) << "#!/bin/sh\n" << strScript << "\n";
-    chmod(strPath.c_str(), mode);
+    files::WriteProgram(std::string(kHooks) + "/" + strName, strScript, mode);
 }
 
 class Notification : public testing::Test {
@@ -98,7 +88,7 @@ TEST_F(Notification, TheJournalHoldsTheTextsInTheLanguage) {
         YLIBCErrSetEx(0x1234, "before", 7);
         ASSERT_EQ(Send(row.szTag, {{"%QRM_SERVER%", strServer}, {"%OTHER%", "wrong"}}), 0);
         EXPECT_EQ(YLIBCErrGet(), 0x1234U) << "a success is no error";
-        const auto lines = Lines(kJournal);
+        const auto lines = FileLines(kJournal);
         ASSERT_EQ(lines.size(), ++count);
         const Json::Value entry = Parse(lines.back());
         EXPECT_EQ(entry["tag"], row.szTag);
@@ -113,7 +103,7 @@ TEST_F(Notification, TheJournalHoldsTheTextsInTheLanguage) {
     EXPECT_EQ(ZELOSysNotifySendNotifiction("NoSuchTag", nullptr), 0);
     EXPECT_LT(ZELOSysNotifySendNotifiction(nullptr, nullptr), 0);
     EXPECT_LT(ZELOSysNotifySendNotifiction("", nullptr), 0);
-    EXPECT_EQ(Lines(kJournal).size(), count + 1);
+    EXPECT_EQ(FileLines(kJournal).size(), count + 1);
 }
 
 TEST_F(Notification, HooksRunInTheirOrderWhateverOneOfThemDoes) {
@@ -132,7 +122,7 @@ TEST_F(Notification, HooksRunInTheirOrderWhateverOneOfThemDoes) {
     const std::vector<std::string> expected = {"10-a Tag Tag/a b;c", "11-b Tag Tag/a b;c",
                                                "20-c Tag Tag/a b;c", "30-d Tag Tag/a b;c",
                                                "40-e Tag Tag/a b;c", "Z Tag Tag/a b;c"};
-    EXPECT_EQ(Lines(kHookOutput), expected);
+    EXPECT_EQ(FileLines(kHookOutput), expected);
     std::string strLog;
     for (const std::string &strLine : g_logLines) {
         strLog += strLine + "\n";
@@ -150,11 +140,11 @@ TEST_F(Notification, HooksRunInTheirOrderWhateverOneOfThemDoes) {
     EXPECT_LT(Send("Tag"), 0);
     EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_UNSAFE_FILE));
     EXPECT_EQ(fs::file_size("/var/log/elsewhere"), 0U);
-    EXPECT_EQ(Lines(kHookOutput).size(), 2 * expected.size());
+    EXPECT_EQ(FileLines(kHookOutput).size(), 2 * expected.size());
 
     chmod(kHooks, 0777);
     Send("Tag");
-    EXPECT_EQ(Lines(kHookOutput).size(), 2 * expected.size())
+    EXPECT_EQ(FileLines(kHookOutput).size(), 2 * expected.size())
         << "anybody could have put a hook there";
 }
 
@@ -162,32 +152,23 @@ TEST_F(Notification, ProcessesAppendAtOnceAndEveryLineIsWhole) {
     constexpr int kProcesses = 4;
     constexpr int kEach = 50;
     std::ofstream(kJournal) << "{\"half";
-    std::vector<pid_t> children;
-    for (int process = 0; process < kProcesses; ++process) {
-        children.push_back(fork());
-        if (children.back() == 0) {
-            int result = 0;
-            for (int i = 0; i < kEach; ++i) {
-                const std::string strId = std::to_string(process) + ":" + std::to_string(i);
-                result |= Send("Tag", {{"id", strId}, {"filler", std::string(8000, 'x')}});
-            }
-            _exit(result == 0 ? 0 : 1);
+    EXPECT_TRUE(children::InEach(kProcesses, [](int process) {
+        int result = 0;
+        for (int i = 0; i < kEach; ++i) {
+            const std::string strId = std::to_string(process) + ":" + std::to_string(i);
+            result |= Send("Tag", {{"id", strId}, {"filler", std::string(8000, 'x')}});
         }
-    }
-    for (const pid_t pid : children) {
-        int status = -1;
-        waitpid(pid, &status, 0);
-        EXPECT_EQ(status, 0);
-    }
+        return result == 0;
+    }));
     std::set<std::string> ids;
-    auto lines = Lines(kFormerJournal);
+    auto lines = FileLines(kFormerJournal);
     ASSERT_FALSE(lines.empty()) << "1.6 MB fit into no single journal";
     EXPECT_EQ(lines.front(), "{\"half");
     lines.erase(lines.begin());
     for (const char *szPath : {kFormerJournal, kJournal}) {
         EXPECT_LE(fs::file_size(szPath), 1024U * 1024U);
     }
-    for (const std::string &strLine : Lines(kJournal)) {
+    for (const std::string &strLine : FileLines(kJournal)) {
         lines.push_back(strLine);
     }
     for (const std::string &strLine : lines) {
@@ -203,7 +184,7 @@ TEST(InterfaceTexts, EveryLanguageHasEveryTextWithTheSameMarkers) {
     for (const auto &language : fs::directory_iterator(strFolder)) {
         ++languages;
         std::string strSection;
-        for (const std::string &strLine : Lines((strFolder + "enu/strings").c_str())) {
+        for (const std::string &strLine : FileLines(strFolder + "enu/strings")) {
             if (strLine[0] == '[') {
                 strSection = strLine.substr(1, strLine.size() - 2);
             } else if (const auto equals = strLine.find('='); equals != std::string::npos) {

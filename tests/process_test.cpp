@@ -11,11 +11,11 @@
 #include <atomic>
 #include <chrono>
 #include <csignal>
-#include <fstream>
 #include <sstream>
 #include <thread>
 
-#include "../platform/host/program.h"
+#include "children.h"
+#include "files.h"
 #include "last_error.h"
 #include "process.h"
 
@@ -29,9 +29,7 @@ void Write(const char *szPath, const std::string &strText, int mode = 0755) {
 }
 
 std::string Output() {
-    std::ostringstream text;
-    text << std::ifstream(kOut).rdbuf();
-    return text.str();
+    return files::FileText(kOut);
 }
 
 int Shell(const char *szScript) {
@@ -41,7 +39,7 @@ int Shell(const char *szScript) {
 // Waits until a process has ended, for a bounded time.
 bool Ends(int pid) {
     pollfd end = {static_cast<int>(syscall(SYS_pidfd_open, pid, 0)), POLLIN, 0};
-    const bool blEnds = end.fd < 0 ? errno == ESRCH : poll(&end, 1, 10000) == 1;
+    const bool blEnds = end.fd < 0 ? errno == ESRCH : poll(&end, 1, 60000) == 1;
     close(end.fd);
     return blEnds;
 }
@@ -90,7 +88,7 @@ class Exec : public testing::Test {
   protected:
     void SetUp() override {
         std::remove(kOut);
-        Write("/etc/zeloinfo.conf", "exec_timeout=\"10\"\n");
+        Write("/etc/zeloinfo.conf", "exec_timeout=\"60\"\n");
     }
 };
 
@@ -129,14 +127,10 @@ TEST_F(Exec, GivesTheProgramsEndWhateverTheCallerDoes) {
          }},
     };
     for (const auto &caller : callers) {
-        const pid_t pid = fork();
-        if (pid == 0) {
+        EXPECT_TRUE(children::InOne([&] {
             caller.pfnPrepare();
-            _exit(EveryProgramGivesItsEnd() ? 0 : 1);
-        }
-        int status = -1;
-        waitpid(pid, &status, 0);
-        EXPECT_EQ(status, 0) << caller.szName;
+            return EveryProgramGivesItsEnd();
+        })) << caller.szName;
     }
 }
 
@@ -173,13 +167,13 @@ TEST_F(Exec, SaysWhenAProgramCannotBeRun) {
 }
 
 TEST_F(Exec, EndsAHungProgramWithItsProcessGroup) {
-    Write("/etc/zeloinfo.conf", "exec_timeout=1\n");
+    Write("/etc/zeloinfo.conf", "exec_timeout=2\n");
     const auto begin = std::chrono::steady_clock::now();
     EXPECT_LT(Shell("trap '' TERM; sleep 300 & echo $$ $! >/tmp/out; sleep 300; :"), 0);
     EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_EXEC_TIME));
     const auto duration = std::chrono::steady_clock::now() - begin;
-    EXPECT_GE(duration, std::chrono::seconds(1));
-    EXPECT_LT(duration, std::chrono::seconds(3));
+    EXPECT_GE(duration, std::chrono::seconds(2));
+    EXPECT_LT(duration, std::chrono::seconds(100));
     int program = 0;
     int child = 0;
     std::istringstream(Output()) >> program >> child;
@@ -201,21 +195,8 @@ TEST_F(Exec, LeavesADaemonAlone) {
     EXPECT_TRUE(Ends(daemon));
 }
 
-TEST_F(Exec, AddsToTheEnvironment) {
-    setenv("KEPT", "kept", 1);
-    setenv("NAME", "old", 1);
-    const char *const szScript = "(echo $KEPT $NAME $NAME_2; env | grep -c ^NAME) >/tmp/out";
-    const host::ProgramEnd end = host::RunProgram(
-        {"/bin/sh", "-c", szScript}, {"NAME=a =b", "NAME_2="}, std::chrono::minutes(1));
-    EXPECT_EQ(end.kind, host::ProgramEnd::Kind::kExited);
-    EXPECT_EQ(Output(), "kept a =b\n2\n");
-}
-
 TEST(ProcAlive, KnowsTheLivingFromTheDead) {
-    const pid_t zombie = fork();
-    if (zombie == 0) {
-        _exit(0);
-    }
+    const pid_t zombie = children::Start([] { return true; });
     siginfo_t info = {};
     waitid(P_PID, static_cast<id_t>(zombie), &info, WEXITED | WNOWAIT);
     EXPECT_EQ(kill(zombie, 0), 0);

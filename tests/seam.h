@@ -25,6 +25,15 @@ struct Outcome {
     int recordsLeft = 0;  // records allocated and not released
 };
 
+// All messages, one line each.
+inline std::string Messages(const Outcome &outcome) {
+    std::string strAll;
+    for (const LogLine &log : outcome.logs) {
+        strAll += (strAll.empty() ? "" : "\n") + log.strMessage;
+    }
+    return strAll;
+}
+
 struct Fault {
     std::string strOperation;
     int nth = 1;                 // which call of the operation, counted from 1; not for releases
@@ -65,6 +74,13 @@ std::string ArgumentTexts(const T &...arguments) {
 // Runs the body on this thread and reports what the library did.
 Outcome Observe(const std::function<void()> &body);
 Outcome Observe(const Fault &fault, const std::function<void()> &body);
+
+inline std::string MessagesOf(const std::function<void()> &body) {
+    return Messages(Observe(body));
+}
+inline std::string MessagesOf(const Fault &fault, const std::function<void()> &body) {
+    return Messages(Observe(fault, body));
+}
 
 }  // namespace seam
 

@@ -12,11 +12,10 @@
 #include "torture.h"
 #include "zeloqrmclient.h"
 
-DevServerProcess *joined::Joined::s_pServer = nullptr;
-
 namespace {
 
 using joined::Messages;
+using seam::MessagesOf;
 using torture::Expected;
 
 constexpr const char *kFile = "qrm_send_log";
@@ -73,16 +72,11 @@ std::string CountedTexts(const Json::Value &log) {
     return Counted(counts);
 }
 
-std::string Repeat(const std::string &strText, std::size_t times) {
-    return torture::Joined(std::vector<std::string>(times, strText), " ");
-}
-
 // What is logged without a list of languages: file and line stand in it twice.
 std::string NoList() {
     Json::Value out;
-    const seam::Outcome outcome =
-        seam::Observe({"YLIBCSzListAlloc", 1}, [&] { ConvertLog(nullptr, "text", nullptr, out); });
-    std::string strLine = Messages(outcome);
+    std::string strLine =
+        MessagesOf({"YLIBCSzListAlloc"}, [&] { ConvertLog(nullptr, "text", nullptr, out); });
     const std::string strEnd = "(ConvertLog) pslList calloc failure\n";
     EXPECT_EQ(strLine.compare(0, 13, "qrm_send_log:"), 0) << strLine;
     EXPECT_GT(std::atoi(strLine.c_str() + 13), 0) << strLine;
@@ -196,13 +190,11 @@ TEST(References, AreReplacedByTextsOrByTheirKeys) {
         {std::string(3500, 'x') + "{s:long}_T(s,k)", std::string(3500, 'x') + "{s:long}VAL"},
     };
     for (const auto &row : rows) {
-        const seam::Outcome outcome =
-            seam::Observe([&] { EXPECT_EQ(Expand(row.strParam), row.strText); });
-        EXPECT_EQ(Messages(outcome), "") << row.strParam;
+        EXPECT_EQ(MessagesOf([&] { EXPECT_EQ(Expand(row.strParam), row.strText); }), "");
     }
     const std::string strTooLong = "_T(s," + strX + "x)_T(s,k)";
-    const seam::Outcome outcome = seam::Observe([&] { EXPECT_EQ(Expand(strTooLong), strTooLong); });
-    EXPECT_EQ(Messages(outcome), "Char string length not enough");
+    EXPECT_EQ(MessagesOf([&] { EXPECT_EQ(Expand(strTooLong), strTooLong); }),
+              "Char string length not enough");
     // Different ones, as many as fit.
     std::string strMany;
     for (int i = 100; i < 700; ++i) {
@@ -262,7 +254,7 @@ TEST(References, ExpansionEndsOnEveryInput) {
     for (const std::string &strInput : inputs) {
         const auto start = std::chrono::steady_clock::now();
         EXPECT_LE(Expand(strInput).size(), 4095U);
-        EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(5))
+        EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(60))
             << strInput.substr(0, 40);
     }
     EXPECT_EQ(Expand("{s:self}"), "{s:self}");
@@ -274,55 +266,34 @@ TEST(References, ExpansionEndsOnEveryInput) {
 TEST_F(SendLog, RenderingSurvivesEveryFailingCall) {
     WriteTexts("[m]\nmsg=\"A {0} B {1}\"\n[s]\nk=\"VAL\"\nt=\"TOK\"\n");
     const std::string strWhole = "A VAL B TOK";
-    const TextList params({"{s:k}", "_T(s, t)"});
-    Json::Value out;
-    torture::Case test;
-    test.strName = "ConvertLog";
-    test.strFile = kFile;
-    test.setUp = [&] { out = Json::objectValue; };
-    test.run = [&] { return std::to_string(ConvertLog("m", "msg", params.Get(), out)); };
-    test.state = [&] { return CountedTexts(out); };
+    const Expected whole{"0", "", Counted({{strWhole, 20}})};
     const auto with = [&](const char *szText) {
         return Expected{"0", "", Counted({{strWhole, 19}, {szText, 1}})};
     };
-    test.unfaulted = {"0", "", Counted({{strWhole, 20}})};
-
-    const std::string strLanguage =
-        "YLIBCSzListGet YLIBCFileGetSectionValue "
-        "YLIBCSzListGet YLIBCFileGetSectionValue YLIBCStrReplace YLIBCStrReplace "
-        "YLIBCSzListGet YLIBCStrTokIndex YLIBCStrTrim YLIBCStrTrim YLIBCFileGetSectionValue "
-        "YLIBCStrReplace YLIBCStrReplace";
-    test.strCalls = "YLIBCSzListAlloc YLIBCStrTok " + Repeat(strLanguage, 20);
-    const auto add = [&test](const char *szCall, int nth, const Expected &expected) {
-        test.faults[std::string(szCall) + '#' + std::to_string(nth)] = expected;
-    };
+    std::vector<torture::Step> steps = {{"YLIBCSzListAlloc(512)", {"-1", NoList(), ""}},
+                                        {"YLIBCStrTok", {"-1", "", ""}}};
     for (int i = 0; i < 20; ++i) {
-        add("YLIBCSzListGet", 3 * i + 1, {"-1", "", Counted({{strWhole, i}})});
-        add("YLIBCSzListGet", 3 * i + 2, with("A  B TOK"));
-        add("YLIBCSzListGet", 3 * i + 3, with("A VAL B "));
-        // Without a message of its own a language gets the English one.
-        add("YLIBCFileGetSectionValue", 3 * i + 1, test.unfaulted);
-        add("YLIBCFileGetSectionValue", 3 * i + 2, with("A k B TOK"));
-        add("YLIBCFileGetSectionValue", 3 * i + 3, with("A VAL B t"));
-        add("YLIBCStrReplace", 4 * i + 1, with("A {s:k} B TOK"));
-        add("YLIBCStrReplace", 4 * i + 2, with("A {0} B TOK"));
-        add("YLIBCStrReplace", 4 * i + 3, with("A VAL B _T(s, t)"));
-        add("YLIBCStrReplace", 4 * i + 4, with("A VAL B {1}"));
+        const std::string strRead =
+            "YLIBCFileGetSectionValue('" + PathOf(kLanguages[static_cast<std::size_t>(i)]) + "', ";
+        steps.insert(steps.end(),
+                     {{"YLIBCSzListGet", {"-1", "", Counted({{strWhole, i}})}},
+                      // Without a message of its own a language gets the English one.
+                      {strRead + "'m', 'msg', buf, 4096)", whole},
+                      {"YLIBCSzListGet(*, 0)", with("A  B TOK")},
+                      {strRead + "'s', 'k', buf, 1024)", with("A k B TOK")},
+                      {"YLIBCStrReplace(buf, '{s:k}', 'VAL', 0, 4096)", with("A {s:k} B TOK")},
+                      {"YLIBCStrReplace(buf, '{0}', 'VAL', 0, 4096)", with("A {0} B TOK")},
+                      {"YLIBCSzListGet(*, 1)", with("A VAL B ")},
+                      {"YLIBCStrTokIndex YLIBCStrTrim YLIBCStrTrim", with("A VAL B _T(s, t)")},
+                      {strRead + "'s', 't', buf, 1024)", with("A VAL B t")},
+                      {"YLIBCStrReplace", with("A VAL B _T(s, t)")},
+                      {"YLIBCStrReplace", with("A VAL B {1}")}});
     }
-    test.faults["YLIBCStrTokIndex"] = with("A VAL B _T(s, t)");
-    test.faults["YLIBCStrTrim"] = with("A VAL B _T(s, t)");
-    test.faults["YLIBCStrTok"] = {"-1", "", ""};
-    test.faults["YLIBCSzListAlloc"] = {"-1", NoList(), ""};
-    torture::Run(test);
-
-    const seam::Outcome outcome = seam::Observe([&] { test.run(); });
-    const std::string strPath = "'" + PathOf("chs") + "', ";
-    EXPECT_EQ(outcome.details.at(0), "YLIBCSzListAlloc(512)");
-    EXPECT_EQ(torture::Joined({outcome.details.begin() + 3, outcome.details.begin() + 8}, "\n"),
-              "YLIBCFileGetSectionValue(" + strPath + "'m', 'msg', buf, 4096)\n" +
-                  "YLIBCSzListGet(*, 0)\n" + "YLIBCFileGetSectionValue(" + strPath +
-                  "'s', 'k', buf, 1024)\n" + "YLIBCStrReplace(buf, '{s:k}', 'VAL', 0, 4096)\n" +
-                  "YLIBCStrReplace(buf, '{0}', 'VAL', 0, 4096)");
+    const TextList params({"{s:k}", "_T(s, t)"});
+    Json::Value out;
+    torture::Run({"ConvertLog", kFile, [&] { out = Json::objectValue; },
+                  [&] { return std::to_string(ConvertLog("m", "msg", params.Get(), out)); },
+                  [&] { return CountedTexts(out); }, whole, steps});
 }
 
 TEST_F(SendLog, ALanguageWithoutTheMessageSpeaksEnglish) {
@@ -357,70 +328,59 @@ TEST_F(SendLog, ALanguageWithoutTheMessageSpeaksEnglish) {
 
 // --- Push ---------------------------------------------------------------------------------------
 
+// What follows the calls of these tables belongs to the Web API call.
 TEST_F(SendLog, TheListOverloadSurvivesEveryFailingCall) {
     const std::string strSent =
-        R"({"extra_info":"x","happen_time":"now","level":"warning","username":"[zelobox]"})";
+        R"({"extra_info":"x","happen_time":"now","level":"warning","username":"[zelobox]"} 20 hi)";
     const Expected unread{"-1", "conver (null):hi string failed. ", "nothing"};
-    torture::Case test;
-    test.strName = "list";
-    test.strFile = kFile;
-    test.setUp = [] { s_pServer->ForgetRequests(); };
-    test.run = [] {
-        return std::to_string(
-            ZELOQRMClientLog(4, nullptr, "hi", static_cast<YLIBSZLIST *>(nullptr), "x"));
-    };
-    test.state = Sent;
-    test.strCalls =
-        "ZELOLnxGetHostname time YLIBCSzListAlloc YLIBCStrTok " + Repeat("YLIBCSzListGet", 20);
-    test.countedCalls = 24;  // what follows belongs to the Web API call
-    test.unfaulted = {"0", "", strSent + " 20 hi"};
-    Expected noTime = test.unfaulted;
-    noTime.strStored.replace(noTime.strStored.find("\"now\""), 5, "-1");
-    test.faults = {{"ZELOLnxGetHostname", {"-1", "get hostname failed ", "nothing"}},
-                   {"time", noTime},
-                   {"YLIBCSzListAlloc", {"-1", NoList() + "\n" + unread.strLog, "nothing"}},
-                   {"YLIBCStrTok", unread},
-                   {"YLIBCSzListGet", unread}};
-    torture::Run(test);
+    Expected noTime{"0", "", strSent};
+    noTime.strStored.replace(strSent.find("\"now\""), 5, "-1");
+    std::vector<torture::Step> steps = {
+        {"ZELOLnxGetHostname", {"-1", "get hostname failed ", "nothing"}},
+        {"time", noTime},
+        {"YLIBCSzListAlloc", {"-1", NoList() + "\n" + unread.strLog, "nothing"}},
+        {"YLIBCStrTok", unread}};
+    steps.insert(steps.end(), 20, {"YLIBCSzListGet", unread});
+    torture::Run({"list",
+                  kFile,
+                  [] { s_pServer->ForgetRequests(); },
+                  [] {
+                      YLIBSZLIST *const pslNone = nullptr;
+                      return std::to_string(ZELOQRMClientLog(4, nullptr, "hi", pslNone, "x"));
+                  },
+                  Sent,
+                  {"0", "", strSent},
+                  steps,
+                  false,
+                  true});
 }
 
 TEST_F(SendLog, TheTextOverloadSurvivesEveryFailingCall) {
-    const std::string strSent = R"({"happen_time":"now","level":"info","username":"[zelobox]"})";
-    const auto sent = [&](const std::string &strTexts) {
-        return Expected{"0", "", strSent + ' ' + strTexts};
+    const auto sent = [](const std::string &strTexts, const char *szTime = "\"now\"") {
+        return Expected{"0", "",
+                        std::string(R"({"happen_time":)") + szTime +
+                            R"(,"level":"info","username":"[zelobox]"} )" + strTexts};
     };
     const Expected unread{"-1", "conver (null):{0}-{1} string failed. ", "nothing"};
-    torture::Case test;
-    test.strName = "texts";
-    test.strFile = kFile;
-    test.setUp = [] { s_pServer->ForgetRequests(); };
-    test.run = [] {
-        return std::to_string(ZELOQRMClientLog(9, nullptr, "{0}-{1}", "a", nullptr, "b"));
-    };
-    test.state = Sent;
-    test.strCalls =
-        "YLIBCSzListAlloc YLIBCSzListPush YLIBCSzListPush ZELOLnxGetHostname time "
-        "YLIBCSzListAlloc YLIBCStrTok " +
-        Repeat("YLIBCSzListGet YLIBCSzListGet YLIBCStrReplace YLIBCSzListGet YLIBCStrReplace", 20);
-    test.countedCalls = 107;
-    test.unfaulted = sent("20 a-b");
-    test.faults = {{"YLIBCSzListAlloc#1", {"-1", "Failed to allocate list", "nothing"}},
-                   {"YLIBCSzListAlloc#2", {"-1", NoList() + "\n" + unread.strLog, "nothing"}},
-                   {"YLIBCSzListPush#1", sent("20 b-{1}")},
-                   {"YLIBCSzListPush#2", sent("20 a-{1}")},
-                   {"ZELOLnxGetHostname", {"-1", "get hostname failed ", "nothing"}},
-                   {"time", sent("20 a-b")},
-                   {"YLIBCStrTok", unread}};
-    test.faults["time"].strStored.replace(strSent.find("\"now\""), 5, "-1");
+    std::vector<torture::Step> steps = {
+        {"YLIBCSzListAlloc", {"-1", "Failed to allocate list", "nothing"}},
+        {"YLIBCSzListPush", sent("20 b-{1}")},
+        {"YLIBCSzListPush", sent("20 a-{1}")},
+        {"ZELOLnxGetHostname", {"-1", "get hostname failed ", "nothing"}},
+        {"time", sent("20 a-b", "-1")},
+        {"YLIBCSzListAlloc", {"-1", NoList() + "\n" + unread.strLog, "nothing"}},
+        {"YLIBCStrTok", unread}};
     for (int i = 0; i < 20; ++i) {
-        const auto nth = [](const char *szCall, int n) { return szCall + std::to_string(n); };
-        test.faults[nth("YLIBCSzListGet#", 3 * i + 1)] = unread;
-        test.faults[nth("YLIBCSzListGet#", 3 * i + 2)] = sent("1 -b; 19 a-b");
-        test.faults[nth("YLIBCSzListGet#", 3 * i + 3)] = sent("1 a-; 19 a-b");
-        test.faults[nth("YLIBCStrReplace#", 2 * i + 1)] = sent("19 a-b; 1 {0}-b");
-        test.faults[nth("YLIBCStrReplace#", 2 * i + 2)] = sent("19 a-b; 1 a-{1}");
+        steps.insert(steps.end(), {{"YLIBCSzListGet", unread},
+                                   {"YLIBCSzListGet", sent("1 -b; 19 a-b")},
+                                   {"YLIBCStrReplace", sent("19 a-b; 1 {0}-b")},
+                                   {"YLIBCSzListGet", sent("1 a-; 19 a-b")},
+                                   {"YLIBCStrReplace", sent("19 a-b; 1 a-{1}")}});
     }
-    torture::Run(test);
+    torture::Run(
+        {"texts", kFile, [] { s_pServer->ForgetRequests(); },
+         [] { return std::to_string(ZELOQRMClientLog(9, nullptr, "{0}-{1}", "a", nullptr, "b")); },
+         Sent, sent("20 a-b"), steps, false, true});
 }
 
 TEST_F(SendLog, TheServerGetsWhatTheCallerSays) {
@@ -448,32 +408,30 @@ TEST_F(SendLog, TheServerGetsWhatTheCallerSays) {
     EXPECT_EQ(Messages(null), "Invaild Argument (__null != szKey)=[0]\n");
     EXPECT_TRUE(null.calls.empty());
     EXPECT_EQ(YLIBCErrGet(), 0x0D00U);
-    const seam::Outcome absent =
-        seam::Observe([] { EXPECT_EQ(ZELOQRMClientLog(3, "m", "none", "a", "b", "c"), -1); });
-    EXPECT_EQ(Messages(absent), "conver m:none string failed. ");
+    EXPECT_EQ(MessagesOf([] { EXPECT_EQ(ZELOQRMClientLog(3, "m", "none", "a", "b", "c"), -1); }),
+              "conver m:none string failed. ");
     EXPECT_EQ(Sent(), "nothing");
 }
 
 TEST_F(SendLog, OnlyBooleanTrueConfirmsAnEntry) {
     YLIBSZLIST *const pslNone = nullptr;
+    const char *szUnconfirmed = "push log webapi response failed, jsReq={";
     const struct {
         const char *szBody;
         int result;
         const char *szLog;
     } rows[] = {
         {R"({"success":true})", 0, ""},
-        {R"({"success":"true"})", -1, "push log webapi response failed, jsReq={"},
-        {R"({"success":1})", -1, "push log webapi response failed, jsReq={"},
-        {R"({"success":false})", -1, "push log webapi response failed, jsReq={"},
-        {"{}", -1, "push log webapi response failed, jsReq={"},
-        {"[true]", -1, "push log webapi response failed, jsReq={"},
+        {R"({"success":"true"})", -1, szUnconfirmed},
+        {R"({"success":1})", -1, szUnconfirmed},
+        {R"({"success":false})", -1, szUnconfirmed},
+        {"{}", -1, szUnconfirmed},
+        {"[true]", -1, szUnconfirmed},
         {"no json", -1, "push log webapi failed, jsReq={"},
     };
     for (const auto &row : rows) {
         SCOPED_TRACE(row.szBody);
-        devserver::NextAnswer answer;
-        answer.body = row.szBody;
-        s_pServer->AnswerNext(kLogApi, answer);
+        Answer(kLogApi, "", row.szBody);
         // The message is too long for a line.
         const std::string strMessage(3000, 'm');
         const seam::Outcome outcome = seam::Observe([&] {

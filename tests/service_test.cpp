@@ -6,8 +6,8 @@
 
 #include <filesystem>
 #include <fstream>
-#include <sstream>
 
+#include "files.h"
 #include "last_error.h"
 
 namespace {
@@ -16,19 +16,15 @@ namespace fs = std::filesystem;
 
 constexpr const char *kRuns = "/tmp/runs";
 
-void AddService(const std::string &strName, const std::string &strStatus,
-                fs::perms mode = fs::perms::owner_all) {
-    const std::string strPath = "/usr/zelo/etc/service.d/8/" + strName;
-    std::ofstream(strPath) << "#!/bin/sh\necho \"$(basename \"$0\") $*\" >>" << kRuns << "\nexit "
-                           << strStatus << "\n";
-    fs::permissions(strPath, mode);
+void AddService(const std::string &strName, const std::string &strStatus, mode_t mode = 0755) {
+    files::WriteProgram("/usr/zelo/etc/service.d/8/" + strName,
+                        "echo \"$(basename \"$0\") $*\" >>/tmp/runs\nexit " + strStatus, mode);
 }
 
 std::string Runs() {
-    std::ostringstream text;
-    text << std::ifstream(kRuns).rdbuf();
+    std::string strRuns = files::FileText(kRuns);
     fs::remove(kRuns);
-    return text.str();
+    return strRuns;
 }
 
 TEST(Service, AllProgramsOfTheTypeRunInTheOrderOfTheirNames) {
@@ -37,7 +33,7 @@ TEST(Service, AllProgramsOfTheTypeRunInTheOrderOfTheirNames) {
     AddService("20-second", "0");
     AddService("10-first", "0");
     AddService(".hidden", "1");
-    AddService("not-executable", "1", fs::perms::owner_read);
+    AddService("not-executable", "1", 0400);
     EXPECT_EQ(YLIBServiceTypeReload(YLIB_SERVICE_TYPE_USERS), 0);
     EXPECT_EQ(Runs(), "10-first reload\n20-second reload\n");
     EXPECT_EQ(YLIBServiceTypeReload(7), 0);

@@ -5,7 +5,6 @@
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <sys/stat.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <atomic>
@@ -17,6 +16,7 @@
 #include <thread>
 #include <vector>
 
+#include "children.h"
 #include "last_error.h"
 
 namespace {
@@ -234,16 +234,12 @@ TEST(StringsFile, IsSafeWhileTheFileIsCutShortAndProcessesFork) {
     Replace(strText);
     AwaitAge();
     EXPECT_EQ(Get("s1", "k"), "value");
-    int status = 0;
-    for (int i = 0; i < 40 && status == 0; ++i) {
-        const pid_t pid = fork();
-        if (pid == 0) {
-            alarm(10);
-            _exit(Get("s1", "k") == "value" ? 0 : 1);
-        }
-        waitpid(pid, &status, 0);
+    for (int i = 0; i < 40 && !HasFailure(); ++i) {
+        EXPECT_TRUE(children::InOne([] {
+            alarm(60);
+            return Get("s1", "k") == "value";
+        }));
     }
-    EXPECT_EQ(status, 0);
     blDone = true;
     for (std::thread &reader : readers) {
         reader.join();

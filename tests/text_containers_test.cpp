@@ -84,24 +84,6 @@ TEST(Text, SplitsAtTheWholeDelimiter) {
     }
 }
 
-TEST(Text, TrimsBothEnds) {
-    const struct {
-        const char *szText;
-        const char *szSet;
-        const char *szTrimmed;
-    } rows[] = {{" \ta b\n ", " \t\n", "a b"}, {"--", "-", ""}, {"", " ", ""}, {" a ", "", " a "}};
-    for (const auto &row : rows) {
-        char szOut[16] = "before";
-        char szSame[16] = "";
-        std::string(row.szText).copy(szSame, sizeof(szSame) - 1);
-        const int cb = static_cast<int>(std::string(row.szTrimmed).size());
-        EXPECT_EQ(YLIBCStrTrim(row.szText, szOut, row.szSet), cb);
-        EXPECT_STREQ(szOut, row.szTrimmed);
-        EXPECT_EQ(YLIBCStrTrim(szSame, szSame, row.szSet), cb);
-        EXPECT_STREQ(szSame, row.szTrimmed);
-    }
-}
-
 TEST(Text, ReplacesEveryOccurrenceOrNone) {
     const std::string strMany(4094, 'a');
     const struct {
@@ -135,36 +117,6 @@ TEST(Text, ReplacesEveryOccurrenceOrNone) {
         EXPECT_EQ(std::string(buffer.data(), strnlen(buffer.data(), cbText)), row.strResult)
             << row.strOld << ' ' << row.strNew;
     }
-}
-
-TEST(TextContainers, NullAndOddArgumentsFail) {
-    List list(YLIBCSzListAlloc(0), YLIBCSzListFree);
-    Hash hash(YLIBCSzHashAlloc(0), YLIBCSzHashFree);
-    YLIBSZLIST *pslList = list.get();
-    YLIBSZLIST *pslNull = nullptr;
-    YLIBSZHASH *pHash = hash.get();
-    YLIBSZHASH *pNull = nullptr;
-    char sz[4] = "abc";
-    char *szRest = sz;
-    for (const bool blFailed :
-         {YLIBCSzListAlloc(-1) == nullptr, YLIBCSzHashAlloc(-1) == nullptr,
-          YLIBCSzListPush(&pslNull, "a") < 0, YLIBCSzListPush(&pslList, nullptr) < 0,
-          YLIBCSzListGet(nullptr, 0) == nullptr, YLIBCSzHashSetValue(&pNull, "a", "a") < 0,
-          YLIBCSzHashSetValue(&pHash, nullptr, "a") < 0,
-          YLIBCSzHashSetValue(&pHash, "a", nullptr) < 0,
-          YLIBCSzHashGetValue(nullptr, "a") == nullptr, YLIBCSzHashKeyAt(nullptr, 0) == nullptr,
-          YLIBCStrTok(nullptr, ",", &pslList) == -1, YLIBCStrTok("a", "", &pslList) == -1,
-          YLIBCStrTok("a", ",", &pslNull) == -1, YLIBCStrTokIndex(&szRest, "") == nullptr,
-          YLIBCStrTrim("a", sz, nullptr) < 0, YLIBCStrReplace(sz, nullptr, "a", 0, 4) < 0,
-          YLIBCStrReplace(sz, "a", "a", 0, 0) < 0}) {
-        EXPECT_TRUE(blFailed);
-    }
-    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_INVALID_ARGUMENT));
-    EXPECT_EQ(list->nItem + hash->nItem, 0);
-    EXPECT_EQ(szRest, sz);
-    EXPECT_STREQ(sz, "abc");
-    YLIBCSzListFree(nullptr);
-    YLIBCSzHashFree(nullptr);
 }
 
 }  // namespace

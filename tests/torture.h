@@ -8,11 +8,10 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <cstdio>
 #include <functional>
 #include <map>
-#include <set>
+#include <regex>
 #include <sstream>
 #include <string>
 #include <vector>
@@ -28,37 +27,29 @@ struct Expected {
     int recordsKept = 0;    // records that stay allocated on purpose
 };
 
+// Calls that follow each other, and what has to come out when any of them fails.
+struct Step {
+    std::string strCalls;  // by name, separated by blanks; or with their arguments, a line each
+    Expected failing;
+};
+
 struct Case {
     std::string strName;
     std::string strFile;  // the source file that logs; "" where each message begins with its file
     std::function<void()> setUp;
     std::function<std::string()> run;  // calls the function, returns its result as text
     std::function<std::string()> state;
-    // All calls in order, separated by blanks; with their arguments, a line each, where a test says
-    // so.
-    std::string strCalls;
     Expected unfaulted;
-    // By "Operation" (any call of it) or "Operation#2" (the second call).
-    std::map<std::string, Expected> faults;
+    std::vector<Step> steps;  // all calls in their order
     bool blInChild =
-        false;  // each run in a process of its own, with nothing kept from the last one
-    std::size_t countedCalls = static_cast<std::size_t>(-1);  // only the first calls are looked at
+        false;              // each run in a process of its own, with nothing kept from the last one
+    bool blGoesOn = false;  // calls that come after the steps are not looked at
 };
 
 // The tail with the platform's last error, whose lines come and go, as "[E]".
 inline std::string WithoutErrorTail(const std::string &strMessage) {
-    const std::size_t at = strMessage.rfind("[0x");
-    unsigned int code = 0;
-    int cbCode = 0;
-    int line = 0;
-    char end = '\0';
-    if (at == std::string::npos ||
-        std::sscanf(strMessage.c_str() + at, "[0x%4X %n", &code, &cbCode) != 1 || cbCode != 8 ||
-        std::sscanf(strMessage.c_str() + strMessage.rfind(':'), ":%d%c", &line, &end) != 2 ||
-        end != ']') {
-        return strMessage;
-    }
-    return strMessage.substr(0, at) + "[E]";
+    static const std::regex tail(R"(\[0x[0-9A-F]{4} [^\[]*:[0-9]+\]$)");
+    return std::regex_replace(strMessage, tail, "[E]");
 }
 
 // Runs the body, in a child process where that is asked for; what the body expects counts as the
@@ -96,28 +87,47 @@ inline void Check(const Case &test, const seam::Outcome &outcome, const std::str
     EXPECT_EQ(strLog, expected.strLog);
 }
 
-inline std::string Joined(const std::vector<std::string> &parts, const char *szBetween,
-                          std::size_t most = static_cast<std::size_t>(-1)) {
+inline std::string Joined(const std::vector<std::string> &parts, const char *szBetween) {
     std::string strAll;
-    for (std::size_t i = 0; i < std::min(parts.size(), most); ++i) {
+    for (std::size_t i = 0; i < parts.size(); ++i) {
         strAll += (i == 0 ? "" : szBetween) + parts[i];
     }
     return strAll;
 }
 
-inline bool HasArguments(const Case &test) {
-    return test.strCalls.find('(') != std::string::npos;
+struct Call {
+    std::string strText;  // the name, and the arguments where they count
+    Expected failing;
+
+    std::string Name() const { return strText.substr(0, strText.find('(')); }
+    bool HasArguments() const { return strText.size() > Name().size(); }
+};
+
+inline std::vector<Call> Calls(const std::vector<Step> &steps) {
+    std::vector<Call> calls;
+    for (const Step &step : steps) {
+        std::istringstream text(step.strCalls);
+        const char end = step.strCalls.find('(') == std::string::npos ? ' ' : '\n';
+        for (std::string strCall; std::getline(text, strCall, end);) {
+            calls.push_back({strCall, step.failing});
+        }
+    }
+    return calls;
 }
 
-// The names of the calls that the case expects.
-inline std::vector<std::string> CallNames(const Case &test) {
-    std::vector<std::string> names;
-    std::istringstream calls(test.strCalls);
-    std::string strCall;
-    while (std::getline(calls, strCall, HasArguments(test) ? '\n' : ' ')) {
-        names.push_back(strCall.substr(0, strCall.find('(')));
+// The calls that were made, told as the expected ones are.
+inline void CheckCalls(const seam::Outcome &outcome, const std::vector<Call> &expected,
+                       bool blGoesOn = false) {
+    std::string strMade;
+    std::string strExpected;
+    for (std::size_t i = 0; i < outcome.calls.size() && !(blGoesOn && i >= expected.size()); ++i) {
+        const bool blArguments = i < expected.size() && expected[i].HasArguments();
+        strMade += (blArguments ? outcome.details[i] : outcome.calls[i]) + '\n';
     }
-    return names;
+    for (const Call &call : expected) {
+        strExpected += call.strText + '\n';
+    }
+    EXPECT_EQ(strMade, strExpected);
 }
 
 inline seam::Outcome RunOnce(const Case &test, const seam::Fault &fault, const Expected &expected) {
@@ -130,29 +140,15 @@ inline seam::Outcome RunOnce(const Case &test, const seam::Fault &fault, const E
 
 inline void Run(const Case &test) {
     SCOPED_TRACE(test.strName);
-    Separately(test.blInChild, [&] {
-        const seam::Outcome clean = RunOnce(test, {}, test.unfaulted);
-        EXPECT_EQ(HasArguments(test) ? Joined(clean.details, "\n", test.countedCalls)
-                                     : Joined(clean.calls, " ", test.countedCalls),
-                  test.strCalls);
-    });
-
+    const std::vector<Call> calls = Calls(test.steps);
+    Separately(test.blInChild,
+               [&] { CheckCalls(RunOnce(test, {}, test.unfaulted), calls, test.blGoesOn); });
     std::map<std::string, int> counts;
-    std::set<std::string> used;
-    for (const std::string &strCall : CallNames(test)) {
-        const int nth = ++counts[strCall];
-        const std::string strNth = strCall + '#' + std::to_string(nth);
-        SCOPED_TRACE("failing " + strNth);
-        auto row = test.faults.find(strNth);
-        row = row == test.faults.end() ? test.faults.find(strCall) : row;
-        if (row == test.faults.end()) {
-            ADD_FAILURE() << "no row";
-            continue;
-        }
-        used.insert(row->first);
-        Separately(test.blInChild, [&] { RunOnce(test, {strCall, nth}, row->second); });
+    for (const Call &call : calls) {
+        const int nth = ++counts[call.Name()];
+        SCOPED_TRACE("failing " + call.Name() + '#' + std::to_string(nth));
+        Separately(test.blInChild, [&] { RunOnce(test, {call.Name(), nth}, call.failing); });
     }
-    EXPECT_EQ(used.size(), test.faults.size()) << "rows without a call";
 }
 
 }  // namespace torture

@@ -1,8 +1,6 @@
 // What a Web API request promises about the wire: whom it trusts, where it goes, when it gives up.
 
 #include <gtest/gtest.h>
-#include <sys/wait.h>
-#include <unistd.h>
 
 #include <chrono>
 #include <cstdlib>
@@ -11,6 +9,7 @@
 #include <memory>
 #include <set>
 
+#include "children.h"
 #include "dev_server_process.h"
 #include "last_error.h"
 #include "web_api_request.h"
@@ -30,12 +29,16 @@ void Write(const char *szPath, const std::string &strText) {
     std::ofstream(szPath) << strText;
 }
 
-std::string PathOf(const char *szProtocol, int port, const char *szHost = "localhost") {
-    const Cred pCred(ZELOCredAlloc(), ZELOCredFree);
+Cred ServerAt(const char *szProtocol, int port, const char *szHost = "localhost") {
+    Cred pCred(ZELOCredAlloc(), ZELOCredFree);
     ZELOCredItemSetProtocol(pCred.get(), szProtocol);
     ZELOCredItemSetHost(pCred.get(), szHost);
     ZELOCredItemSetPort(pCred.get(), port);
-    return ZELO::CredRequestUtil::GetWebAPIPath(pCred.get(), kApi);
+    return pCred;
+}
+
+std::string PathOf(const char *szProtocol, int port, const char *szHost = "localhost") {
+    return ZELO::CredRequestUtil::GetWebAPIPath(ServerAt(szProtocol, port, szHost).get(), kApi);
 }
 
 class Request : public testing::Test {
@@ -178,23 +181,14 @@ TEST_F(Request, ConnectionsAreUsedAgainButNotByAChild) {
         EXPECT_EQ(Https(), "/qrm/rpc");
     }
     EXPECT_EQ(Connections().size(), 1U);
-    const pid_t pid = fork();
-    if (pid == 0) {
-        _exit(Https() == "/qrm/rpc" ? 0 : 1);
-    }
-    int status = -1;
-    waitpid(pid, &status, 0);
-    EXPECT_EQ(status, 0);
+    EXPECT_TRUE(children::InOne([&] { return Https() == "/qrm/rpc"; }));
     EXPECT_EQ(Connections().size(), 2U);
     EXPECT_EQ(Https(), "/qrm/rpc");
     EXPECT_EQ(Connections().size(), 2U) << "the parent goes on with its own connection";
 }
 
 TEST_F(Request, PathsAreLearntOnceAndForgottenWhenTheyAreGone) {
-    const Cred pCred(ZELOCredAlloc(), ZELOCredFree);
-    ZELOCredItemSetProtocol(pCred.get(), "http");
-    ZELOCredItemSetHost(pCred.get(), "localhost");
-    ZELOCredItemSetPort(pCred.get(), m_pServer->HttpPort());
+    const Cred pCred = ServerAt("http", m_pServer->HttpPort());
     const auto call = [&](int status) {
         ZELO::CredRequest request;
         EXPECT_TRUE(ZELO::CredRequestUtil::SetWebAPIURL(pCred.get(), kApi, 1, "join", &request));
@@ -218,10 +212,7 @@ TEST_F(Request, PathsAreLearntOnceAndForgottenWhenTheyAreGone) {
 }
 
 TEST_F(Request, TheCallersTimeLimitEndsAnExchange) {
-    const Cred pCred(ZELOCredAlloc(), ZELOCredFree);
-    ZELOCredItemSetProtocol(pCred.get(), "http");
-    ZELOCredItemSetHost(pCred.get(), "localhost");
-    ZELOCredItemSetPort(pCred.get(), m_pServer->HttpPort());
+    const Cred pCred = ServerAt("http", m_pServer->HttpPort());
     ZELO::CredRequest request;
     ASSERT_TRUE(ZELO::CredRequestUtil::SetWebAPIURL(pCred.get(), kApi, 1, "join", &request));
     devserver::NextAnswer answer;

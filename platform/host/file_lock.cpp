@@ -37,8 +37,7 @@ constexpr std::chrono::microseconds kLastWait{2000};
 // a quarter of the time of opening them anew.
 constexpr std::size_t kMaxIdle = 8;
 
-// Whoever takes a lock over and over looks this often whether somebody waits, and whether the file
-// still has its name.
+// Whoever takes a lock over and over looks this often whether the file still has its name.
 constexpr std::chrono::milliseconds kLookInterval{1};
 
 // An open lock file.
@@ -263,7 +262,7 @@ Try TakeLock(const LockFile &file, Clock::time_point end) {
     if (!host::IsOwnFile(file.StatusAtOpen())) {
         return Try::kUnsafe;
     }
-    if (!file.Looks() || IsTurnFree(file.Get())) {
+    if (IsTurnFree(file.Get())) {
         const Try result = TryLock(file);
         if (result != Try::kHeldElsewhere) {
             return result;

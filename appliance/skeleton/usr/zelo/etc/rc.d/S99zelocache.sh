@@ -64,13 +64,12 @@ start() {
 }
 
 stop() {
-    local pid try
+    local pid try=0
     take_turn
     if runs; then
         # A daemon whose start was cut off may be about to write its id.
-        for try in 1 2 3 4 5; do
-            read -r pid <"$pid_file" && grep -q zelocache "/proc/$pid/cmdline" 2>/dev/null && break
-            [ "$try" -lt 5 ] ||
+        until read -r pid <"$pid_file" && grep -q zelocache "/proc/$pid/cmdline" 2>/dev/null; do
+            [ "$((try += 1))" -le 25 ] ||
                 fail 1 "the daemon runs, but '$pid_file' does not name it: end it by hand"
             sleep 0.2
         done
