@@ -9,6 +9,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <chrono>
+#include <cstddef>
 #include <mutex>
 #include <new>
 #include <string>
@@ -35,9 +36,11 @@ constexpr std::chrono::microseconds kLastWait{2000};
 
 // Of the lock files whose locks are released, these many stay open to be locked again, which takes
 // a quarter of the time of opening them anew.
-constexpr std::size_t kMaxIdle = 8;
+constexpr std::ptrdiff_t kMaxIdle = 8;
 
-// Whoever takes a lock over and over looks this often whether the file still has its name.
+// Whoever takes a lock over and over looks this often whether the file still has its name, and
+// whether somebody waits; always, when it has not left the lock alone for as long as those pause
+// who wait.
 constexpr std::chrono::milliseconds kLookInterval{1};
 
 // An open lock file.
@@ -45,7 +48,9 @@ struct OpenFile {
     std::string strPath;
     int fd = -1;
     struct stat status = {};  // when it was opened
+    bool blUsed = true;       // or idle
     Clock::time_point looked;
+    Clock::time_point released;
 };
 
 // All lock files that the process has open; a handle is a descriptor. Opening, closing and forking
@@ -53,8 +58,7 @@ struct OpenFile {
 // threads may still hold locks while the process ends.
 struct OpenLocks {
     std::mutex mutex;
-    std::vector<OpenFile> used;
-    std::vector<OpenFile> idle;
+    std::vector<OpenFile> files;
 };
 
 OpenLocks &TheLocks() {
@@ -72,12 +76,10 @@ void AfterForkInParent() {
 
 void AfterForkInChild() {
     OpenLocks &locks = TheLocks();
-    for (std::vector<OpenFile> *pFiles : {&locks.used, &locks.idle}) {
-        for (const OpenFile &file : *pFiles) {
-            close(file.fd);
-        }
-        pFiles->clear();
+    for (const OpenFile &file : locks.files) {
+        close(file.fd);
     }
+    locks.files.clear();
     locks.mutex.unlock();
 }
 
@@ -85,11 +87,6 @@ bool FollowForks() {
     static const bool blFollows =
         pthread_atfork(BeforeFork, AfterForkInParent, AfterForkInChild) == 0;
     return blFollows;
-}
-
-template <typename IsWanted>
-std::vector<OpenFile>::iterator FindFile(std::vector<OpenFile> &files, IsWanted isWanted) {
-    return std::find_if(files.begin(), files.end(), isWanted);
 }
 
 // A lock file that is opened, or has stayed open since the process held its lock before. What is
@@ -102,23 +99,23 @@ class LockFile {
         }
         OpenLocks &locks = TheLocks();
         const std::lock_guard<std::mutex> guard(locks.mutex);
-        locks.used.reserve(locks.used.size() + 1);
-        locks.idle.reserve(kMaxIdle);
-        const auto idle =
-            FindFile(locks.idle, [&](const OpenFile &file) { return file.strPath == szPath; });
-        m_blWasOpen = idle != locks.idle.end();
-        OpenFile file = m_blWasOpen ? std::move(*idle) : Open(szPath);
-        if (m_blWasOpen) {
-            locks.idle.erase(idle);
+        auto file = FindIdle(szPath);
+        m_blWasOpen = file != locks.files.end();
+        if (!m_blWasOpen) {
+            locks.files.reserve(locks.files.size() + 1);
+            OpenFile opened = Open(szPath);
+            if (opened.fd < 0) {
+                return;
+            }
+            file = locks.files.insert(locks.files.end(), std::move(opened));
         }
-        m_fd = file.fd;
-        m_statusAtOpen = file.status;
+        file->blUsed = true;
+        m_fd = file->fd;
+        m_statusAtOpen = file->status;
         const Clock::time_point now = Clock::now();
-        m_blLooks = now - file.looked >= kLookInterval;
-        file.looked = m_blLooks ? now : file.looked;
-        if (m_fd >= 0) {
-            locks.used.push_back(std::move(file));
-        }
+        m_blLooks = now - file->looked >= kLookInterval;
+        m_blGivesWay = m_blLooks || now - file->released < kFirstWait;
+        file->looked = m_blLooks ? now : file->looked;
     }
     LockFile(const LockFile &) = delete;
     LockFile &operator=(const LockFile &) = delete;
@@ -128,6 +125,7 @@ class LockFile {
     const char *Path() const { return m_szPath; }
     bool WasOpen() const { return m_blWasOpen; }
     bool Looks() const { return m_blLooks; }
+    bool GivesWay() const { return m_blGivesWay; }
     const struct stat &StatusAtOpen() const { return m_statusAtOpen; }
     int HandOut() { return std::exchange(m_fd, -1); }
 
@@ -135,25 +133,34 @@ class LockFile {
     static bool Release(int fd, bool blStayOpen) {
         OpenLocks &locks = TheLocks();
         const std::lock_guard<std::mutex> guard(locks.mutex);
-        const auto used = FindFile(locks.used, [&](const OpenFile &file) { return file.fd == fd; });
-        if (used == locks.used.end()) {
+        const auto file =
+            std::find_if(locks.files.begin(), locks.files.end(),
+                         [fd](const OpenFile &other) { return other.fd == fd && other.blUsed; });
+        if (file == locks.files.end()) {
             return false;
         }
-        OpenFile file = std::move(*used);
-        locks.used.erase(used);
-        const bool blHasRoom =
-            locks.idle.size() < kMaxIdle && FindFile(locks.idle, [&](const OpenFile &other) {
-                                                return other.strPath == file.strPath;
-                                            }) == locks.idle.end();
-        if (blStayOpen && blHasRoom && flock(fd, LOCK_UN) == 0) {
-            locks.idle.push_back(std::move(file));
+        const auto idle = std::count_if(locks.files.begin(), locks.files.end(),
+                                        [](const OpenFile &other) { return !other.blUsed; });
+        const bool blStays =
+            blStayOpen && idle < kMaxIdle && FindIdle(file->strPath.c_str()) == locks.files.end();
+        if (blStays && flock(fd, LOCK_UN) == 0) {
+            file->blUsed = false;
+            file->released = Clock::now();
         } else {
             close(fd);
+            locks.files.erase(file);
         }
         return true;
     }
 
   private:
+    static std::vector<OpenFile>::iterator FindIdle(const char *szPath) {
+        auto &files = TheLocks().files;
+        return std::find_if(files.begin(), files.end(), [szPath](const OpenFile &file) {
+            return !file.blUsed && file.strPath == szPath;
+        });
+    }
+
     static OpenFile Open(const char *szPath) {
         OpenFile file;
         file.strPath = szPath;
@@ -169,6 +176,7 @@ class LockFile {
     int m_fd = -1;
     bool m_blWasOpen = false;
     bool m_blLooks = true;
+    bool m_blGivesWay = true;
     struct stat m_statusAtOpen = {};
 };
 
@@ -262,7 +270,7 @@ Try TakeLock(const LockFile &file, Clock::time_point end) {
     if (!host::IsOwnFile(file.StatusAtOpen())) {
         return Try::kUnsafe;
     }
-    if (IsTurnFree(file.Get())) {
+    if (!file.GivesWay() || IsTurnFree(file.Get())) {
         const Try result = TryLock(file);
         if (result != Try::kHeldElsewhere) {
             return result;
