@@ -26,7 +26,8 @@ Plain ReadPlainly(std::string_view all, std::string_view section, std::string_vi
             plain.sections.emplace_back(*name);
             blInside = *name == section;
         } else if (blInside && !plain.value) {
-            plain.value = text::FindKey(line, key);
+            std::size_t latest = 0;
+            plain.value = text::FindKey(line, key, latest);
         }
         begin += line.size() + 1;
     }

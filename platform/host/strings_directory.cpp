@@ -9,6 +9,7 @@
 #include <cstddef>
 #include <limits>
 #include <mutex>
+#include <unordered_map>
 #include <utility>
 
 #include "file_state.h"
@@ -28,15 +29,11 @@ constexpr std::size_t kTextOverhead = 128;
 // Larger sections are not kept: one of them would drive out all others.
 constexpr std::size_t kMaxText = std::size_t{16} * 1024;
 
-struct Place {
+// What is kept of the file at a path.
+struct Kept {
     unsigned long lastUse = 0;
-    DirectoryHandle pDirectory;
-};
-
-struct KeptStrings {
-    unsigned long lastUse = 0;
-    std::string strPath;
     KeptFile file;
+    DirectoryHandle pDirectory;
 };
 
 // Never destroyed, so that it serves until the very end of a process. The lock is never held while
@@ -44,8 +41,7 @@ struct KeptStrings {
 struct Table {
     std::mutex mutex;
     unsigned long uses = 0;
-    std::vector<Place> places;
-    std::vector<KeptStrings> files;  // as many at most as places
+    std::unordered_map<std::string, Kept> files;
 };
 
 Table &TheTable() {
@@ -63,22 +59,20 @@ void UnlockAfterFork() {
 
 const int g_forkHandlers = pthread_atfork(LockBeforeFork, UnlockAfterFork, UnlockAfterFork);
 
-// Takes the place of the same file's former directory, a new one, or the one used least recently.
-void Keep(const DirectoryHandle &pDirectory) {
-    Table &table = TheTable();
-    const std::lock_guard<std::mutex> lock(table.mutex);
-    auto &places = table.places;
-    auto place = std::find_if(places.begin(), places.end(), [&](const Place &p) {
-        return IsSameFile(p.pDirectory->file, pDirectory->file);
-    });
-    if (place == places.end() && places.size() < kMaxDirectories) {
-        place = places.insert(places.end(), Place());
-    } else if (place == places.end()) {
-        place = std::min_element(places.begin(), places.end(), [](const Place &a, const Place &b) {
-            return a.lastUse < b.lastUse;
-        });
+// What is kept for the path, or a new place for it, in place of the one used least recently.
+Kept &PlaceFor(const char *szPath, Table &table) {
+    auto &files = table.files;
+    auto kept = files.find(szPath);
+    if (kept == files.end()) {
+        if (files.size() >= kMaxDirectories) {
+            files.erase(std::min_element(files.begin(), files.end(), [](auto &a, auto &b) {
+                return a.second.lastUse < b.second.lastUse;
+            }));
+        }
+        kept = files.emplace(szPath, Kept()).first;
     }
-    *place = {++table.uses, pDirectory};
+    kept->second.lastUse = ++table.uses;
+    return kept->second;
 }
 
 // Back to front, so that each bucket has its entries in the file's order.
@@ -110,7 +104,7 @@ bool ReadOn(int fd, std::uint32_t hash, Directory &directory) {
     return WalkSections(fd, begin, directory.file.st_size, add);
 }
 
-std::shared_ptr<const std::string> FindTextLocked(const Directory &directory, std::size_t index) {
+std::shared_ptr<const SectionText> FindTextLocked(const Directory &directory, std::size_t index) {
     for (const KeptText &kept : directory.texts) {
         if (kept.index == index) {
             return kept.pText;
@@ -120,7 +114,7 @@ std::shared_ptr<const std::string> FindTextLocked(const Directory &directory, st
 }
 
 std::size_t Size(const KeptText &kept) {
-    return kept.pText->size() + kTextOverhead;
+    return kept.pText->strLines.size() + kTextOverhead;
 }
 
 // Drops the oldest texts that a directory, and what is to be added to it, leave no room for.
@@ -135,22 +129,6 @@ void DropTexts(const Directory &directory, std::size_t cbAdded) {
         cb -= Size(*keepFrom);
     }
     texts.erase(texts.begin(), keepFrom);
-}
-
-// What is kept for the path, or a new place for it, of the one used least recently.
-KeptStrings &PlaceFor(const char *szPath, std::vector<KeptStrings> &files) {
-    auto kept = std::find_if(files.begin(), files.end(),
-                             [&](const KeptStrings &other) { return other.strPath == szPath; });
-    if (kept == files.end() && files.size() < kMaxDirectories) {
-        kept = files.insert(files.end(), KeptStrings());
-    } else if (kept == files.end()) {
-        kept = std::min_element(
-            files.begin(), files.end(),
-            [](const KeptStrings &a, const KeptStrings &b) { return a.lastUse < b.lastUse; });
-        kept->file.Drop();
-    }
-    kept->strPath = szPath;
-    return *kept;
 }
 
 // What is known of the file already.
@@ -173,74 +151,60 @@ std::uint32_t Hash(std::string_view name) {
 std::optional<OpenFile> Open(const char *szPath) {
     Table &table = TheTable();
     const std::lock_guard<std::mutex> lock(table.mutex);
-    KeptStrings &kept = PlaceFor(szPath, table.files);
-    kept.lastUse = ++table.uses;
+    Kept &kept = PlaceFor(szPath, table);
     struct stat state = {};
-    if (kept.file.Holds(szPath, 0, state)) {
-        return OpenFile{kept.file.Descriptor(), state};
-    }
-    kept.file.Drop();
-    // Should a FIFO stand at the path, its writer is not waited for.
-    FileDescriptor file(open(szPath, O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
-    if (fstat(file.Get(), &state) != 0 || !S_ISREG(state.st_mode)) {
-        return std::nullopt;
-    }
-    kept.file.Keep(std::move(file), state);
-    return OpenFile{kept.file.Descriptor(), state};
-}
-
-DirectoryHandle Get(const struct stat &state) {
-    Table &table = TheTable();
-    {
-        const std::lock_guard<std::mutex> lock(table.mutex);
-        for (Place &place : table.places) {
-            if (IsUnchanged(place.pDirectory->file, state)) {
-                place.lastUse = ++table.uses;
-                return place.pDirectory;
-            }
+    if (!kept.file.Holds(szPath, 0, state)) {
+        kept.file.Drop();
+        // Should a FIFO stand at the path, its writer is not waited for.
+        FileDescriptor file(open(szPath, O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
+        if (fstat(file.Get(), &state) != 0 || !S_ISREG(state.st_mode)) {
+            return std::nullopt;
         }
+        kept.file.Keep(std::move(file), state);
     }
-    const auto pDirectory = std::make_shared<Directory>();
-    pDirectory->file = state;
-    FillBuckets(*pDirectory);
-    return pDirectory;
+    if (kept.pDirectory != nullptr && IsUnchanged(kept.pDirectory->file, state)) {
+        return OpenFile{kept.file.Descriptor(), kept.pDirectory};
+    }
+    const auto pEmpty = std::make_shared<Directory>();
+    pEmpty->file = state;
+    FillBuckets(*pEmpty);
+    return OpenFile{kept.file.Descriptor(), pEmpty};
 }
 
-DirectoryHandle Extend(int fd, const Directory &directory, std::string_view section) {
+bool Extend(const char *szPath, std::string_view section, OpenFile &file) {
     struct stat state = {};
-    const auto pDirectory = Copy(directory);
+    const int fd = file.pDescriptor->Get();
+    const auto pDirectory = Copy(*file.pDirectory);
     if (fstat(fd, &state) != 0 || !IsUnchanged(state, pDirectory->file)) {
-        return nullptr;
+        return false;
     }
     const bool blSettled = IsSettled(state);
     if (!ReadOn(fd, Hash(section), *pDirectory)) {
-        return nullptr;
+        return false;
     }
     pDirectory->entries.shrink_to_fit();
     FillBuckets(*pDirectory);
     DropTexts(*pDirectory, 0);
+    file.pDirectory = pDirectory;
     if (blSettled) {
-        Keep(pDirectory);
+        Table &table = TheTable();
+        const std::lock_guard<std::mutex> lock(table.mutex);
+        PlaceFor(szPath, table).pDirectory = pDirectory;
     }
-    return pDirectory;
+    return true;
 }
 
-void Forget(const Directory &directory) {
+void Forget(const char *szPath) {
     Table &table = TheTable();
     const std::lock_guard<std::mutex> lock(table.mutex);
-    auto &places = table.places;
-    places.erase(std::remove_if(places.begin(), places.end(),
-                                [&](const Place &place) {
-                                    return IsSameFile(place.pDirectory->file, directory.file);
-                                }),
-                 places.end());
+    PlaceFor(szPath, table).pDirectory.reset();
 }
 
 void KeepText(const Directory &directory, std::size_t index, std::string_view text) {
     if (text.size() > kMaxText) {
         return;
     }
-    KeptText kept = {index, std::make_shared<const std::string>(text)};
+    KeptText kept = {index, std::make_shared<const SectionText>(text)};
     const std::lock_guard<std::mutex> lock(TheTable().mutex);
     if (FindTextLocked(directory, index) != nullptr) {
         return;  // another thread was faster
@@ -251,7 +215,7 @@ void KeepText(const Directory &directory, std::size_t index, std::string_view te
     }
 }
 
-std::shared_ptr<const std::string> FindText(const Directory &directory, std::size_t index) {
+std::shared_ptr<const SectionText> FindText(const Directory &directory, std::size_t index) {
     const std::lock_guard<std::mutex> lock(TheTable().mutex);
     return FindTextLocked(directory, index);
 }

@@ -11,6 +11,7 @@
 #include <sys/stat.h>
 
 #include <array>
+#include <atomic>
 #include <cstddef>
 #include <cstdint>
 #include <memory>
@@ -34,9 +35,17 @@ struct Entry {
     std::uint16_t next;   // entry of the same bucket
 };
 
+// The text of a section, its own line included.
+struct SectionText {
+    std::string strLines;
+    mutable std::atomic<std::size_t> latest{0};  // where the key was found that was looked up last
+
+    explicit SectionText(std::string_view lines) : strLines(lines) {}
+};
+
 struct KeptText {
     std::size_t index;  // of the section's entry
-    std::shared_ptr<const std::string> pText;
+    std::shared_ptr<const SectionText> pText;
 };
 
 struct Directory {
@@ -55,33 +64,32 @@ using DirectoryHandle = std::shared_ptr<const Directory>;
 
 std::uint32_t Hash(std::string_view name);
 
-// A regular file that is open for reading, and the state that it is in.
+// A regular file that is open for reading, with the directory of the state that it is in: the kept
+// one, or one that is still empty.
 struct OpenFile {
     std::shared_ptr<const FileDescriptor> pDescriptor;
-    struct stat state = {};
+    DirectoryHandle pDirectory;
 };
 
-// Opens the file at the path, or takes the descriptor that is kept of it. Of a file that is asked
-// for again within a millisecond the state is read without looking for its name: that one of the
-// folders above it was replaced shows a millisecond late, all else at once. Nothing when there is
-// no regular file that can be read.
+// Opens the file at the path, or takes what is kept of it. Of a file that is asked for again within
+// a millisecond the state is read without looking for its name: that one of the folders above it
+// was replaced shows a millisecond late, all else at once. Nothing when there is no regular file
+// that can be read.
 std::optional<OpenFile> Open(const char *szPath);
 
-// The directory of the file in the state: the kept one, or one that is still empty.
-DirectoryHandle Get(const struct stat &state);
+// Grows the file's directory by the next section of the name, and those before it; by all sections,
+// or as many as fit, when there is none. False when the file changed meanwhile or cannot be read so
+// far.
+bool Extend(const char *szPath, std::string_view section, OpenFile &file);
 
-// The directory with the next section of the name, and those before it; with all sections, or as
-// many as fit, when there is none. Null when the file changed meanwhile or cannot be read so far.
-DirectoryHandle Extend(int fd, const Directory &directory, std::string_view section);
+// Forgets the kept directory of the file at the path, which was found wrong.
+void Forget(const char *szPath);
 
-// Forgets a kept directory that was found wrong.
-void Forget(const Directory &directory);
-
-// Keeps the text of a section, its own line included, in place of older ones where room is short.
+// Keeps the text of a section, in place of older ones where room is short.
 void KeepText(const Directory &directory, std::size_t index, std::string_view text);
 
 // The kept text of a section; null when there is none.
-std::shared_ptr<const std::string> FindText(const Directory &directory, std::size_t index);
+std::shared_ptr<const SectionText> FindText(const Directory &directory, std::size_t index);
 
 // Calls visit(begin, name) for each section of a part of the file, in order, until it returns
 // false. Returns false when the part could not be read to its end.

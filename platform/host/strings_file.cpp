@@ -40,8 +40,9 @@ struct Question {
     std::string_view key;
 };
 
-Result SearchLines(std::string_view lines, const Question &question, std::string &strValue) {
-    auto value = text::FindKey(lines, question.key);
+Result SearchLines(std::string_view lines, const Question &question, std::size_t &latest,
+                   std::string &strValue) {
+    auto value = text::FindKey(lines, question.key, latest);
     if (!value) {
         return Result::kAbsent;
     }
@@ -75,7 +76,8 @@ Result SearchPart(const Question &question, off_t begin, off_t end, Keep &&keep,
         keep(*lines);
     }
     for (; lines; lines = blocks.Next()) {
-        result = SearchLines(*lines, question, strValue);
+        std::size_t latest = 0;
+        result = SearchLines(*lines, question, latest, strValue);
         if (result == Result::kFound) {
             return result;
         }
@@ -88,8 +90,13 @@ Result SearchSection(const Question &question, const directory::Directory &direc
                      std::size_t index, std::string &strValue) {
     const auto &entries = directory.entries;
     if (const auto pText = directory::FindText(directory, index)) {
-        const Result result = CheckSection(*pText, question);
-        return result == Result::kFound ? SearchLines(*pText, question, strValue) : result;
+        Result result = CheckSection(pText->strLines, question);
+        if (result == Result::kFound) {
+            std::size_t latest = pText->latest.load(std::memory_order_relaxed);
+            result = SearchLines(pText->strLines, question, latest, strValue);
+            pText->latest.store(latest, std::memory_order_relaxed);
+        }
+        return result;
     }
     const off_t end = index + 1 < entries.size() ? entries[index + 1].begin : directory.end;
     const auto keep = [&](std::string_view lines) { directory::KeepText(directory, index, lines); };
@@ -138,32 +145,24 @@ Result Search(const Question &question, const directory::Directory &directory,
                             : Result::kBeyond;
 }
 
-// Answers from the file's directory, which grows as far as it has to.
-Result SearchFile(const Question &question, const struct stat &state, std::string &strValue) {
-    auto pDirectory = directory::Get(state);
-    Result result = Result::kBeyond;
-    while (pDirectory != nullptr &&
-           (result = Search(question, *pDirectory, strValue)) == Result::kBeyond) {
-        pDirectory = directory::Extend(question.fd, *pDirectory, question.section);
-    }
-    if (pDirectory != nullptr && result == Result::kChanged) {
-        directory::Forget(*pDirectory);
-    }
-    return pDirectory == nullptr ? Result::kChanged : result;
-}
-
 Result Read(const char *szPath, std::string_view section, std::string_view key,
             std::string &strValue) {
     for (int attempt = 0; attempt < kAttempts; ++attempt) {
-        const auto file = directory::Open(szPath);
+        auto file = directory::Open(szPath);
         if (!file) {
             return Result::kUnread;
         }
-        const Result result =
-            SearchFile({file->pDescriptor->Get(), section, key}, file->state, strValue);
+        const Question question = {file->pDescriptor->Get(), section, key};
+        Result result = Search(question, *file->pDirectory, strValue);
+        while (result == Result::kBeyond) {
+            result = directory::Extend(szPath, section, *file)
+                         ? Search(question, *file->pDirectory, strValue)
+                         : Result::kChanged;
+        }
         if (result != Result::kChanged) {
             return result;
         }
+        directory::Forget(szPath);
     }
     return Result::kUnread;
 }
