@@ -37,8 +37,7 @@ constexpr std::chrono::microseconds kLastWait{2000};
 // a quarter of the time of opening them anew.
 constexpr std::size_t kMaxIdle = 8;
 
-// Whoever takes a lock over and over looks this often whether somebody waits, and whether the file
-// still has its name.
+// Whoever takes a lock over and over looks this often whether somebody waits.
 constexpr std::chrono::milliseconds kLookInterval{1};
 
 // An open lock file.
@@ -177,9 +176,10 @@ class LockFile {
 enum class Try { kHeld, kHeldElsewhere, kRemoved, kUnsafe, kFailed };
 
 // Reads the status of the file as it is now. False when its name has gone, or leads to another
-// file.
+// file: a name may have been given to another one since the file was opened, and one without a
+// folder depends on where the process is.
 bool ReadStatus(const LockFile &file, struct stat &status) {
-    if (file.WasOpen() && file.Looks()) {
+    if (file.WasOpen()) {
         return lstat(file.Path(), &status) == 0 && host::IsSameFile(status, file.StatusAtOpen());
     }
     return fstat(file.Get(), &status) == 0 && status.st_nlink > 0;
