@@ -10,10 +10,11 @@
 // such as those without a key or with a zero byte. When a key stands in a file more than once, the
 // first line with it holds.
 //
-// The operations open and close the file in each call; nothing is cached and any thread may call
-// them at any time. A file is only ever replaced as a whole: a reader sees the old file or the new
-// one, also when the writer dies half-way. Two writers at once are the callers' to keep apart
-// (file_lock.h): each writes whole files, so the later one may undo the earlier one's change.
+// No operation answers from a former state of the file, but for a folder above it that was replaced
+// within the last millisecond; any thread may call them at any time. A file is only ever replaced
+// as a whole: a reader sees the old file or the new one, also when the writer dies half-way. Two
+// writers at once are the callers' to keep apart (file_lock.h): each writes whole files, so the
+// later one may undo the earlier one's change.
 //
 // A file may stand in a folder that everybody can write to, such as "/tmp": what is no regular file
 // there, or belongs to somebody else (root excepted), or is a link or a second name of another file

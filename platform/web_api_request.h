@@ -88,8 +88,9 @@ struct Answer {
 
 // The answer to the calling thread's latest exchange, discovery or call, also where the request
 // failed: for a program that tells its user why a server refused. It is empty at the start of a
-// thread, and stays as it was for a request that fails before its exchange. Of an error page to a
-// request with a response stream, a code in the first 64 KiB counts. Never fails.
+// thread and after an exchange that got no answer, and stays as it was for a request whose
+// arguments are refused. Of an error page to a request with a response stream, a code in the first
+// 64 KiB counts. Never fails.
 ZELO_PLATFORM_API Answer LatestAnswer();
 
 }  // namespace CredRequestUtil

@@ -1,6 +1,7 @@
 // What any credential store has to promise, and what the host's adds: one file, safe for processes.
 
 #include <gtest/gtest.h>
+#include <sqlite3.h>
 
 #include <filesystem>
 #include <set>
@@ -140,6 +141,34 @@ TEST(CredentialStore, FollowsTheFileThatStandsAtItsPlace) {
     fs::rename("/usr/zelo/etc/backup.db", stored::kDatabase);
     EXPECT_EQ(stored::Describe(), "https://old:443 ?");
     EXPECT_TRUE(children::InOne([] { return stored::Describe() == "https://old:443 ?"; }));
+}
+
+// With a write-ahead log, a change does not show in the store's file.
+TEST(CredentialStore, FollowsOtherProcessesAlsoInAFileWithALog) {
+    RemoveStore();
+    const long id = stored::AddCredential("ZELO.QRM", "a");
+    stored::AddSession(id, "old");
+    ASSERT_TRUE(children::InOne([] {
+        sqlite3 *pDb = nullptr;
+        return sqlite3_open(stored::kDatabase, &pDb) == SQLITE_OK &&
+               sqlite3_exec(pDb, "PRAGMA journal_mode = WAL", nullptr, nullptr, nullptr) ==
+                   SQLITE_OK &&
+               sqlite3_close(pDb) == SQLITE_OK;
+    }));
+    const children::Signal known;
+    const children::Signal changed;
+    const children::Signal done;
+    const pid_t writer = children::Start([&] {
+        known.Await();
+        stored::AddSession(id, "new");
+        return changed.Give() && done.Await();
+    });
+    EXPECT_EQ(stored::Describe(), "https://a:443 ? token=old csrf=?");
+    EXPECT_TRUE(known.Give());
+    EXPECT_TRUE(changed.Await());
+    EXPECT_EQ(stored::Describe(), "https://a:443 ? token=new csrf=?");
+    EXPECT_TRUE(done.Give());
+    EXPECT_TRUE(children::Ended(writer));
 }
 
 TEST(CredentialStore, DamagedOrForeignFilesAreLeftAsTheyAre) {

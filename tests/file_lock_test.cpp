@@ -31,9 +31,9 @@ bool IsFree(int timeout_s = 0) {
     return result == 1 && YLIBCFileUnlockByFile(handle) == 0;
 }
 
-int Take() {
+int Take(const char *szLock = kLock) {
     int handle = -1;
-    EXPECT_EQ(YLIBCFileLockByFile(kLock, 0, &handle), 1);
+    EXPECT_EQ(YLIBCFileLockByFile(szLock, 0, &handle), 1);
     return handle;
 }
 
@@ -145,16 +145,17 @@ TEST(FileLock, IsOneLockAlsoWhenItsFileIsRemoved) {
     EXPECT_EQ(YLIBCFileUnlockByFile(handle), 0);
     EXPECT_TRUE(children::Ended(waiter));
     // What the process has held before is worth nothing once another file has the name.
-    ASSERT_TRUE(IsFree());
-    std::ofstream("/tmp/other").flush();
-    fs::rename("/tmp/other", kLock);
+    constexpr const char *kOther = "/tmp/other";
     const children::Signal held;
     const children::Signal done;
     const pid_t holder = children::Start([&] {
-        const int own = Take();
+        const int own = Take(kOther);
         return held.Give() && done.Await() && YLIBCFileUnlockByFile(own) == 0;
     });
     ASSERT_TRUE(held.Await());
+    EXPECT_TRUE(IsFree());
+    fs::rename(kLock, "/tmp/former");
+    fs::rename(kOther, kLock);
     EXPECT_FALSE(IsFree());
     EXPECT_TRUE(done.Give());
     EXPECT_TRUE(children::Ended(holder));

@@ -113,7 +113,8 @@ class LockFile {
         m_fd = file->fd;
         m_statusAtOpen = file->status;
         const Clock::time_point now = Clock::now();
-        m_blLooks = now - file->looked >= kLookInterval;
+        // A name without a folder depends on where the process is.
+        m_blLooks = szPath[0] != '/' || now - file->looked >= kLookInterval;
         m_blGivesWay = m_blLooks || now - file->released < kFirstWait;
         file->looked = m_blLooks ? now : file->looked;
     }
@@ -184,12 +185,15 @@ class LockFile {
 enum class Try { kHeld, kHeldElsewhere, kRemoved, kUnsafe, kFailed };
 
 // Reads the status of the file as it is now. False when its name has gone, or leads to another
-// file.
+// file. Between two looks at the name an unchanged status tells as much: to be renamed or removed
+// changes it.
 bool ReadStatus(const LockFile &file, struct stat &status) {
-    if (file.WasOpen() && file.Looks()) {
-        return lstat(file.Path(), &status) == 0 && host::IsSameFile(status, file.StatusAtOpen());
+    const bool blRead = fstat(file.Get(), &status) == 0;
+    if (!file.WasOpen()) {
+        return blRead && status.st_nlink > 0;
     }
-    return fstat(file.Get(), &status) == 0 && status.st_nlink > 0;
+    return (blRead && !file.Looks() && host::IsUnchanged(status, file.StatusAtOpen())) ||
+           (lstat(file.Path(), &status) == 0 && host::IsSameFile(status, file.StatusAtOpen()));
 }
 
 Try TryLock(const LockFile &file) {

@@ -12,6 +12,7 @@
 #include <algorithm>
 #include <array>
 #include <cstdlib>
+#include <limits>
 #include <memory>
 #include <mutex>
 #include <new>
@@ -35,6 +36,7 @@ constexpr long kStallBytesPerSecond = 100;
 constexpr long kStallTime_s = 30;
 // For a body in memory; one that goes to a stream may take its time as long as it moves.
 constexpr long kWholeTimeout_s = 300;
+constexpr long kLongestTimeout_s = std::numeric_limits<int>::max() / 1000;
 constexpr long kStreamBuffer = 512 * 1024L;
 constexpr long kReplyBuffer = 16 * 1024L;
 // What is sent is small, while libcurl allocates and frees its buffer for each exchange.
@@ -341,8 +343,9 @@ void SetRequest(CURL *pEasy, const HttpRequest &request, const curl_slist *pHead
     curl_easy_setopt(pEasy, CURLOPT_URL, request.strUrl.c_str());
     curl_easy_setopt(pEasy, CURLOPT_HTTPHEADER, pHeaders);
     const long wholeTimeout_s = request.pStream == nullptr ? kWholeTimeout_s : 0;
-    curl_easy_setopt(pEasy, CURLOPT_TIMEOUT,
-                     request.timeout_s > 0 ? static_cast<long>(request.timeout_s) : wholeTimeout_s);
+    // What libcurl refuses would leave the limit of the exchange before.
+    const long ownTimeout_s = std::min<long>(request.timeout_s, kLongestTimeout_s);
+    curl_easy_setopt(pEasy, CURLOPT_TIMEOUT, ownTimeout_s > 0 ? ownTimeout_s : wholeTimeout_s);
     curl_easy_setopt(pEasy, CURLOPT_FORBID_REUSE, request.blKeepConnection ? 0L : 1L);
     curl_easy_setopt(pEasy, CURLOPT_BUFFERSIZE,
                      request.pStream == nullptr ? kReplyBuffer : kStreamBuffer);

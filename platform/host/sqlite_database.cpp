@@ -323,20 +323,24 @@ int Database::SetAsideIfDamaged(char *szPath, int cbPath) {
 }
 
 // The count stands in the file's header. It is read on the connection's own descriptor: to close
-// another one would drop SQLite's locks.
+// another one would drop SQLite's locks. A file that somebody has given a write-ahead log counts
+// nothing: what is written goes into the log first.
 bool Database::ReadChanges(std::uint32_t &changes) const {
-    constexpr int kPlace = 24;
-    std::array<unsigned char, 4> bytes = {};
+    constexpr int kPlace = 18;
+    constexpr std::size_t kCount = 24 - kPlace;
+    constexpr unsigned char kWithoutLog = 1;
+    std::array<unsigned char, kCount + 4> bytes = {};
     sqlite3_file *pFile = nullptr;
     if (sqlite3_file_control(m_pConnection->pDb.get(), "main", SQLITE_FCNTL_FILE_POINTER, &pFile) !=
             SQLITE_OK ||
         pFile->pMethods == nullptr ||
-        pFile->pMethods->xRead(pFile, bytes.data(), bytes.size(), kPlace) != SQLITE_OK) {
+        pFile->pMethods->xRead(pFile, bytes.data(), bytes.size(), kPlace) != SQLITE_OK ||
+        bytes[0] != kWithoutLog) {
         return false;
     }
     changes = 0;
-    for (const unsigned char byte : bytes) {
-        changes = changes << 8U | byte;
+    for (std::size_t i = kCount; i < bytes.size(); ++i) {
+        changes = changes << 8U | bytes[i];
     }
     return true;
 }
