@@ -148,15 +148,17 @@ struct Transfer {
     const HttpRequest &request;
     CURL *pEasy;
     ReplySink sink;
+    long status = 0;  // once the body has begun
     bool blStopped = false;
 };
 
 size_t TakeBody(char *pData, size_t size, size_t count, void *pContext) {
     auto *const pTransfer = static_cast<Transfer *>(pContext);
-    long status = 0;
-    curl_easy_getinfo(pTransfer->pEasy, CURLINFO_RESPONSE_CODE, &status);
+    if (pTransfer->status == 0) {
+        curl_easy_getinfo(pTransfer->pEasy, CURLINFO_RESPONSE_CODE, &pTransfer->status);
+    }
     const size_t cb = size * count;
-    return pTransfer->sink.Take(pData, cb, status) ? cb : CURL_WRITEFUNC_ERROR;
+    return pTransfer->sink.Take(pData, cb, pTransfer->status) ? cb : CURL_WRITEFUNC_ERROR;
 }
 
 int ShowProgress(void *pContext, curl_off_t cbExpected, curl_off_t /*cbReceived*/,
