@@ -160,6 +160,13 @@ TEST(StringsFile, SeesEveryChangeAtOnce) {
         utimensat(AT_FDCWD, kFile, times, 0);
         EXPECT_EQ(Get("a", "k"), "2");
     }
+    // Another file in place of one that goes on under another name.
+    ASSERT_EQ(Get("a", "k"), "2");
+    const std::string strFormer = std::string(kFile) + ".former";
+    std::filesystem::rename(kFile, strFormer);
+    Write(strSections[0]);
+    EXPECT_EQ(Get("a", "k"), "1");
+    std::filesystem::rename(strFormer, kFile);
     AwaitAge();
     EXPECT_EQ(Get("a", "k"), "2");
     std::filesystem::resize_file(kFile, 11);

@@ -29,21 +29,25 @@ class KeptFile {
     // For as long as the caller reads from it.
     std::shared_ptr<const FileDescriptor> Descriptor() const { return m_pDescriptor; }
 
-    // Whether the path still leads to the file; its state now. The name is looked at once a
-    // millisecond: that a folder above it was replaced shows so much later, all else at once.
-    // flags: those of fstatat.
+    // Whether the path still leads to the file; its state now. While that is unchanged, the name is
+    // looked at once a millisecond: that a folder above it was replaced shows so much later, all
+    // else at once, since to be renamed or removed changes the state. flags: those of fstatat.
     bool Holds(const char *szPath, int flags, struct stat &state) {
         if (m_pDescriptor == nullptr) {
             return false;
         }
         const Clock::time_point now = Clock::now();
-        // One without a name has been replaced or removed.
-        if (now - m_looked < kLookInterval && fstat(m_pDescriptor->Get(), &state) == 0 &&
-            state.st_nlink > 0) {
+        // A name without a folder depends on where the process is.
+        if (szPath[0] == '/' && now - m_looked < kLookInterval &&
+            fstat(m_pDescriptor->Get(), &state) == 0 && IsUnchanged(state, m_state)) {
             return true;
         }
+        if (fstatat(AT_FDCWD, szPath, &state, flags) != 0 || !IsSameFile(state, m_state)) {
+            return false;
+        }
+        m_state = state;
         m_looked = now;
-        return fstatat(AT_FDCWD, szPath, &state, flags) == 0 && IsSameFile(state, m_state);
+        return true;
     }
 
   private:
