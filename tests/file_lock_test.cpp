@@ -101,23 +101,27 @@ TEST(FileLock, WaitsNoLongerThanItsTime) {
 }
 
 TEST(FileLock, IsNoChildsAndNoProgrammes) {
-    const children::Signal end;
-    const std::pair<const char *, std::function<bool(int handle)>> rows[] = {
+    using children::Signal;
+    const std::pair<const char *, std::function<bool(int handle, const Signal &end)>> rows[] = {
         {"killed, with a child that lives on",
-         [&](int handle) {
+         [](int handle, const Signal &end) {
              children::Start([&] { return YLIBCFileUnlockByFile(handle) < 0 && end.Await(); });
              return raise(SIGKILL) == 0;
          }},
         {"replaced by a program",
-         [&](int) { return end.BecomeInput() && execl("/bin/cat", "cat", nullptr) == 0; }},
+         [](int, const Signal &end) {
+             return end.BecomeInput() && execl("/bin/cat", "cat", nullptr) == 0;
+         }},
     };
     for (const auto &row : rows) {
         SCOPED_TRACE(row.first);
+        // Each row's own: the child that lives on may be slow, and the next row must not take its end.
+        const children::Signal end;
         const children::Signal held;
         const children::Signal goOn;
         const pid_t pid = children::Start([&] {
             const int handle = Take();
-            return held.Give() && goOn.Await() && row.second(handle);
+            return held.Give() && goOn.Await() && row.second(handle, end);
         });
         ASSERT_TRUE(held.Await());
         EXPECT_FALSE(IsFree());
