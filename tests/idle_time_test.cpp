@@ -249,7 +249,7 @@ void ExpectOneValue() {
 
 TEST(IdleTime, SixteenProcessesThatAreKilledAtRandomKeepTheFirstLiveValue) {
     constexpr unsigned long kFirst = 1'000'000;
-    constexpr auto kDuration = std::chrono::seconds(10);
+    constexpr auto kHalf = std::chrono::seconds(10);
     Prepare("", kFirst);
     LiveProcess holder([] { return Get() == "0 1000000"; });
     const pid_t holderPid = holder.Pid();
@@ -276,22 +276,24 @@ TEST(IdleTime, SixteenProcessesThatAreKilledAtRandomKeepTheFirstLiveValue) {
     for (pid_t &pid : workers) {
         pid = children::Start(work);
     }
-    const auto start = std::chrono::steady_clock::now();
-    int killed = 0;
-    // On a busy machine that many kills take longer.
-    while ((std::chrono::steady_clock::now() - start < kDuration || killed < 32) && !HasFailure()) {
-        if (std::chrono::steady_clock::now() - start > kDuration / 2) {
-            holder.Kill();
+    const auto disturb = [&] {
+        const auto end = std::chrono::steady_clock::now() + kHalf;
+        // On a busy machine that many kills take longer.
+        for (int killed = 0;
+             (std::chrono::steady_clock::now() < end || killed < 16) && !HasFailure(); ++killed) {
+            // The moment is the random thing here.
+            std::this_thread::sleep_for(std::chrono::microseconds(random() % 20'000));
+            pid_t &pid = workers[random() % workers.size()];
+            EXPECT_TRUE(children::Kill(pid)) << "something was wrong for it";
+            pid = children::Start(work);
+            if (killed % 16 == 15) {
+                ExpectOneValue();
+            }
         }
-        // The moment is the random thing here.
-        std::this_thread::sleep_for(std::chrono::microseconds(random() % 20'000));
-        pid_t &pid = workers[random() % workers.size()];
-        EXPECT_TRUE(children::Kill(pid)) << "something was wrong for it";
-        pid = children::Start(work);
-        if (++killed % 16 == 0) {
-            ExpectOneValue();
-        }
-    }
+    };
+    disturb();
+    holder.Kill();
+    disturb();
     for (pid_t pid : workers) {
         EXPECT_TRUE(children::Kill(pid));
     }
