@@ -533,7 +533,7 @@ TEST_F(SendWebapi, KeysOfTheInfoFileAreReadAsTheyWereWritten) {
 
 TEST_F(SendWebapi, WritersOfTheInfoFileLoseNothingOfEachOther) {
     constexpr int kProcesses = 8;
-    constexpr int kKeys = 250;
+    constexpr int kKeys = 1000;
     EXPECT_TRUE(children::InEach(kProcesses, [](int process) {
         bool blAll = true;
         for (int key = 0; key < kKeys; ++key) {
