@@ -115,7 +115,8 @@ TEST(FileLock, IsNoChildsAndNoProgrammes) {
     };
     for (const auto &row : rows) {
         SCOPED_TRACE(row.first);
-        // Each row's own: the child that lives on may be slow, and the next row must not take its end.
+        // Each row's own: the child that lives on may be slow, and the next row must not take its
+        // end.
         const children::Signal end;
         const children::Signal held;
         const children::Signal goOn;
