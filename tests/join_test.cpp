@@ -254,7 +254,7 @@ TEST_F(Join, DescribesTheApplianceByItsFactsOverOneConnection) {
 }
 
 TEST_F(Join, RefusedRepliesAreLoggedWithoutTheToken) {
-    std::string strDeep(2000, '[');
+    const std::string strDeep = std::string(2000, '[') + std::string(2000, ']');
     const struct {
         std::string strBody;
         const char *szLogged;  // nullptr: accepted

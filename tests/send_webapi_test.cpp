@@ -137,7 +137,7 @@ TEST_F(SendWebapi, TheReplyDecidesTheStatus) {
         {"", -1, "no_connection"},
         {"<html>", -1, "no_connection"},
         {R"({"success":tr)", -1, "no_connection"},
-        {std::string(2000, '['), -1, "no_connection"},
+        {std::string(2000, '[') + std::string(2000, ']'), -1, "no_connection"},
     };
     EXPECT_EQ(Call(), "0") << "and the process keeps its records";
     for (const auto &row : rows) {

@@ -169,7 +169,8 @@ TEST_F(Request, UnusableAnswersCountAsNone) {
          {body("<html>"), body(""), body("[]"), body("7"), body(R"({"success":"yes"})"),
           body(R"({"success":true,"data":[]})"), body(R"({"success":true,"data":{"path":1}})"),
           path("relative"), path(""), path("/a b"), path("/a?b"), path("/a\\r\\nX: y"),
-          path("/" + std::string(2000, 'a')), endless, body(std::string(2000, '[')),
+          path("/" + std::string(2000, 'a')), endless,
+          body(std::string(2000, '[') + std::string(2000, ']')),
           body(R"({"success":true,"data":{"path":"/x"}})", 500), redirect, cut}) {
         AnswerDiscovery(answer);
         EXPECT_EQ(Http(), "") << answer.body.value_or("").substr(0, 60);
