@@ -143,6 +143,7 @@ Outcome Observe(const Fault &fault, const std::function<void()> &body) {
     Result Real_##name parameters asm("__real_" symbol);                                \
     Result Wrap_##name parameters asm("__wrap_" symbol);                                \
     Result Wrap_##name parameters {                                                     \
+        seam::Count();                                                                  \
         seam::AddRecords(-static_cast<int>(lost));                                      \
         Result result = Real_##name arguments;                                          \
         return seam::FailsRelease(#name) ? (failure) : result;                          \
