@@ -51,16 +51,17 @@ class Joined : public testing::Test {
         s_pServer->ForgetAnswers();
     }
 
-    // A credential with the id 1, nothing else.
-    static void Reset(const char *szProtocol = "https") {
+    // A credential with the id 1, nothing else; for the server of the test unless there is a port.
+    static void Reset(const char *szProtocol = "https", int port = 0) {
         std::filesystem::remove_all(stored::kFolder);
         for (const char *szPath : {kMarker, kInfoFile, kJournal}) {
             std::filesystem::remove(szPath);
         }
         const bool blHttps = std::string(szProtocol) == "https";
-        const long id =
-            stored::AddCredential("ZELO.QRM", "localhost", nullptr, szProtocol,
-                                  blHttps ? s_pServer->HttpsPort() : s_pServer->HttpPort());
+        if (port == 0) {
+            port = blHttps ? s_pServer->HttpsPort() : s_pServer->HttpPort();
+        }
+        const long id = stored::AddCredential("ZELO.QRM", "localhost", nullptr, szProtocol, port);
         stored::AddSession(id, kToken, "csrf-9876543210");
     }
 

@@ -241,6 +241,7 @@ TEST_F(SendWebapi, TheTokensGoToTheServerAloneAndAsHeaders) {
         "http://localhost:" + std::to_string(other.HttpPort()) + "/qrm/rpc";
     s_pServer->AnswerNext(kApi, redirect);
     EXPECT_EQ(Call(), "-1");
+    EXPECT_EQ(State(), "status=no_connection marker=yes notified=1");
     EXPECT_EQ(other.Requests().size(), 0U);
 
     const Json::Value requests = s_pServer->Requests();
@@ -257,8 +258,42 @@ TEST_F(SendWebapi, TheTokensGoToTheServerAloneAndAsHeaders) {
     }
 }
 
+TEST_F(SendWebapi, AServerThatCannotProveItselfGetsNoCall) {
+    constexpr const char *kOtherCa = "/usr/zelo/etc/ssl/ca.d/other.pem";
+    const struct {
+        const char *szName;
+        std::time_t age;  // since the certificate's end
+        bool blTrusted;   // its authority is
+        bool blCalled;
+    } rows[] = {{"localhost", -3600, true, true},
+                {"localhost", -3600, false, false},
+                {"localhost", 60, true, false},
+                {"other.example", -3600, true, false}};
+    for (const auto &row : rows) {
+        SCOPED_TRACE(&row - rows);
+        devserver::Options options;
+        options.token = joined::kToken;
+        options.certificate.names = {row.szName};
+        options.certificate.not_after = std::time(nullptr) - row.age;
+        DevServerProcess other{options};
+        std::string strReason;
+        ASSERT_TRUE(other.Start(strReason)) << strReason;
+        std::filesystem::remove(kOtherCa);
+        if (row.blTrusted) {
+            WriteFile(kOtherCa, other.CaPem());
+        }
+        Reset("https", other.HttpsPort());
+        EXPECT_EQ(Call(), row.blCalled ? "0" : "-1");
+        EXPECT_EQ(State(), row.blCalled ? "status=success marker=no notified=0"
+                                        : "status= marker=yes notified=1");
+        EXPECT_EQ(other.Requests().empty(), !row.blCalled);
+    }
+    std::filesystem::remove(kOtherCa);
+}
+
 // A server that is silent, that sends a byte a second for ever, that never ends, that cuts: each
-// call ends within its bound. They wait at the same time, each in a process of its own.
+// call ends within its bound, leaves the status of the call before and tells the user. They wait at
+// the same time, each in a process of its own.
 TEST_F(SendWebapi, NoServerKeepsACallForEver) {
     std::map<std::string, devserver::NextAnswer> answers;
     answers["silent"].delay_ms = 120'000;
@@ -276,16 +311,23 @@ TEST_F(SendWebapi, NoServerKeepsACallForEver) {
         s_pServer->AnswerNext(kApi, answer);
         methods.push_back(strMethod);
     }
+    EXPECT_EQ(Call(), "0");
     EXPECT_TRUE(children::InEach(static_cast<int>(methods.size()), [&](int i) {
         const std::string &strMethod = methods[static_cast<std::size_t>(i)];
+        const bool blFile = strMethod.rfind("file", 0) == 0;
         const auto start = std::chrono::steady_clock::now();
-        Json::Value params;
-        const int result =
-            strMethod.rfind("file", 0) == 0
-                ? ZELOQRMClientGetFile("/tmp/" + strMethod, kApi, 1, strMethod, params)
-                : std::stoi(Call(false, strMethod.c_str()));
-        return result == -1 && std::chrono::steady_clock::now() - start < std::chrono::seconds(100);
+        int result = 0;
+        const seam::Outcome outcome = seam::Observe([&] {
+            Json::Value params;
+            result = blFile ? ZELOQRMClientGetFile("/tmp/" + strMethod, kApi, 1, strMethod, params)
+                            : std::stoi(Call(false, strMethod.c_str()));
+        });
+        const bool blMarked =
+            std::count(outcome.calls.begin(), outcome.calls.end(), "YLIBCFileStat") == 1;
+        return result == -1 && blMarked != blFile &&
+               std::chrono::steady_clock::now() - start < std::chrono::seconds(100);
     }));
+    EXPECT_EQ(State().substr(0, State().rfind('=')), "status=success marker=yes notified");
 }
 
 // --- Client info update -------------------------------------------------------------------------
@@ -519,16 +561,37 @@ TEST_F(SendWebapi, KeysOfTheInfoFileAreReadAsTheyWereWritten) {
                                                           {"a", {"c\0d", 3}}}) {
         EXPECT_FALSE(ZELOQRMClientSetInfo(strKey, strText));
     }
-    for (long result : {0L, -1L}) {
-        bool blSet = true;
-        const seam::Outcome outcome =
-            seam::Observe({"YLIBCFileLockByFile", 1, result == 0, result},
-                          [&] { blSet = ZELOQRMClientSetInfo("key", "new"); });
-        EXPECT_FALSE(blSet);
-        EXPECT_EQ(outcome.calls.size(), 1U) << "nothing is written without the lock";
-        EXPECT_EQ(outcome.recordsLeft, 0);
-    }
     EXPECT_EQ(FileText(joined::kInfoFile), strBefore);
+}
+
+TEST_F(SendWebapi, TheInfoFileSurvivesEveryFailingCall) {
+    const auto setUp = [] { WriteFile(joined::kInfoFile, "k=\"old\"\n"); };
+    const auto state = [] { return FileText(joined::kInfoFile); };
+    const Expected unset{"0", "", "k=\"old\"\n"};
+    const torture::Case set{"set",
+                            "",
+                            setUp,
+                            [] { return std::to_string(ZELOQRMClientSetInfo("k", "new")); },
+                            state,
+                            {"1", "", "k=\"new\"\n"},
+                            {{"YLIBCFileLockByFile('/tmp/qrm_client.info.lock', 0, *)\n"
+                              "YLIBCFileSetKeyValue('/tmp/qrm_client.info', 'k', 'new', 0)",
+                              unset}}};
+    torture::Run(set);
+    torture::RunOnce(set, {"YLIBCFileLockByFile", 1, true, 0}, unset);
+
+    const auto get = [] {
+        std::string strValue = "before";
+        return std::to_string(ZELOQRMClientGetInfo("k", strValue)) + ' ' + strValue;
+    };
+    torture::Run({"get",
+                  "",
+                  setUp,
+                  get,
+                  state,
+                  {"1 old", "", "k=\"old\"\n"},
+                  {{"YLIBCFileGetKeyValue('/tmp/qrm_client.info', 'k', buf, 1024, 0)",
+                    {"0 before", "", "k=\"old\"\n"}}}});
 }
 
 TEST_F(SendWebapi, WritersOfTheInfoFileLoseNothingOfEachOther) {
