@@ -8,9 +8,6 @@
 namespace bench {
 namespace {
 
-// Takes fewer calls for a file than libcurl's own default.
-constexpr long kFileBuffer = 512 * 1024L;
-
 size_t TakeReply(char *pData, size_t size, size_t count, void *pContext) {
     static_cast<std::string *>(pContext)->append(pData, size * count);
     return size * count;
@@ -63,9 +60,9 @@ void BareExchange::Post(const std::string &strUrl, const std::string &strBody,
     AddHeader("Authorization: Bearer " + strToken);
 }
 
-void BareExchange::WriteTo(int fd) {
+void BareExchange::WriteTo(int fd, long cbBuffer) {
     m_fd = fd;
-    curl_easy_setopt(m_pEasy.get(), CURLOPT_BUFFERSIZE, kFileBuffer);
+    curl_easy_setopt(m_pEasy.get(), CURLOPT_BUFFERSIZE, cbBuffer);
     curl_easy_setopt(m_pEasy.get(), CURLOPT_WRITEFUNCTION, WriteReply);
     curl_easy_setopt(m_pEasy.get(), CURLOPT_WRITEDATA, &m_fd);
 }

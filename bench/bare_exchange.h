@@ -24,8 +24,8 @@ class BareExchange {
     void Get(const std::string &strUrl);
     void Post(const std::string &strUrl, const std::string &strBody, const std::string &strToken);
 
-    // The reply goes into the open file from now on.
-    void WriteTo(int fd);
+    // The reply goes into the open file from now on, received through a buffer of this size.
+    void WriteTo(int fd, long cbBuffer);
 
     // Sends, and receives a reply with status 200.
     bool Perform();
