@@ -24,15 +24,19 @@ constexpr const char *kApi = "ZELO.QRM.RPC.File";
 constexpr const char *kPath = "/qrm/file";
 constexpr const char *kName = "image";
 
-// In memory: what a disk does meanwhile is neither side's doing.
-constexpr const char *kDestination = "/dev/shm/zelo-bench-file";
+// Where throughput is compared: what a disk does meanwhile, or the system to find the memory for a
+// file, is neither side's doing.
+constexpr const char *kNowhere = "/dev/null";
+
+// A file, in memory.
+constexpr const char *kFile = "/dev/shm/zelo-bench-file";
 constexpr int kMiB = 1024 * 1024;
 constexpr int kPairs = 11;
 
 constexpr long kLibraryBuffer = 512 * 1024L;
 
-bool RemoveDestination() {
-    return unlink(kDestination) == 0;
+bool RemoveFile() {
+    return unlink(kFile) == 0;
 }
 
 // Runs a program with its output going nowhere. True when it went well.
@@ -49,11 +53,11 @@ bool RunProgram(std::vector<const char *> arguments) {
     return error == 0 && waitpid(pid, &status, 0) == pid && status == 0;
 }
 
-bool Download(int mib) {
+bool Download(int mib, const char *szPath) {
     Json::Value params;
     params["name"] = kName;
     params["size"] = static_cast<Json::Int64>(mib) * kMiB;
-    return ZELOQRMClientGetFile(kDestination, kApi, 1, "get", params) == 0;
+    return ZELOQRMClientGetFile(szPath, kApi, 1, "get", params) == 0;
 }
 
 struct Target {
@@ -73,7 +77,7 @@ struct Target {
     bool DownloadByTwin() const { return DownloadThrough(kLibraryBuffer); }
 
     bool DownloadThrough(long cbBuffer) const {
-        const int fd = open(kDestination, O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0644);
+        const int fd = open(kNowhere, O_WRONLY | O_CLOEXEC);
         BareExchange bare;
         bare.Post(strUrl, strBody, kServerToken);
         bare.WriteTo(fd, cbBuffer);
@@ -86,14 +90,14 @@ struct Target {
         return RunProgram({"curl", "--silent", "--fail", "--noproxy", "*", "--cacert", kAuthority,
                            "--header", strToken.c_str(), "--header",
                            "Content-Type: application/json", "--data", strBody.c_str(), "--output",
-                           kDestination, strUrl.c_str()});
+                           kNowhere, strUrl.c_str()});
     }
 };
 
 Pair DownloadPair(int mib, const std::string &strProtocol, bool (Target::*pfnPeer)() const) {
     const auto pTarget = std::make_shared<Target>(mib, strProtocol);
-    return {{[pTarget, mib] { return Download(mib); }, RemoveDestination},
-            {[pTarget, pfnPeer] { return (*pTarget.*pfnPeer)(); }, RemoveDestination}};
+    return {{[pTarget, mib] { return Download(mib, kNowhere); }, nullptr},
+            {[pTarget, pfnPeer] { return (*pTarget.*pfnPeer)(); }, nullptr}};
 }
 
 // The most memory that the process has had so far, in KiB.
@@ -111,30 +115,26 @@ Pair MemoryPair(int mib) {
     const auto pTarget = std::make_shared<Target>(mib, "https");
     const auto peakOf = [pTarget](int size_mib) {
         return [size_mib, pTarget] {
-            return InChild([size_mib] { return Download(size_mib) ? PeakMemory() : -1; });
+            return InChild([size_mib] { return Download(size_mib, kFile) ? PeakMemory() : -1; });
         };
     };
-    return {{nullptr, RemoveDestination, peakOf(mib)}, {nullptr, RemoveDestination, peakOf(1)}};
+    return {{nullptr, RemoveFile, peakOf(mib)}, {nullptr, RemoveFile, peakOf(1)}};
 }
 
 Pair DigestPair(int mib) {
     const devserver::GeneratedFile content(kName, static_cast<std::uint64_t>(mib) * kMiB);
-    std::ofstream file(kDestination, std::ios::binary);
+    std::ofstream file(kFile, std::ios::binary);
     for (std::uint64_t offset = 0; offset < content.Size(); offset += kMiB) {
         file << content.Read(offset, kMiB);
     }
     file.close();
     Require(file.good(), "cannot write the file to digest");
-    const std::shared_ptr<void> pRemoval(nullptr, [](void *) { RemoveDestination(); });
+    const std::shared_ptr<void> pRemoval(nullptr, [](void *) { RemoveFile(); });
     const auto subject = [pRemoval] {
         char szDigest[33];
-        return GetFileMd5String(kDestination, szDigest, sizeof(szDigest)) == 0;
+        return GetFileMd5String(kFile, szDigest, sizeof(szDigest)) == 0;
     };
-    return {{subject, nullptr},
-            {[] {
-                 return RunProgram({"openssl", "md5", kDestination});
-             },
-             nullptr}};
+    return {{subject, nullptr}, {[] { return RunProgram({"openssl", "md5", kFile}); }, nullptr}};
 }
 
 }  // namespace
