@@ -324,10 +324,11 @@ TEST_F(SendWebapi, NoServerKeepsACallForEver) {
         });
         const bool blMarked =
             std::count(outcome.calls.begin(), outcome.calls.end(), "YLIBCFileStat") == 1;
-        return result == -1 && blMarked != blFile &&
+        return result == -1 && !HasFailure() && blMarked != blFile &&
                std::chrono::steady_clock::now() - start < std::chrono::seconds(100);
     }));
     EXPECT_EQ(State().substr(0, State().rfind('=')), "status=success marker=yes notified");
+    EXPECT_GE(joined::CountLines(joined::kJournal), 1);
 }
 
 // --- Client info update -------------------------------------------------------------------------
