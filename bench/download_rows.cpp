@@ -1,4 +1,4 @@
-// Files from the server and their digests, against the programs and the bare loop that do the same.
+// Files from the server and their digests, against the programs and bare loops that do the same.
 
 #include <fcntl.h>
 #include <spawn.h>
@@ -151,8 +151,10 @@ void AddDownloadRows(int mib) {
         };
         add("curl command", 1.00, &Target::DownloadByProgram);
         add("bare libcurl loop", 1.00, &Target::DownloadBare);
-        // The same calls as the library's, so that what is left is the library's own and the noise.
-        add("loop, same buffer", 1.05, &Target::DownloadByTwin);
+        if (strProtocol == "http") {
+            // The same calls as the library's: what is left is the library's own and the noise.
+            add("loop, same buffer", 1.05, &Target::DownloadByTwin);
+        }
     }
     AddRow({"ZELOQRMClientGetFile, memory for " + strSize, "memory for 1 MiB", 1.05,
             [mib] { return MemoryPair(mib); }, "", kPairs});

@@ -5,15 +5,16 @@
 
 namespace bench {
 
-// Before all others: its child processes have to come from one that has not called the library.
+// Before all others, in this order: the child processes of their rows have to come from one that
+// has not called the library.
 void AddColdCallRow();
+void AddLogRows();
 
 void AddCallRows();
 void AddConnectionRows();
 void AddCredentialRows();
 void AddDownloadRows(int mib);
 void AddFileRows();
-void AddLogRows();
 
 }  // namespace bench
 

@@ -292,8 +292,8 @@ TEST_F(SendWebapi, AServerThatCannotProveItselfGetsNoCall) {
 }
 
 // A server that is silent, that sends a byte a second for ever, that never ends, that cuts: each
-// call ends within its bound, leaves the status of the call before and tells the user. They wait at
-// the same time, each in a process of its own.
+// call ends within its bound and leaves the status of the call before, and the user is told. They
+// wait at the same time, each in a process of its own.
 TEST_F(SendWebapi, NoServerKeepsACallForEver) {
     std::map<std::string, devserver::NextAnswer> answers;
     answers["silent"].delay_ms = 120'000;
@@ -322,9 +322,9 @@ TEST_F(SendWebapi, NoServerKeepsACallForEver) {
             result = blFile ? ZELOQRMClientGetFile("/tmp/" + strMethod, kApi, 1, strMethod, params)
                             : std::stoi(Call(false, strMethod.c_str()));
         });
-        const bool blMarked =
+        const bool blLookedAtMarker =
             std::count(outcome.calls.begin(), outcome.calls.end(), "YLIBCFileStat") == 1;
-        return result == -1 && !HasFailure() && blMarked != blFile &&
+        return result == -1 && !HasFailure() && blLookedAtMarker != blFile &&
                std::chrono::steady_clock::now() - start < std::chrono::seconds(100);
     }));
     EXPECT_EQ(State().substr(0, State().rfind('=')), "status=success marker=yes notified");
@@ -554,14 +554,9 @@ TEST_F(SendWebapi, KeysOfTheInfoFileAreReadAsTheyWereWritten) {
     EXPECT_EQ(strValue, std::string(1023, 'x'));
 
     const std::string strBefore = FileText(joined::kInfoFile);
-    for (const auto &[strKey, strText] :
-         std::vector<std::pair<std::string, std::string>>{{"a=b", "c"},
-                                                          {"a\nb", "c"},
-                                                          {"a", "c\nb=d"},
-                                                          {{"a\0b", 3}, "c"},
-                                                          {"a", {"c\0d", 3}}}) {
-        EXPECT_FALSE(ZELOQRMClientSetInfo(strKey, strText));
-    }
+    EXPECT_FALSE(ZELOQRMClientSetInfo("a=b", "c"));
+    EXPECT_FALSE(ZELOQRMClientSetInfo({"a\0b", 3}, "c"));
+    EXPECT_FALSE(ZELOQRMClientSetInfo("a", {"c\0d", 3}));
     EXPECT_EQ(FileText(joined::kInfoFile), strBefore);
 }
 

@@ -92,18 +92,6 @@ TEST_F(Request, OnlyAVerifiedServerIsSpokenTo) {
     EXPECT_EQ(Https(), "") << "a file that came counts too";
     std::filesystem::remove(kOtherCaFile);
     EXPECT_EQ(Https(), "/qrm/rpc");
-
-    devserver::Options options;
-    options.certificate.names = {"other.example"};
-    Start(options);
-    Write(kCaFile, m_pServer->CaPem());
-    EXPECT_EQ(Https(), "");
-    options = devserver::Options();
-    options.certificate.not_after = std::time(nullptr) - 60;
-    Start(options);
-    Write(kCaFile, m_pServer->CaPem());
-    EXPECT_EQ(Https(), "");
-    EXPECT_EQ(m_pServer->Requests().size(), 0U);
 }
 
 TEST_F(Request, OnlyKnownProtocolsAndPlainHostsAreUsed) {
