@@ -270,8 +270,7 @@ const char *Text(const Json::Value &value) {
 }
 
 bool ReadInt(const Json::Value &value, int &n) {
-    const bool blInteger = value.type() == Json::intValue || value.type() == Json::uintValue;
-    if (!blInteger || !value.isInt()) {
+    if (!value.isInt()) {
         return false;
     }
     n = value.asInt();

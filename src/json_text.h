@@ -52,8 +52,8 @@ bool HasMember(const Json::Value &object, const char *szKey);
 // null too: as zero-terminated text it would be another one. The result lives as long as the value.
 const char *Text(const Json::Value &value);
 
-// Reads a JSON integer that fits an int. Text, booleans and numbers written with a fraction or an
-// exponent are no integers here, even where their value is whole.
+// Reads a number whose value is an integer that fits an int, however it is written (443, 443.0,
+// 4.43e2). Nothing else is one, and n stays as it was.
 bool ReadInt(const Json::Value &value, int &n);
 
 // Whether the value says yes: boolean true, or a number other than zero. Any other type says no.

@@ -125,6 +125,8 @@ TEST_F(SendWebapi, TheReplyDecidesTheStatus) {
         {R"({"success":false,"error":{"code":106}})", 0, "no_permission"},
         {R"({"success":false,"error":{"code":107}})", 0, "no_permission"},
         {R"({"success":false,"error":{"code":108}})", 0, "error"},
+        {R"({"success":false,"error":{"code":105.0}})", 0, "no_permission"},
+        {R"({"success":false,"error":{"code":105.5}})", 0, "error"},
         {R"({"success":false,"error":{"code":"105"}})", 0, "error"},
         {R"({"success":false,"error":{"code":99999999999999}})", 0, "error"},
         {R"({"success":false,"error":[105]})", 0, "error"},

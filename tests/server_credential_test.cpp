@@ -13,7 +13,7 @@ using torture::Expected;
 
 constexpr const char *kFile = "qrm_server_credential";
 constexpr const char *kCred =
-    R"({"protocol":"https","host":"qrm","port":443,"application":"ZELO.QRM","access_token":"t"})";
+    R"({"protocol":"https","host":"qrm","port":443.0,"application":"ZELO.QRM","access_token":"t"})";
 
 Json::Value Parse(const std::string &strText) {
     Json::Value value;
@@ -146,7 +146,7 @@ TEST(ServerCredential, UpdateSurvivesEveryFailingCall) {
          [] { AddServer(R"({"a":1})"); },
          [] {
              Json::Value cred = Parse(
-                 R"({"application":"ZELO.QRM","protocol":"http","host":"new","port":80,)"
+                 R"({"application":"ZELO.QRM","protocol":"http","host":"new","port":8e1,)"
                  R"("sn":"S","access_token":"u","csrf_token":"ignored","extra_info":"ignored"})");
              return Bool(ZELOQRMClientUpdateServerCredential(cred));
          },
@@ -199,6 +199,8 @@ TEST(ServerCredential, BadInputIsRefusedAndStoresNothing) {
         {Parse("[1]"), "Bad parameters"},
         {with("port", "443"), "Save Cred Item fail"},
         {with("port", 443.5), "Save Cred Item fail"},
+        {with("port", true), "Save Cred Item fail"},
+        {with("port", Json::Value()), "Save Cred Item fail"},
         {with("port", Json::Value(Json::UInt64(1) << 40U)), "Save Cred Item fail"},
         {with("host", 5), "Save Cred Item fail"},
         {with("host", std::string("a\0b", 3)), "Save Cred Item fail"},
@@ -224,8 +226,9 @@ TEST(ServerCredential, BadInputIsRefusedAndStoresNothing) {
             "cannot find qrm server info");
     }
     AddServer(R"({"a":1})");
-    for (const Json::Value &cred : {with("port", "1"), with("host", 1), with("protocol", 1),
-                                    with("access_token", 1), with("sn", deep)}) {
+    for (const Json::Value &cred :
+         {with("port", "1"), with("port", 1.5), with("host", 1), with("protocol", 1),
+          with("access_token", 1), with("sn", deep)}) {
         Json::Value copy = cred;
         EXPECT_FALSE(ZELOQRMClientUpdateServerCredential(copy));
         EXPECT_EQ(State(), R"(https://qrm:443 {"a":1} token=t csrf=c)");
