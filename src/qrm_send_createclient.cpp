@@ -64,9 +64,12 @@ bool Answers(ZELO_CRED *pCred, const char *szProtocol, const char *szHost, int p
     if (ZELO::CredRequestUtil::GetWebAPIPath(pCred, api).empty()) {
         return false;
     }
-    out["protocol"] = szProtocol;
-    out["port"] = port;
-    out["host"] = szHost;
+    // All three members or, when memory is short, none.
+    Json::Value filled = out;
+    filled["protocol"] = szProtocol;
+    filled["port"] = port;
+    filled["host"] = szHost;
+    out.swap(filled);
     return true;
 }
 

@@ -1,6 +1,9 @@
 // Finding a connection and joining, over real HTTPS against the development server.
 
 #include <chrono>
+#include <cstdlib>
+#include <new>
+#include <utility>
 
 #include "joined.h"
 #include "json_text.h"
@@ -19,6 +22,10 @@ constexpr const char *kConfig = "/etc/zeloinfo.conf";
 constexpr const char *kDefaults = "/etc.defaults/zeloinfo.conf";
 constexpr const char *kVersion = "/etc.defaults/VERSION";
 constexpr const char *kToken = "se/cr\"et-0123456789";
+
+// The allocations of this thread, and which one of them fails, counted from 1.
+thread_local int t_allocations = 0;
+thread_local int t_failing = 0;
 
 class Join : public joined::Joined {
   protected:
@@ -140,6 +147,27 @@ TEST_F(Join, ConnectionTestSurvivesEveryFailingCall) {
                   {{"ZELOCredAlloc IsPort IsPort", {"false", "", ""}},
                    {"ZELOCredItemSetProtocol ZELOCredItemSetHost ZELOCredItemSetPort GetWebAPIPath",
                     fallback}}});
+}
+
+TEST_F(Join, ShortMemoryLeavesTheWholeConnectionOrNothing) {
+    Json::Value list(Json::arrayValue);
+    list.append(Candidate(s_pServer->HttpPort(), s_pServer->HttpsPort()));
+    int failures = 0;
+    // The last allocations fill the output.
+    for (int before = 0; before < 12; ++before) {
+        Json::Value out;
+        out["own"] = 1;
+        const Json::Value own = out;
+        Json::Value other = out;
+        t_allocations = 0;
+        EXPECT_TRUE(ZELOQRMClientTestConnect(list, kApi, other));
+        t_failing = std::exchange(t_allocations, 0) - before;
+        const bool blFound = ZELOQRMClientTestConnect(list, kApi, out);
+        t_failing = 0;
+        EXPECT_EQ(out, blFound ? other : own) << before;
+        failures += blFound ? 0 : 1;
+    }
+    EXPECT_GE(failures, 6);
 }
 
 TEST_F(Join, SurvivesEveryFailingCall) {
@@ -362,3 +390,20 @@ TEST_F(Join, OtherConnectionsComeFirstAndTheExplicitOneLast) {
 }
 
 }  // namespace
+
+void *operator new(std::size_t cb) {
+    void *const p = ++t_allocations == t_failing ? nullptr : std::malloc(cb);
+    return p == nullptr ? throw std::bad_alloc() : p;
+}
+
+void *operator new(std::size_t cb, const std::nothrow_t & /*tag*/) noexcept {
+    return std::malloc(cb);
+}
+
+void operator delete(void *p) noexcept {
+    std::free(p);
+}
+
+void operator delete(void *p, std::size_t /*cb*/) noexcept {
+    std::free(p);
+}
