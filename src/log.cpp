@@ -4,9 +4,11 @@
 
 #include <algorithm>
 #include <cstdarg>
-#include <cstdio>
+#include <cstring>
+#include <string_view>
 
 #include "fixed_text.h"
+#include "one_line.h"
 
 namespace qrm_log {
 namespace {
@@ -72,37 +74,22 @@ std::size_t StandsWhole(const std::string &strText, std::size_t at, const std::s
     return end - at;
 }
 
-// Control characters of ASCII, and those of Unicode's second page in UTF-8 or alone.
-bool IsControl(const std::string &strText, std::size_t at) {
-    const auto byteAt = [&strText](std::size_t i) {
-        return i < strText.size() ? static_cast<unsigned char>(strText[i]) : 0U;
-    };
-    const auto isC1 = [](unsigned int byte) { return byte >= 0x80 && byte <= 0x9F; };
-    const unsigned int byte = byteAt(at);
-    if (byte < 0x20 || byte == 0x7F) {
-        return true;
+// Copies the text with its control characters escaped; false, with whole characters, when it is
+// cut.
+bool CopyOnOneLine(std::string_view text, FixedText<kMaxMessage> &out) {
+    char *const szOut = out.Buffer();
+    std::size_t cb = 0;
+    for (std::size_t at = 0; at < text.size(); ++at) {
+        const FixedText<8> shown = one_line::Shown(text, at);
+        const std::size_t cbShown = std::strlen(shown.sz());
+        if (cbShown >= kMaxMessage - cb) {
+            DropPartialCharacter(szOut);
+            return false;
+        }
+        std::memcpy(szOut + cb, shown.sz(), cbShown);
+        cb += cbShown;
     }
-    const unsigned int before = at == 0 ? 0U : byteAt(at - 1);
-    return (byte == 0xC2 && isC1(byteAt(at + 1))) ||
-           (isC1(byte) && (before < 0x80 || before == 0xC2));
-}
-
-void AppendEscaped(std::string &strSafe, char c) {
-    switch (c) {
-        case '\n':
-            strSafe += "\\n";
-            return;
-        case '\r':
-            strSafe += "\\r";
-            return;
-        case '\t':
-            strSafe += "\\t";
-            return;
-        default:
-            FixedText<8> code;
-            code.Format("\\x%02X", static_cast<unsigned char>(c));
-            strSafe += code.sz();
-    }
+    return true;
 }
 
 }  // namespace
@@ -114,10 +101,16 @@ void Write(const char *szStem, int line, const char *szFormat, ...) {
     const std::size_t cbWhole = message.FormatV(szFormat, args);
     va_end(args);
 
-    if (cbWhole < kMaxMessage) {
-        syslog(LOG_ERR, "%s:%d %s", szStem, line, message.sz());
+    // A line feed at the end of the fixed text stays one.
+    std::string_view text = message.sz();
+    const std::string_view format = szFormat;
+    const bool blEnded = cbWhole < kMaxMessage && !format.empty() && format.back() == '\n';
+    text.remove_suffix(blEnded ? 1 : 0);
+    FixedText<kMaxMessage> safe;
+    if (CopyOnOneLine(text, safe) && cbWhole < kMaxMessage) {
+        syslog(LOG_ERR, "%s:%d %s%s", szStem, line, safe.sz(), blEnded ? "\n" : "");
     } else {
-        syslog(LOG_ERR, "%s:%d %s... [cut, %zu bytes in all]", szStem, line, message.sz(), cbWhole);
+        syslog(LOG_ERR, "%s:%d %s... [cut, %zu bytes in all]", szStem, line, safe.sz(), cbWhole);
     }
 }
 
@@ -136,11 +129,7 @@ std::string SafeText(const std::string &strText, const std::vector<std::string> 
             at += cbSecret;
             continue;
         }
-        if (IsControl(strText, at)) {
-            AppendEscaped(strSafe, strText[at]);
-        } else {
-            strSafe += strText[at];
-        }
+        strSafe += one_line::Shown(strText, at).sz();
         ++at;
     }
     return strSafe;

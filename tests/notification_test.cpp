@@ -117,7 +117,7 @@ TEST_F(Notification, HooksRunInTheirOrderWhateverOneOfThemDoes) {
     Hook("17-open", strTell + kHookOutput, 0775);
     Hook("README", strTell + kHookOutput, 0644);
     fs::create_directory(std::string(kHooks) + "/folder");
-    fs::create_symlink("10-a", std::string(kHooks) + "/18-link");
+    fs::create_symlink("10-a", std::string(kHooks) + "/18-li\nnk");
     EXPECT_EQ(Send("Tag", {{"%QRM_SERVER%", "a b;c"}}), 0);
     const std::vector<std::string> expected = {"10-a Tag Tag/a b;c", "11-b Tag Tag/a b;c",
                                                "20-c Tag Tag/a b;c", "30-d Tag Tag/a b;c",
@@ -129,7 +129,7 @@ TEST_F(Notification, HooksRunInTheirOrderWhateverOneOfThemDoes) {
     }
     EXPECT_EQ(g_logLines.size(), 4U) << strLog;
     for (const char *szPart : {"15-fails' failed for 'Tag': exit status 3", "16-dies' failed",
-                               "17-open' is not run", "18-link' is not run"}) {
+                               "17-open' is not run", R"(18-li\nnk' is not run)"}) {
         EXPECT_NE(strLog.find(szPart), std::string::npos) << szPart << " in " << strLog;
     }
 

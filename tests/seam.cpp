@@ -79,6 +79,21 @@ Result Force(Result result) {
     }
 }
 
+bool Fills() {
+    return !t_pObservation->fault.strFill.empty();
+}
+
+template <typename T>
+void FillOne(const T & /*argument*/) {}
+void FillOne(char *sz) {
+    t_pObservation->fault.strFill.copy(sz, std::string::npos);
+}
+
+template <typename... T>
+void Fill(const T &...arguments) {
+    (FillOne(arguments), ...);
+}
+
 void AddRecords(int count) {
     if (t_pObservation != nullptr) {
         t_pObservation->outcome.recordsLeft += count;
@@ -96,6 +111,7 @@ void WriteLog(int level, const char *szFormat, va_list args) {
     const std::size_t blank = strLine.find(' ');
     ASSERT_TRUE(colon < blank && blank != std::string::npos) << strLine;
     EXPECT_GT(std::atoi(strLine.c_str() + colon + 1), 0) << strLine;
+    EXPECT_GE(strLine.find('\n'), strLine.size() - 1) << strLine;
     t_pObservation->outcome.logs.push_back(
         {level, strLine.substr(0, colon), strLine.substr(blank + 1)});
 }
@@ -124,6 +140,10 @@ Outcome Observe(const Fault &fault, const std::function<void()> &body) {
         const bool blHit = seam::Enter(#name, seam::ArgumentTexts arguments); \
         if (blHit && !seam::IsForced()) {                                     \
             return failure;                                                   \
+        }                                                                     \
+        if (blHit && seam::Fills()) {                                         \
+            seam::Fill arguments;                                             \
+            return seam::Force<Result>(failure);                              \
         }                                                                     \
         Result result = Real_##name arguments;                                \
         seam::AddRecords(gained);                                             \

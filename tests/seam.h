@@ -40,6 +40,7 @@ struct Fault {
     bool blForceResult = false;  // false: the call is not made and gives its failure value
     long result = 0;             // true: the call is made, and this takes the place of its result
     int killAt = 0;  // the call, counted from 1 over all of them, that the process dies before
+    std::string strFill{};  // written into the call's buffers, without a zero, in place of the call
 };
 
 // An argument as it stands in the details: numbers and texts as they are, "buf" for a buffer to

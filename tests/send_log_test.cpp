@@ -408,8 +408,8 @@ TEST_F(SendLog, TheServerGetsWhatTheCallerSays) {
     EXPECT_EQ(Messages(null), "Invaild Argument (__null != szKey)=[0]\n");
     EXPECT_TRUE(null.calls.empty());
     EXPECT_EQ(YLIBCErrGet(), 0x0D00U);
-    EXPECT_EQ(MessagesOf([] { EXPECT_EQ(ZELOQRMClientLog(3, "m", "none", "a", "b", "c"), -1); }),
-              "conver m:none string failed. ");
+    EXPECT_EQ(MessagesOf([] { EXPECT_EQ(ZELOQRMClientLog(3, "m\n", "ä\x1B", "a", "b", "c"), -1); }),
+              "conver m\\n:ä\\x1B string failed. ");
     EXPECT_EQ(Sent(), "nothing");
 }
 

@@ -171,6 +171,29 @@ TEST_F(SendWebapi, EchoedTokensStayOutOfTheLog) {
               R"(API:ZELO.QRM.RPC, method:info, Response invalid: {"t":"***","c":"***"})");
 }
 
+TEST_F(SendWebapi, NamesWithControlCharactersStayOnTheirLine) {
+    const char *szMethod = "m\r\x1B";
+    Answer(kApi, szMethod, "no json\n");
+    const struct {
+        const char *szApi;
+        seam::Fault fault;
+        const char *szLog;
+    } rows[] = {
+        {"A\nB", {}, R"(Create CredRequest fail. api=A\nB, ver=1, method=m\r\x1B)"},
+        {kApi, {"Process"}, R"(Process webapi fail. api=ZELO.QRM.RPC, ver=1, method=m\r\x1B)"},
+        {kApi, {}, R"(API:ZELO.QRM.RPC, method:m\r\x1B, Response invalid: no json\n)"},
+    };
+    for (const auto &[szApi, fault, szLog] : rows) {
+        const std::string strApi = szApi;
+        Json::Value reply;
+        EXPECT_EQ(
+            seam::MessagesOf(
+                fault,
+                [&] { ZELOQRMClientSendWebapi(reply, strApi, 1, szMethod, Json::Value(), false); }),
+            szLog);
+    }
+}
+
 TEST_F(SendWebapi, UsersAreToldAgainAfterTwoHoursAndAtOnceAfterAReply) {
     constexpr long kNow = 2'000'000'000;
     constexpr const char *kTarget = "/tmp/target";
