@@ -510,8 +510,8 @@ ZELOQRM_API int ConvertLog(const char *szSection, const char *szKey, YLIBSZLIST 
 
 // Writes a text of a list to a buffer, its references expanded from a strings file. What a text
 // brings in is expanded too, the first form before the second; at most 1,024 replacements of each
-// form are made, so that texts that name each other come to an end. A replacement that does not fit
-// ends the expansion of its form. Any thread may call it.
+// form are made, so that texts that name each other come to an end. A replacement that changes
+// nothing, such as one that does not fit, ends the expansion of its form. Any thread may call it.
 //
 // pslParams, index: the list, which stays the caller's, and which of its texts.
 // szStringsFile: the path of the strings file.

@@ -41,21 +41,22 @@ inline void CopyToFit(char *szOut, int cbOut, const char *szText) {
     }
 }
 
-// What a new buffer holds behind its empty text. Zeroes serve platform getters that write a text
-// without its end; a message takes dozens of larger buffers, for which they would be the main cost.
-enum class Behind { kZeroes, kAnything };
-
-// A buffer of N bytes that holds zero-terminated text of at most N - 1 bytes, at first none.
-template <std::size_t N, Behind behind = Behind::kZeroes>
+// A buffer of N bytes that holds zero-terminated text of at most N - 1 bytes, at first none. It is
+// all zeroes then: a platform getter may write a text without its end.
+template <std::size_t N>
 class FixedText {
   public:
-    FixedText() { std::memset(m_sz, 0, behind == Behind::kZeroes ? N : 1); }
-
-    // For a platform getter, which fills the buffer and takes its size.
-    char *Buffer() { return m_sz; }
+    // For a platform getter, which takes the buffer's size.
+    char *Buffer() {
+        End();
+        return m_sz;
+    }
     static constexpr int Size() { return static_cast<int>(N); }
 
-    const char *sz() const { return m_sz; }
+    const char *sz() const {
+        End();
+        return m_sz;
+    }
     bool Empty() const { return m_sz[0] == '\0'; }
 
     // Joins the pieces in the buffer. Returns false, with an empty buffer, when they do not fit.
@@ -90,7 +91,15 @@ class FixedText {
     }
 
   private:
-    char m_sz[N];
+    // Cuts a text that a platform getter has filled the whole buffer with.
+    void End() const {
+        if (m_sz[N - 1] != '\0') {
+            m_sz[N - 1] = '\0';
+            DropPartialCharacter(m_sz);
+        }
+    }
+
+    mutable char m_sz[N] = {};
 };
 
 #endif

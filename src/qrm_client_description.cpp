@@ -18,6 +18,7 @@ constexpr const char *kVersion = "/etc.defaults/VERSION";
 
 // The platform gives a custom serial number fewer bytes than its own.
 constexpr int kCustomSerialSize = 31;
+constexpr int kSerialSize = 36;
 
 using FactText = FixedText<1024>;
 using VersionText = FixedText<16>;
@@ -40,11 +41,9 @@ bool ReadPort(const char *szKey, long &port) {
 
 bool ReadHostName(std::string &strHostName) {
     FactText name;
-    // A name that fills the buffer need not be terminated: the last byte stays ours.
     if (gethostname(name.Buffer(), FactText::Size()) < 0) {
         return false;
     }
-    name.Buffer()[FactText::Size() - 1] = '\0';
     strHostName = name.sz();
     return !strHostName.empty();
 }
@@ -97,10 +96,11 @@ bool IsHttpsServed() {
 }
 
 bool ReadSerialNumber(std::string &strSerial) {
-    FixedText<36> serial;
+    // A number that fills what the platform may fill has its end behind that.
+    FixedText<kSerialSize + 1> serial;
     bool blRead = true;
     if (YLIBGetCustomSerialNumber(serial.Buffer(), kCustomSerialSize) < 0 || serial.Empty()) {
-        blRead = YLIBGetSerialNumber(serial.Buffer(), FixedText<36>::Size()) >= 0;
+        blRead = YLIBGetSerialNumber(serial.Buffer(), kSerialSize) >= 0;
     }
     strSerial = serial.sz();
     return blRead;

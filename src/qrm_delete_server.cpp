@@ -129,6 +129,18 @@ struct Request {
     bool blClearGluster;
 };
 
+// A field of the record ends within it, however far the platform fills what it is given.
+template <std::size_t N>
+bool ReadField(int (*pfnGet)(char *, int, const ZELO_CRED *), const ZELO_CRED *pCred,
+               char (&szField)[N]) {
+    FixedText<N> text;
+    if (pfnGet(text.Buffer(), FixedText<N>::Size(), pCred) < 0) {
+        return false;
+    }
+    CopyToFit(szField, N, text.sz());
+    return true;
+}
+
 // Host, protocol, extra information and port; false when one of them cannot be read.
 bool ReadServer(__tag_ZELO_QRM_SERVER_INFO__ &server, std::string &strExtraInfo) {
     const long id = ZELOCredIDGetByApplication(kServerApplication);
@@ -138,8 +150,8 @@ bool ReadServer(__tag_ZELO_QRM_SERVER_INFO__ &server, std::string &strExtraInfo)
     const CredHandle pCred(ZELOCredAlloc());
     FixedText<4096> extraInfo;
     if (pCred == nullptr || ZELOCredLoad(id, pCred.get()) < 0 ||
-        ZELOCredItemGetHost(server.szHost, sizeof(server.szHost), pCred.get()) < 0 ||
-        ZELOCredItemGetProtocol(server.szProtocol, sizeof(server.szProtocol), pCred.get()) < 0 ||
+        !ReadField(ZELOCredItemGetHost, pCred.get(), server.szHost) ||
+        !ReadField(ZELOCredItemGetProtocol, pCred.get(), server.szProtocol) ||
         ZELOCredItemGetExtraInfo(extraInfo.Buffer(), FixedText<4096>::Size(), pCred.get()) < 0 ||
         ZELOCredItemGetPort(&server.lPort, pCred.get()) < 0) {
         return false;

@@ -120,13 +120,13 @@ int FindToken(const char *szText, char *szSection, char *szKey, char *szToken, i
     return YLIBCStrTrim(szRest, szKey, kTrimmed) > 0 ? 0 : -1;
 }
 
-using ReferredText = FixedText<1024, Behind::kAnything>;
+using ReferredText = FixedText<1024>;
 
 // One reference as it stands in a text, and what it names.
 struct Reference {
-    FixedText<kReferenceLimit, Behind::kAnything> section;
-    FixedText<kReferenceLimit, Behind::kAnything> key;
-    FixedText<2 * kReferenceLimit + 4, Behind::kAnything> whole;
+    FixedText<kReferenceLimit> section;
+    FixedText<kReferenceLimit> key;
+    FixedText<2 * kReferenceLimit + 4> whole;
 };
 
 bool NextPlaceholder(const char *szText, Reference &reference) {
@@ -142,21 +142,22 @@ bool NextToken(const char *szText, Reference &reference) {
                                 reference.whole.Buffer(), kReferenceLimit) == 0;
 }
 
-// Replaces references until none is found, or one cannot be replaced.
+// Replaces references until none is found, or a replacement leaves the text as it was.
 void Expand(bool (*pfnNext)(const char *, Reference &), const char *szStringsFile, char *szText,
-            int cbText) {
-    Reference reference;
-    ReferredText value;
+            int cbText, Reference &reference) {
     for (int i = 0; i < kMaxReplacements; ++i) {
         if (!pfnNext(szText, reference)) {
             return;
         }
+        ReferredText value;
         const bool blFound =
             YLIBCFileGetSectionValue(szStringsFile, reference.section.sz(), reference.key.sz(),
                                      value.Buffer(), ReferredText::Size()) >= 0;
-        const char *szValue = blFound ? value.sz() : reference.key.sz();
-        const bool blUnchanged = std::strcmp(szValue, reference.whole.sz()) == 0;
-        if (blUnchanged || YLIBCStrReplace(szText, reference.whole.sz(), szValue, 0, cbText) <= 0) {
+        const TextCopy before = Copy(szText);
+        static_cast<void>(YLIBCStrReplace(szText, reference.whole.sz(),
+                                          blFound ? value.sz() : reference.key.sz(), 0, cbText));
+        szText[cbText - 1] = '\0';
+        if (before == nullptr || std::strcmp(before.get(), szText) == 0) {
             return;
         }
     }
@@ -172,8 +173,9 @@ void GetParam(YLIBSZLIST *pslParams, int index, const char *szStringsFile, char 
     }
     const char *szParam = YLIBCSzListGet(pslParams, index);
     CopyToFit(szOut, cbOut, szParam == nullptr ? "" : szParam);
-    Expand(NextPlaceholder, szStringsFile, szOut, cbOut);
-    Expand(NextToken, szStringsFile, szOut, cbOut);
+    Reference reference;
+    Expand(NextPlaceholder, szStringsFile, szOut, cbOut, reference);
+    Expand(NextToken, szStringsFile, szOut, cbOut, reference);
 }
 
 // --- The message in every language --------------------------------------------------------------
@@ -184,9 +186,10 @@ constexpr const char *kTextsFolder = "/usr/zelo/zeloman/webman/texts/";
 constexpr const char *kFallbackLanguage = "enu";
 constexpr int kLanguageListSize = 512;
 
-using MessageText = FixedText<4096, Behind::kAnything>;
+using MessageText = FixedText<4096>;
+using PathText = FixedText<64>;
 
-void SetStringsFile(const char *szLanguage, MessageText &path) {
+void SetStringsFile(const char *szLanguage, PathText &path) {
     path.Join({kTextsFolder, szLanguage, "/strings"});
 }
 
@@ -210,7 +213,7 @@ void FillMarkers(YLIBSZLIST *pslParams, const char *szStringsFile, MessageText &
 // False when the message is in neither the language's file nor the English one.
 bool Render(const char *szLanguage, const char *szSection, const char *szKey, YLIBSZLIST *pslParams,
             MessageText &text) {
-    MessageText path;
+    PathText path;
     SetStringsFile(szLanguage, path);
     if (szSection == nullptr) {
         CopyToFit(text.Buffer(), MessageText::Size(), szKey);
@@ -262,7 +265,8 @@ int Push(int level, const char *szSection, const char *szKey, YLIBSZLIST *pslPar
         ZELO_LOG_NULL_ARGUMENT("__null != szKey");
         return -1;
     }
-    FixedText<ZELO_LNX_HOSTNAME_SIZE> hostName;
+    // A name that fills what the platform may fill has its end behind that.
+    FixedText<ZELO_LNX_HOSTNAME_SIZE + 1> hostName;
     if (ZELOLnxGetHostname(hostName.Buffer()) < 0) {
         ZELO_LOG("get hostname failed ");
         return -1;

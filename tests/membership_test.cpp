@@ -397,6 +397,16 @@ TEST_F(Membership, PlugInsAreToldTheServerCutTo31Bytes) {
         EXPECT_EQ(FileText(kTold), "pre 0 " + row.strTold + "\npost 0 " + row.strTold + '\n');
         EXPECT_EQ(membership::Remains(), row.blRejoin ? "'rejoin'" : "");
     }
+    Reset();
+    YLIBCINFOSetKeyValue("join_nvo_qrm", "yes");
+    stored::AddCredential("ZELO.QRM", "h", "{}");
+    const seam::Outcome filled =
+        seam::Observe({"ZELOCredItemGetHost", 1, true, 0, 0, std::string(1024, 'f')},
+                      [] { EXPECT_TRUE(ZELOQRMClientDeleteServer()); });
+    EXPECT_NE(torture::Joined(filled.details, "\n")
+                  .find("'%QRM_SERVER%', '" + std::string(1023, 'f') + "')"),
+              std::string::npos)
+        << "a host that fills its field ends there";
     Forget();
     const seam::Outcome outcome = seam::Observe([] { EXPECT_TRUE(ZELOQRMClientDeleteServer()); });
     EXPECT_EQ(torture::Joined(outcome.details, "\n"), Judge(0, {}).strLookups)

@@ -192,6 +192,10 @@ TEST(References, AreReplacedByTextsOrByTheirKeys) {
     for (const auto &row : rows) {
         EXPECT_EQ(MessagesOf([&] { EXPECT_EQ(Expand(row.strParam), row.strText); }), "");
     }
+    // What a replacement did counts, not what it answers.
+    EXPECT_EQ(MessagesOf({"YLIBCStrReplace", 1, true, 0},
+                         [] { EXPECT_EQ(Expand("{s:k}{s:none}_T(s,k)"), "VALnoneVAL"); }),
+              "");
     const std::string strTooLong = "_T(s," + strX + "x)_T(s,k)";
     EXPECT_EQ(MessagesOf([&] { EXPECT_EQ(Expand(strTooLong), strTooLong); }),
               "Char string length not enough");
@@ -327,6 +331,41 @@ TEST_F(SendLog, ALanguageWithoutTheMessageSpeaksEnglish) {
 }
 
 // --- Push ---------------------------------------------------------------------------------------
+
+TEST_F(SendLog, TextsThatThePlatformDoesNotEndAreSentToTheirEnd) {
+    const std::string strX(100, 'x');
+    WriteTexts("[m]\nmsg=\"" + strX + "{0}\"\n[s]\nk=\"" + strX + "\"\n");
+    const auto all = [&](const std::string &strOther) {
+        return Counted({{strX + strX + "a", 19}, {strOther, 1}});
+    };
+    const auto full = [](std::size_t cb) { return std::string(cb, 'f'); };
+    const struct {
+        const char *szOperation;
+        int nth;
+        std::string strFill;
+        std::string strTexts;
+        std::string strHost = "zelobox";
+    } rows[] = {
+        {"YLIBCFileGetSectionValue", 4, "message value", all("message value")},
+        {"YLIBCFileGetSectionValue", 4, full(4096), all(full(4095))},
+        {"YLIBCFileGetSectionValue", 5, "v", all(strX + "va")},
+        {"YLIBCFileGetSectionValue", 5, full(1024), all(strX + full(1023) + "a")},
+        {"YLIBCFileGetSectionValue", 6, "v", all(strX + strX + "v")},
+        {"ZELOLnxGetHostname", 1, full(64), Counted({{strX + strX + "a", 20}}), full(64)},
+    };
+    for (const auto &row : rows) {
+        s_pServer->ForgetRequests();
+        EXPECT_EQ(
+            MessagesOf({row.szOperation, row.nth, true, 0, 0, row.strFill},
+                       [] {
+                           EXPECT_EQ(
+                               ZELOQRMClientLog(6, "m", "msg", "{s:k}{s:a}", nullptr, nullptr), 0);
+                       }),
+            "");
+        EXPECT_EQ(Sent(), R"({"happen_time":"now","level":"info","username":"[)" + row.strHost +
+                              "]\"} " + row.strTexts);
+    }
+}
 
 // What follows the calls of these tables belongs to the Web API call.
 TEST_F(SendLog, TheListOverloadSurvivesEveryFailingCall) {

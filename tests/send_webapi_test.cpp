@@ -413,6 +413,10 @@ TEST_F(SendWebapi, TheUpdateSurvivesEveryFailingCall) {
     // The calls of the Web API call have a table of their own: what counts here comes before them.
     test.blGoesOn = true;
     torture::Run(test);
+    // A serial number that fills its buffer goes out as it is, and nothing that lies behind it.
+    const std::string strSerial(36, 'S');
+    torture::RunOnce(test, {"YLIBGetSerialNumber", 1, true, 0, 0, strSerial},
+                     {"0", "", std::regex_replace(strUpdated, std::regex("SN"), strSerial)});
 }
 
 TEST_F(SendWebapi, TheUpdateReportsWhatTheServerSays) {
@@ -577,6 +581,10 @@ TEST_F(SendWebapi, KeysOfTheInfoFileAreReadAsTheyWereWritten) {
     EXPECT_TRUE(ZELOQRMClientSetInfo("long", std::string(3000, 'x')));
     EXPECT_TRUE(ZELOQRMClientGetInfo("long", strValue));
     EXPECT_EQ(strValue, std::string(1023, 'x'));
+
+    seam::Observe({"YLIBCFileGetKeyValue", 1, true, 1024, 0, std::string(1024, 'f')},
+                  [&] { EXPECT_TRUE(ZELOQRMClientGetInfo("key", strValue)); });
+    EXPECT_EQ(strValue, std::string(1023, 'f'));
 
     const std::string strBefore = FileText(joined::kInfoFile);
     EXPECT_FALSE(ZELOQRMClientSetInfo("a=b", "c"));
