@@ -17,6 +17,7 @@
 #include "fixed_text.h"
 #include "json_text.h"
 #include "output.h"
+#include "printable.h"
 #include "report.h"
 #include "waiting.h"
 
@@ -150,7 +151,7 @@ void Tell(const Watch &watch, const std::string &strStage, Clock::duration time)
         result["longest_stage"] = blEarlier ? strLongest : strStage;
         WriteSoon(STDOUT_FILENO, json_text::ToLogText(result) + '\n');
     }
-    WriteSoon(STDERR_FILENO, "qrmctl: " + Printable(strError) + '\n');
+    WriteSoon(STDERR_FILENO, "qrmctl: " + printable::Line(strError) + '\n');
 }
 
 // The mutex is held to the end: the main thread enters no other stage and prints nothing more.

@@ -11,6 +11,7 @@
 #include "command_line.h"
 #include "deadline.h"
 #include "output.h"
+#include "printable.h"
 
 namespace {
 
@@ -26,7 +27,7 @@ int TellUsage(const command::Stop &stop, bool blJson) {
         std::cout << stop.strText;
         return qrmctl::kDone;
     }
-    const std::string strWhat = qrmctl::Printable(stop.strText);
+    const std::string strWhat = printable::Line(stop.strText);
     return qrmctl::Report(blJson).Fail(
         qrmctl::ErrorId::kUsage,
         strWhat + (strWhat.back() == '?' ? " " : "; ") +

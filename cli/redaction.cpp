@@ -5,9 +5,7 @@
 #include <algorithm>
 #include <array>
 #include <cctype>
-#include <set>
 #include <string_view>
-#include <tuple>
 
 #include "last_error.h"
 #include "platform_handles.h"
@@ -19,136 +17,6 @@ constexpr std::size_t kMinSecret = 4;
 constexpr std::size_t kMaxToken = std::size_t{64} * 1024;
 
 // --- By value -----------------------------------------------------------------------------------
-
-// Escaping can be repeated; more often than this it is noise.
-constexpr std::size_t kMaxRepeated = 64;
-
-// What the text at some place may stand for, and where it ends.
-struct Reading {
-    std::string strBytes;
-    std::size_t end;
-};
-
-std::string Utf8(unsigned int code) {
-    const auto tail = [code](unsigned int shift) {
-        return static_cast<char>(0x80U | ((code >> shift) & 0x3FU));
-    };
-    if (code < 0x80) {
-        return {static_cast<char>(code)};
-    }
-    if (code < 0x800) {
-        return {static_cast<char>(0xC0U | (code >> 6U)), tail(0)};
-    }
-    if (code < 0x10000) {
-        return {static_cast<char>(0xE0U | (code >> 12U)), tail(6), tail(0)};
-    }
-    return {static_cast<char>(0xF0U | (code >> 18U)), tail(12), tail(6), tail(0)};
-}
-
-// The byte itself, and what it begins when it is escaped for an URL, several times over ("%252f" is
-// "/", "%2f" or itself).
-void ReadUrl(const std::string &strText, std::size_t at, std::vector<Reading> &readings) {
-    readings.push_back({{strText[at]}, at + 1});
-    if (strText[at] == '+') {
-        readings.push_back({" ", at + 1});
-    }
-    std::size_t digits = at + 1;
-    int value = strText[at] == '%' ? HexValue(strText, digits, 2) : -1;
-    for (std::size_t i = 0; value >= 0 && i < kMaxRepeated; ++i) {
-        digits += 2;
-        readings.push_back({{static_cast<char>(value)}, digits});
-        value = value == '%' ? HexValue(strText, digits, 2) : -1;
-    }
-}
-
-// What a backslash before the place makes of it: a control character, \xXX or \uXXXX, of which two
-// may be one character.
-void ReadEscape(const std::string &strText, std::size_t at, std::vector<Reading> &readings) {
-    constexpr std::string_view kLetters = "bfnrt";
-    constexpr std::string_view kControls = "\b\f\n\r\t";
-    const std::size_t letter = at < strText.size() ? kLetters.find(strText[at]) : std::string::npos;
-    if (letter != std::string::npos) {
-        readings.push_back({{kControls[letter]}, at + 1});
-    }
-    if (at < strText.size() && strText[at] == 'x' && HexValue(strText, at + 1, 2) >= 0) {
-        readings.push_back({{static_cast<char>(HexValue(strText, at + 1, 2))}, at + 3});
-    }
-    const int first = at < strText.size() && strText[at] == 'u' ? HexValue(strText, at + 1, 4) : -1;
-    if (first < 0) {
-        return;
-    }
-    readings.push_back({Utf8(static_cast<unsigned int>(first)), at + 5});
-    if (first < 0x100) {
-        readings.push_back({{static_cast<char>(first)}, at + 5});
-    }
-    std::size_t next = at + 5;
-    while (next < strText.size() && strText[next] == '\\') {
-        ++next;
-    }
-    const int second =
-        next < strText.size() && strText[next] == 'u' ? HexValue(strText, next + 1, 4) : -1;
-    if (first >= 0xD800 && first < 0xDC00 && second >= 0xDC00 && second < 0xE000) {
-        readings.push_back({Utf8(0x10000U + ((static_cast<unsigned int>(first) & 0x3FFU) << 10U) +
-                                 (static_cast<unsigned int>(second) & 0x3FFU)),
-                            next + 5});
-    }
-}
-
-// How much of a secret has been found up to a place of the text.
-struct Progress {
-    std::size_t found;
-    std::size_t at;
-    std::size_t skipped;  // backslashes and line ends in a row
-    bool blEscaped;
-
-    bool operator<(const Progress &other) const {
-        return std::tie(found, at, skipped, blEscaped) <
-               std::tie(other.found, other.at, other.skipped, other.blEscaped);
-    }
-};
-
-// Where it may go on from there: every reading of the text is tried.
-void Proceed(const std::string &strText, const std::string &strSecret, bool blWrapped,
-             const Progress &from, std::set<Progress> &open) {
-    if (from.at >= strText.size()) {
-        return;
-    }
-    std::vector<Reading> readings;
-    ReadUrl(strText, from.at, readings);
-    if (from.blEscaped) {
-        ReadEscape(strText, from.at, readings);
-    }
-    for (const Reading &reading : readings) {
-        if (strSecret.compare(from.found, reading.strBytes.size(), reading.strBytes) == 0) {
-            open.insert({from.found + reading.strBytes.size(), reading.end, 0, false});
-        }
-        const bool blBackslash = reading.strBytes == "\\";
-        const bool blLineEnd = blWrapped && from.found > 0 &&
-                               (reading.strBytes == "\n" || reading.strBytes == "\r" ||
-                                reading.strBytes == " " || reading.strBytes == "\t");
-        if ((blBackslash || blLineEnd) && from.skipped < kMaxRepeated) {
-            open.insert({from.found, reading.end, from.skipped + 1, blBackslash});
-        }
-    }
-}
-
-// How many bytes of the text at the place stand for the secret; 0 for none. Backslashes before a
-// character do not count; blWrapped: line ends between two do not either.
-std::size_t StandsWhole(const std::string &strText, std::size_t at, const std::string &strSecret,
-                        bool blWrapped) {
-    std::size_t end = 0;
-    std::set<Progress> open = {{0, at, 0, false}};
-    while (!open.empty()) {
-        const Progress next = *open.begin();
-        open.erase(open.begin());
-        if (next.found == strSecret.size()) {
-            end = std::max(end, next.at);
-        } else {
-            Proceed(strText, strSecret, blWrapped, next, open);
-        }
-    }
-    return end == 0 ? 0 : end - at;
-}
 
 std::string Hex(const std::string &strText, const char *szDigits) {
     std::string strHex;
@@ -195,16 +63,6 @@ bool IsBase64(char c) {
            std::string_view("+/-_=").find(c) != std::string_view::npos;
 }
 
-// The longest of the texts that stands at the place; 0 for none.
-std::size_t Longest(const std::string &strText, std::size_t at,
-                    const std::vector<std::string> &secrets, bool blWrapped) {
-    std::size_t cb = 0;
-    for (const std::string &strSecret : secrets) {
-        cb = std::max(cb, StandsWhole(strText, at, strSecret, blWrapped));
-    }
-    return cb;
-}
-
 // --- The store ----------------------------------------------------------------------------------
 
 thread_local std::vector<long> *t_pIds = nullptr;
@@ -232,37 +90,22 @@ bool AddToken(int (*pfnGet)(char *, int, const ZELO_CRED_SESS *), const ZELO_CRE
 
 }  // namespace
 
-int HexValue(const std::string &strText, std::size_t at, std::size_t digits) {
-    if (at + digits > strText.size()) {
-        return -1;
-    }
-    int value = 0;
-    for (std::size_t i = at; i < at + digits; ++i) {
-        if (std::isxdigit(static_cast<unsigned char>(strText[i])) == 0) {
-            return -1;
-        }
-        const char digit = static_cast<char>(std::tolower(static_cast<unsigned char>(strText[i])));
-        value = value * 16 + (digit <= '9' ? digit - '0' : digit - 'a' + 10);
-    }
-    return value;
-}
-
 void Redaction::Add(const std::string &strSecret) {
     if (strSecret.size() < kMinSecret) {
         return;
     }
-    m_secrets.push_back(Collapsed(strSecret));
-    m_secrets.push_back(Hex(strSecret, "0123456789abcdef"));
-    m_secrets.push_back(Hex(strSecret, "0123456789ABCDEF"));
+    m_secrets.Add(Collapsed(strSecret));
+    m_secrets.Add(Hex(strSecret, "0123456789abcdef"));
+    m_secrets.Add(Hex(strSecret, "0123456789ABCDEF"));
     for (std::size_t before = 0; before < 3; ++before) {
         std::string strCore = Base64Core(strSecret, before);
         if (strCore.size() < kMinSecret) {
             continue;
         }
-        m_base64.push_back(strCore);
+        m_base64.Add(strCore);
         std::replace(strCore.begin(), strCore.end(), '+', '-');
         std::replace(strCore.begin(), strCore.end(), '/', '_');
-        m_base64.push_back(strCore);
+        m_base64.Add(strCore);
     }
 }
 
@@ -289,8 +132,8 @@ bool Redaction::AddStored() {
 std::string Redaction::Redact(const std::string &strText) const {
     std::string strSafe;
     for (std::size_t at = 0; at < strText.size();) {
-        const std::size_t cb = Longest(strText, at, m_secrets, false);
-        const std::size_t cbCode = Longest(strText, at, m_base64, true);
+        const std::size_t cb = m_secrets.LengthAt(strText, at);
+        const std::size_t cbCode = m_base64.LengthAt(strText, at);
         if (cb == 0 && cbCode == 0) {
             strSafe += strText[at++];
             continue;

@@ -7,7 +7,8 @@
 #define QRMCTL_REDACTION_H
 
 #include <string>
-#include <vector>
+
+#include "secret_search.h"
 
 namespace qrmctl {
 
@@ -22,18 +23,15 @@ class Redaction {
     // the store cannot be read.
     bool AddStored();
 
-    // The text without the secrets: plain, with characters escaped as in JSON or an URL, also
-    // several times over, in hexadecimal, and in Base64 of either alphabet at whatever place of a
-    // longer text, also wrapped over lines.
+    // The text without the secrets: plain, with characters escaped (secret_search.h), in
+    // hexadecimal, and in Base64 of either alphabet at whatever place of a longer text, also
+    // wrapped over lines.
     std::string Redact(const std::string &strText) const;
 
   private:
-    std::vector<std::string> m_secrets;
-    std::vector<std::string> m_base64;  // what is the same wherever the secret begins
+    SecretSearch m_secrets;
+    SecretSearch m_base64{true};  // what is the same wherever the secret begins
 };
-
-// The value of so many hexadecimal digits at the place; -1 when they are not there.
-int HexValue(const std::string &strText, std::size_t at, std::size_t digits);
 
 // Whether a key, a variable or a member of this name holds a secret.
 bool IsSecretName(const std::string &strName);

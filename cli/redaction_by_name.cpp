@@ -43,42 +43,53 @@ bool IsNameCharacter(char c) {
            std::string_view("_-.%").find(c) != std::string_view::npos;
 }
 
-// The word before the separator at the place; quotes and blanks between them do not count.
-std::string NameBefore(const std::string &strLine, std::size_t at) {
-    const auto isFiller = [](char c) {
-        return std::string_view(" \t\"'\\").find(c) != std::string_view::npos;
-    };
+// The word before the separator at the place, as far as it stands behind the other place; quotes
+// and blanks between them do not count.
+std::string NameBefore(const std::string &strLine, std::size_t at, std::size_t behind) {
+    const std::string_view line = std::string_view(strLine).substr(0, at);
     std::size_t end = at;
-    while (end > 0 && isFiller(strLine[end - 1])) {
-        --end;
+    for (std::size_t cb = 1; cb > 0 && end > behind; end -= cb) {
+        cb = 0;
+        for (std::string_view filler : {" ", "\t", "\"", "'", "\\", "&quot;", "&#34;", "&#39;"}) {
+            const bool blFills = end - behind >= filler.size() &&
+                                 line.substr(end - filler.size(), filler.size()) == filler;
+            cb = blFills ? filler.size() : cb;
+        }
     }
     std::size_t begin = end;
-    while (begin > 0 && IsNameCharacter(strLine[begin - 1])) {
+    while (begin > behind && IsNameCharacter(line[begin - 1])) {
         --begin;
     }
     return strLine.substr(begin, end - begin);
 }
 
 // "://name:password@host" loses what stands before the "@".
-std::string MaskUrls(std::string strLine) {
-    for (std::size_t at = 0; (at = strLine.find("://", at)) != std::string::npos;) {
-        at += 3;
-        const std::size_t end = strLine.find_first_of("/ \t\"'", at);
-        const std::size_t sign = strLine.substr(0, end).rfind('@');
-        if (sign != std::string::npos && sign > at) {
-            strLine.replace(at, sign - at, kRedacted);
-        }
+std::string MaskUrls(const std::string &strLine) {
+    std::string strSafe;
+    std::size_t at = 0;
+    for (std::size_t next = 0; (next = strLine.find("://", at)) != std::string::npos;) {
+        next += 3;
+        strSafe.append(strLine, at, next - at);
+        const std::size_t end = std::min(strLine.find_first_of("/ \t\"'", next), strLine.size());
+        const std::size_t sign = std::string_view(strLine).substr(next, end - next).rfind('@');
+        const bool blNamed = sign != std::string_view::npos && sign > 0;
+        strSafe += blNamed ? kRedacted : "";
+        at = next + (blNamed ? sign : 0);
     }
-    return strLine;
+    return strSafe.append(strLine, at);
 }
 
 // How long the separator between a name and its value is at the place; 0 for none.
 std::size_t SeparatorAt(const std::string &strLine, std::size_t at) {
-    if (strLine[at] == '=' || strLine[at] == ':') {
-        return 1;
+    if (std::string_view("=:%&").find(strLine[at]) == std::string_view::npos) {
+        return 0;
     }
-    const int value = strLine[at] == '%' ? HexValue(strLine, at + 1, 2) : -1;
-    return value == '=' || value == ':' ? 3 : 0;
+    for (const Reading &reading : ReadingsAt(strLine, at)) {
+        if (reading.strBytes == "=" || reading.strBytes == ":") {
+            return reading.end - at;
+        }
+    }
+    return 0;
 }
 
 // Words of this length that mix classes of characters are taken for tokens that nobody knows any
@@ -113,14 +124,21 @@ std::string MaskTokenLike(const std::string &strLine) {
 }
 
 std::string MaskPlain(const std::string &strLine) {
+    // Two names that "%3D" joins are looked at once each, with what may stand across.
+    constexpr std::size_t kLongestPart = 10;
     std::size_t end = Lower(strLine).find("bearer ");
     std::size_t cbName = end == std::string::npos ? 0 : 7;
+    std::size_t behind = 0;
     for (std::size_t at = 0; at < std::min(end, strLine.size()); ++at) {
         const std::size_t cb = SeparatorAt(strLine, at);
-        if (cb > 0 && IsSecretName(NameBefore(strLine, at))) {
+        if (cb == 0) {
+            continue;
+        }
+        if (IsSecretName(NameBefore(strLine, at, behind))) {
             end = at;
             cbName = cb;
         }
+        behind = at - std::min(at, kLongestPart);
     }
     const bool blMasked = end != std::string::npos;
     const std::string strBefore = blMasked ? strLine.substr(0, end + cbName) : strLine;

@@ -13,54 +13,19 @@
 #include "deadline.h"
 #include "json_text.h"
 #include "output.h"
+#include "printable.h"
 
 namespace qrmctl {
 
 static constexpr const char *kOutputStage = "writing the result";
-
-std::string Printable(const std::string &strText) {
-    std::string strSafe;
-    for (char c : strText) {
-        const auto byte = static_cast<unsigned char>(c);
-        const bool blC1 =
-            byte >= 0x80 && byte <= 0x9F && !strSafe.empty() && strSafe.back() == '\xC2';
-        if (byte >= 0x20 && byte != 0x7F && !blC1) {
-            strSafe += c;
-            continue;
-        }
-        constexpr char kHex[] = "0123456789ABCDEF";
-        strSafe += {'\\', 'x', kHex[byte >> 4U], kHex[byte & 15U]};
-    }
-    return strSafe;
-}
 
 void Report::Fact(const std::string &strName, const Json::Value &value) {
     m_result[strName] = value;
     if (!m_blJson) {
         const std::string strText =
             value.isString() ? value.asString() : json_text::ToLogText(value);
-        std::cout << strName << ": " << Printable(strText) << '\n';
+        std::cout << strName << ": " << printable::Line(strText) << '\n';
     }
-}
-
-// JSON text for a terminal: control characters beyond ASCII's first page, which JSON leaves as they
-// are, as \u00XX.
-static std::string WithoutControls(const std::string &strText) {
-    std::string strSafe;
-    for (std::size_t i = 0; i < strText.size(); ++i) {
-        const auto byte = static_cast<unsigned char>(strText[i]);
-        const auto next = static_cast<unsigned char>(i + 1 < strText.size() ? strText[i + 1] : 0);
-        const bool blC1 = byte == 0xC2 && next >= 0x80 && next <= 0x9F;
-        if (!blC1 && byte != 0x7F) {
-            strSafe += strText[i];
-            continue;
-        }
-        constexpr char kHex[] = "0123456789abcdef";
-        const unsigned int code = blC1 ? next : byte;
-        strSafe += {'\\', 'u', '0', '0', kHex[code >> 4U], kHex[code & 15U]};
-        i += blC1 ? 1 : 0;
-    }
-    return strSafe;
 }
 
 void Report::Document(const std::string &strName, const Json::Value &value) {
@@ -70,20 +35,19 @@ void Report::Document(const std::string &strName, const Json::Value &value) {
         builder["indentation"] = "  ";
         builder["emitUTF8"] = true;
         builder["enableYAMLCompatibility"] = true;  // no blank before a colon
-        std::string strText = Json::writeString(builder, value);
-        std::cout << WithoutControls(strText) << '\n';
+        std::cout << printable::Json(Json::writeString(builder, value)) << '\n';
     }
 }
 
 void Report::Say(const std::string &strSentence) const {
     if (!m_blJson) {
-        std::cout << Printable(strSentence) << '\n';
+        std::cout << printable::Line(strSentence) << '\n';
     }
 }
 
 void Report::Warn(const std::string &strSentence) {
     m_result["warnings"].append(strSentence);
-    std::cerr << ("qrmctl: warning: " + Printable(strSentence) + '\n');
+    std::cerr << ("qrmctl: warning: " + printable::Line(strSentence) + '\n');
 }
 
 void Report::Stage(const std::string &strName) {
@@ -110,7 +74,7 @@ ExitCode Report::Fail(ErrorId id, const std::string &strError) {
     m_result["error"] = strError;
     m_result["error_id"] = ErrorOf(id).szId;
     Stage(kOutputStage);
-    const std::string strLine = "qrmctl: " + Printable(strError) + '\n';
+    const std::string strLine = "qrmctl: " + printable::Line(strError) + '\n';
     // What comes last decides: until it is out the deadline may strike.
     if (m_blJson) {
         std::cerr << strLine;

@@ -60,9 +60,6 @@ class Report {
     Json::Value m_result{Json::objectValue};
 };
 
-// Text from a file or a server for a terminal: control characters are shown as \xNN.
-std::string Printable(const std::string &strText);
-
 }  // namespace qrmctl
 
 #endif

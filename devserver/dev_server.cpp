@@ -8,6 +8,7 @@
 #include <memory>
 
 #include "console_page.h"
+#include "foreign_page.h"
 #include "json_text.h"
 
 namespace devserver {
@@ -102,6 +103,12 @@ Json::Value HeadersOf(const httplib::Request &request) {
         shown = shown.isNull() ? strValue : shown.asString() + ", " + strValue;
     }
     return headers;
+}
+
+Reply DevelopmentError(int status, const std::string &strError) {
+    Json::Value error;
+    error["error"] = strError;
+    return JsonReply(status, error);
 }
 
 // For who opens the server's bare address in a browser.
@@ -278,6 +285,10 @@ void DevServer::Handle(const char *szScheme, const httplib::Request &request,
 }
 
 Reply DevServer::HandleDevelopment(const httplib::Request &request) {
+    const std::string strForeign = WhyForeign(request);
+    if (!strForeign.empty()) {
+        return DevelopmentError(403, strForeign);
+    }
     const std::string strWhat = request.method + " " + request.path;
     if (strWhat == "GET /dev/requests") {
         return JsonReply(200, Requests());
@@ -311,9 +322,7 @@ Reply DevServer::HandleDevelopment(const httplib::Request &request) {
         AnswerNext(strApi, answer);
         return Ok(Json::objectValue);
     }
-    Json::Value error;
-    error["error"] = strError;
-    return JsonReply(400, error);
+    return DevelopmentError(400, strError);
 }
 
 Reply DevServer::HandleOrdinarily(const Call &call) {

@@ -43,8 +43,8 @@ void Write(const char *szStem, int line, const char *szFormat, ...)
     __attribute__((format(printf, 3, 4)));
 
 // Text from outside for a log line: each of the secrets blanked out, however its characters are
-// escaped (\", \/, \u002F, %2F), and control characters escaped. What would not fit into a line is
-// left out, and the whole length named.
+// escaped (secret_search.h), and the rest made printable (printable.h). What would not fit into a
+// line is left out, and the whole length named.
 std::string SafeText(const std::string &strText, const std::vector<std::string> &secrets);
 
 }  // namespace qrm_log

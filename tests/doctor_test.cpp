@@ -365,6 +365,8 @@ TEST_F(Support, NoSecretLeavesTheAppliance) {
         R"(\u00733c\u002Fret\u0022~~\u003f>+0123456789)",
         "s3c%2Fret%22~~%3f%3E%2B0123456789",
         "s3c%252fret%2522~~?%253E%252B0123456789",
+        "s3c&#x2F;ret&quot;~~&#63;&gt;+0123456789",
+        "s3c&amp;#47;ret&amp;quot;~~?\\u0026gt;+0123456789",
         "czNjL3JldCJ+fj8+KzAxMjM0NTY3ODk=",          // Base64
         "QmVhcmVyIHMzYy9yZXQifn4/PiswMTIzNDU2Nzg5",  // of "Bearer " and the token
         "eHMzYy9yZXQifn4_PiswMTIzNDU2Nzg5eA",        // of x, the token, x; for URLs
@@ -461,6 +463,7 @@ TEST_F(Support, AnUnknownSecretIsFoundByItsNameOrItsLook) {
           "sent Bearer n0body", "Set-Cookie: id=n0body", "access_token%3Dn0body", "pass=n0body",
           R"(got {\"access_token\":\"n0body\"})", R"({"text":"bad password=n0body"})",
           R"({"variables":{"%BODY%":"{\"token\":\"n0body\"}"}})", R"([{"text":"Bearer n0body"}])",
+          "{&quot;token&quot;:&quot;n0body&quot;}", "token&#61;n0body",
           "was n0bodyKnowsThisToken"}) {
         SCOPED_TRACE(szLine);
         Write("/var/log/messages", std::string("qrmctl: ") + szLine + '\n');
@@ -471,6 +474,25 @@ TEST_F(Support, AnUnknownSecretIsFoundByItsNameOrItsLook) {
         EXPECT_TRUE(Holds(strAll, "qrmctl: ")) << strAll;
         EXPECT_FALSE(Holds(strAll, "n0body")) << strAll;
     }
+}
+
+// Each of these would take minutes if places or names were compared anew for each character.
+TEST_F(Support, LongLinesTakeSeconds) {
+    Store();
+    for (const std::string strPiece : {"\\", "%3D", "s3c/ret\"~~?>+012345678", "&#38;#38;"}) {
+        std::string strLine = "qrmctl: ";
+        while (strLine.size() < 8000) {
+            strLine += strPiece;
+        }
+        std::string strLog;
+        for (int i = 0; i < 200; ++i) {
+            strLog += strLine + '\n';
+        }
+        Write("/var/log/messages", strLog);
+        Write("/var/log/syslog", strLog);
+        EXPECT_EQ(Run({"--force", "--deadline", "20"}).status, 0) << strPiece;
+    }
+    fs::remove("/var/log/syslog");
 }
 
 TEST_F(Support, WhatMayHoldUnknownTokensIsLeftOut) {

@@ -302,11 +302,12 @@ TEST_F(Join, RefusedRepliesAreLoggedWithoutTheToken) {
         {strDeep, strDeep.c_str()},
         {std::string("token ") + kToken + " se\\/cr\\\"et-0123456789", "token *** ***"},
         {"se\\u002fcr\\u0022et-0123456789 se%2Fcr%22et-0123456789.", "*** ***."},
+        {"se&#47;cr&quot;et-0123456789 se&#x2f;cr\\u0026#34et-&#48;123456789.", "*** ***."},
         {"se/cr\"et-012345678", "se/cr\"et-012345678"},
         {"\xC2\x9B"
-         "2J \x9B \xC3\x9B",
+         "2J \x9B \xC3\x9B\x9B\xE2\x80\xAE",
          "\\xC2\\x9B"
-         "2J \\x9B \xC3\x9B"},
+         "2J \\x9B \xC3\x9B\\x9B\\xE2\\x80\\xAE"},
     };
     for (const auto &row : rows) {
         stored::Clear();

@@ -47,7 +47,8 @@ class Server:
     def ask(self, method, path, body=None):
         request = urllib.request.Request(f"http://127.0.0.1:{self.http}/dev/{path}", method=method,
                                          headers={"Content-Type": "application/json"},
-                                         data=None if body is None else json.dumps(body).encode())
+                                         data=None if body is None else
+                                         json.dumps(body, ensure_ascii=False).encode(errors="surrogateescape"))
         with urllib.request.urlopen(request, timeout=60) as reply:
             return json.load(reply)
 

@@ -19,7 +19,7 @@
 
 #include "../certificate_authorities.h"
 #include "last_error.h"
-#include "one_line.h"
+#include "printable.h"
 #include "text_buffer.h"
 
 namespace host {
@@ -113,7 +113,7 @@ bool AddApplianceCa(X509_STORE *pStore) {
     const bool blAll = AddFolder(pStore, strPath);
     if (!blAll) {
         syslog(LOG_ERR, "%s:%d cannot read certificates from '%s': mend or remove it", kFile,
-               __LINE__, one_line::Text(strPath).c_str());
+               __LINE__, printable::Line(strPath).c_str());
     }
     return blAll;
 }

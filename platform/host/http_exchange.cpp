@@ -22,7 +22,7 @@
 #include "appliance_ca.h"
 #include "key_value_lookup.h"
 #include "last_error.h"
-#include "one_line.h"
+#include "printable.h"
 #include "reply_sink.h"
 #include "waiting.h"
 
@@ -422,7 +422,7 @@ int Fail(int error, const HttpRequest &request, const char *szReason, int line) 
         // The query names nothing that helps, and it came from a caller.
         const std::string strUrl = request.strUrl.substr(0, request.strUrl.find('?'));
         syslog(LOG_WARNING, "%s:%d %s%s: %s", kFile, line, strUrl.c_str(),
-               request.blRelay ? " through the relay" : "", one_line::Text(szReason).c_str());
+               request.blRelay ? " through the relay" : "", printable::Line(szReason).c_str());
     }
     YLIBCErrSetEx(LastErrorOf(error), kFile, line);
     return error;

@@ -14,7 +14,7 @@
 #include <memory>
 #include <utility>
 
-#include "one_line.h"
+#include "printable.h"
 #include "program.h"
 
 namespace {
@@ -36,7 +36,7 @@ bool IsOurs(const struct stat &status) {
 
 void LogNotRun(const std::string &strPath, const char *szReason, int line) {
     syslog(LOG_WARNING, "%s:%d notification hook '%s' is not run: %s", kFile, line,
-           one_line::Text(strPath).c_str(), szReason);
+           printable::Line(strPath).c_str(), szReason);
 }
 
 // Folders, and files that nobody may execute, are no hooks.
@@ -134,7 +134,7 @@ void host::RunHooks(const Notification &notification) {
         const ProgramEnd end = RunProgram({strHook, notification.strTag}, environment, kLimit);
         if (end.kind != ProgramEnd::Kind::kExited || end.value != 0) {
             syslog(LOG_WARNING, "%s:%d notification hook '%s' failed for '%s': %s", kFile, __LINE__,
-                   one_line::Text(strHook).c_str(), one_line::Text(notification.strTag).c_str(),
+                   printable::Line(strHook).c_str(), printable::Line(notification.strTag).c_str(),
                    Describe(end).c_str());
         }
     }

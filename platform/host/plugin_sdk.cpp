@@ -20,7 +20,7 @@
 #include <vector>
 
 #include "last_error.h"
-#include "one_line.h"
+#include "printable.h"
 #include "program.h"
 #include "time_limit.h"
 
@@ -112,7 +112,7 @@ Folder CheckFolder(const std::string &strFolder) {
             }
             const char *const szReason = std::strerror(errno);
             syslog(LOG_ERR, "%s:%d cannot look at the plug-in folder '%s': %s", kFile, __LINE__,
-                   one_line::Text(strPart).c_str(), szReason);
+                   printable::Line(strPart).c_str(), szReason);
             HOST_FAIL(YLIBC_ERR_FILE);
             return Folder::kUnusable;
         }
@@ -120,7 +120,7 @@ Folder CheckFolder(const std::string &strFolder) {
             syslog(LOG_ERR,
                    "%s:%d the plug-in folder '%s' is no folder or can be changed by others than "
                    "root: nothing in it is run",
-                   kFile, __LINE__, one_line::Text(strPart).c_str());
+                   kFile, __LINE__, printable::Line(strPart).c_str());
             HOST_FAIL(YLIBC_ERR_UNSAFE_FILE);
             return Folder::kUnusable;
         }
@@ -158,14 +158,14 @@ bool ListPrograms(const std::string &strFolder, std::vector<std::string> &progra
         }
         if (const char *const szReason = WhyNoProgram(strPath.c_str()); szReason != nullptr) {
             syslog(LOG_WARNING, "%s:%d '%s' is passed over: %s", kFile, __LINE__,
-                   one_line::Text(strPath).c_str(), szReason);
+                   printable::Line(strPath).c_str(), szReason);
             continue;
         }
         programs.push_back(std::move(strPath));
     }
     if (error) {
         syslog(LOG_ERR, "%s:%d cannot read the plug-in folder '%s': %s", kFile, __LINE__,
-               one_line::Text(strFolder).c_str(), std::strerror(error.value()));
+               printable::Line(strFolder).c_str(), std::strerror(error.value()));
         HOST_FAIL(YLIBC_ERR_FILE);
         return false;
     }
@@ -205,7 +205,7 @@ Outcome Judge(const host::ProgramEnd &end) {
 
 void LogFailure(const std::string &strProgram, const char *szAction, const host::ProgramEnd &end,
                 std::chrono::seconds limit) {
-    const std::string strShown = one_line::Text(strProgram);
+    const std::string strShown = printable::Line(strProgram);
     const char *const szProgram = strShown.c_str();
     switch (end.kind) {
         case host::ProgramEnd::Kind::kTimedOut:
