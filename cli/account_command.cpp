@@ -25,9 +25,10 @@ ExitCode Create(Report &report) {
 ExitCode Delete(Report &report) {
     Report::Stage("deleting the service account");
     Report::Remedy("run 'qrmctl account delete' again, or 'qrmctl leave'");
-    if (!ZELOQRMClientDeleteServerUser()) {
+    if (!ZELOQRMClientDeleteServerUser() || !IsAccountGone()) {
         return report.Fail(ErrorId::kAccountNotDeleted,
-                           "the service account could not be deleted; -v shows the reason");
+                           "the service account could not be deleted, or the account files cannot "
+                           "be read; -v shows the reason");
     }
     report.Say("There is no service account any more.");
     return report.Done();

@@ -13,6 +13,7 @@
 #include <memory>
 
 #include "commands.h"
+#include "destination.h"
 #include "file_system.h"
 #include "input_file.h"
 #include "joined_server.h"
@@ -105,26 +106,35 @@ ExitCode Tell(Outcome outcome, const std::string &strPath, const Progress &progr
 
 // --- Beside the destination ---------------------------------------------------------------------
 
-// Through links to the file itself, so that a link stays one; absolute, so that it has a folder.
-bool ResolveDestination(const std::string &strPath, fs::path &destination, std::string &strError) {
+// False, with the error, when somebody else's link would choose where the file goes.
+bool IsWayOurs(const std::string &strPath, std::string &strError) {
+    destination::Place place;
+    if (destination::Find(strPath, place) != destination::Way::kForeignLink) {
+        return true;
+    }
+    strError = "'" + strPath +
+               "' leads through another user's link in a directory that everybody can write to: "
+               "name another path, or remove the link";
+    return false;
+}
+
+bool PrepareFolder(const std::string &strPath, std::string &strError) {
     std::error_code error;
+    const fs::path path = strPath;
     if (strPath.empty()) {
         strError = "the path is empty: name the file";
         return false;
     }
-    destination = fs::weakly_canonical(fs::absolute(strPath, error), error);
-    if (!error && (fs::is_directory(destination, error) || !destination.has_filename())) {
+    if (!path.has_filename() || fs::is_directory(path, error)) {
         strError = "'" + strPath + "' is a directory: name the file in it";
         return false;
     }
-    const fs::file_type type = fs::status(destination, error).type();
-    if (type != fs::file_type::not_found && type != fs::file_type::regular) {
-        strError = "'" + strPath + "' is there and no ordinary file: name another path";
+    if (!IsWayOurs(strPath, strError)) {
         return false;
     }
-    const std::string strFolder = destination.parent_path();
     constexpr int kOwner = 1024;
     constexpr int kGroup = 100;
+    const std::string strFolder = path.has_parent_path() ? path.parent_path().string() : ".";
     if (ZELOFSMkdirP(strFolder.c_str(), 0, 1, kOwner, kGroup, 0755) < 0) {
         strError =
             "cannot create the directory of '" + strPath + "': name a path that can be written";
@@ -133,21 +143,44 @@ bool ResolveDestination(const std::string &strPath, fs::path &destination, std::
     return true;
 }
 
+// Through links to the file itself, so that a link stays one; absolute, so that it has a folder.
+bool ResolveDestination(const std::string &strPath, fs::path &file, std::string &strError) {
+    if (!PrepareFolder(strPath, strError)) {
+        return false;
+    }
+    destination::Place place;
+    if (destination::Find(strPath, place) != destination::Way::kFound) {
+        strError = "cannot reach '" + strPath + "': " + std::strerror(errno);
+        return false;
+    }
+    struct stat status = {};
+    if (fstat(place.file.Get(), &status) == 0 && !S_ISREG(status.st_mode)) {
+        strError = "'" + strPath + "' is there and no ordinary file: name another path";
+        return false;
+    }
+    std::error_code error;
+    file = fs::read_symlink(destination::PathOf(place.folder), error) / place.strName;
+    if (error) {
+        strError = "cannot find the directory of '" + strPath + "': " + error.message();
+    }
+    return !error;
+}
+
 // Gives the new file the mode and owner of the old one, as far as that is allowed, and puts it in
 // the old one's place.
-bool PutInPlace(const std::string &strFile, const fs::path &destination) {
+bool PutInPlace(const std::string &strFile, const fs::path &place) {
     const int fd = open(strFile.c_str(), O_RDONLY | O_CLOEXEC | O_NOFOLLOW);
     if (fd < 0) {
         return false;
     }
     struct stat old = {};
-    if (stat(destination.c_str(), &old) == 0) {
+    if (lstat(place.c_str(), &old) == 0 && S_ISREG(old.st_mode)) {
         static_cast<void>(fchown(fd, old.st_uid, old.st_gid) == 0);
         static_cast<void>(fchmod(fd, old.st_mode & 07777) == 0);
     }
     const bool blDurable = fsync(fd) == 0;
     close(fd);
-    return blDurable && std::rename(strFile.c_str(), destination.c_str()) == 0;
+    return blDurable && std::rename(strFile.c_str(), place.c_str()) == 0;
 }
 
 std::string FetchStage(const ApiCall &call, const JoinedServer &server) {
@@ -159,17 +192,17 @@ ExitCode GetBeside(const Options &options, const JoinedServer &server, Json::Val
                    Report &report) {
     Report::Remedy("'" + options.strPath + "' is as it was; give it more time with --deadline");
     Report::Stage("preparing the place beside '" + options.strPath + "'");
-    fs::path destination;
+    fs::path file;
     std::string strError;
-    if (!ResolveDestination(options.strPath, destination, strError)) {
+    if (!ResolveDestination(options.strPath, file, strError)) {
         return report.Fail(ErrorId::kBadDestination, strError);
     }
     char szMd5[33] = {};
-    if (GetFileMd5String(destination.c_str(), szMd5, sizeof(szMd5)) == 0) {
+    if (GetFileMd5String(file.c_str(), szMd5, sizeof(szMd5)) == 0) {
         params["md5"] = szMd5;
     }
     const InterruptGuard guard;
-    const WorkFolder workplace(destination);
+    const WorkFolder workplace(file);
     if (!workplace.IsUsable()) {
         return report.Fail(ErrorId::kBadDestination, "cannot write beside '" + options.strPath +
                                                          "': " + std::strerror(workplace.Error()));
@@ -178,7 +211,7 @@ ExitCode GetBeside(const Options &options, const JoinedServer &server, Json::Val
     Progress progress(!report.IsJson());
     const Outcome outcome = Fetch(workplace.Path("file"), options.call, params, progress);
     Report::Stage("putting the file in place");
-    if (outcome == Outcome::kFetched && !PutInPlace(workplace.Path("file"), destination)) {
+    if (outcome == Outcome::kFetched && !PutInPlace(workplace.Path("file"), file)) {
         return report.Fail(ErrorId::kNotReplaced, "cannot replace '" + options.strPath + "': " +
                                                       std::strerror(errno) + "; it is as it was");
     }
@@ -199,6 +232,9 @@ ExitCode GetFile(const Options &options, Report &report) {
     }
     if (!options.blInPlace) {
         return GetBeside(options, *server, params, report);
+    }
+    if (!IsWayOurs(options.strPath, strError)) {
+        return report.Fail(ErrorId::kBadDestination, strError);
     }
     Report::Stage(FetchStage(options.call, *server));
     Report::Remedy("'" + options.strPath + "' holds what had arrived; fetch it again");

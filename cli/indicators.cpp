@@ -5,6 +5,7 @@
 #include "fixed_text.h"
 #include "joined_server.h"
 #include "key_value_file.h"
+#include "last_error.h"
 #include "membership.h"
 #include "platform_handles.h"
 #include "process.h"
@@ -170,13 +171,15 @@ Indicator ReadSessions(const Flag &flag) {
 Indicator ReadAccount(const Flag &flag) {
     MovingHandle<ZELO_USER, ZELOUserFree> user;
     const bool blExists = ZELOUserGet(kServiceAccount, user.Address()) == 0;
+    const bool blUnknown = !blExists && YLIBCErrGet() != YLIBC_ERR_NOT_FOUND;
     const bool blAdmin = blExists && YLIBGroupIsAdminGroupMem(user.Get()->szName, 0) == 1;
 
     Indicator indicator;
     indicator.strName = "service account";
-    indicator.strHolds = blAdmin    ? "exists, an administrator"
-                         : blExists ? "exists, no administrator"
-                                    : "does not exist";
+    indicator.strHolds = blAdmin     ? "exists, an administrator"
+                         : blExists  ? "exists, no administrator"
+                         : blUnknown ? "cannot be read now (-v shows the reason)"
+                                     : "does not exist";
     if (flag.blYes && !blAdmin) {
         Break(indicator, blExists ? 10 : 9);
     }

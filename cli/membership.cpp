@@ -12,6 +12,7 @@
 #include "fixed_text.h"
 #include "json_text.h"
 #include "key_value_file.h"
+#include "last_error.h"
 #include "platform_handles.h"
 #include "process.h"
 #include "user_group.h"
@@ -71,7 +72,38 @@ bool RemoveRemains(bool blRejoin) {
     if (YLIBGroupExtraAdminSet("QRM", 0, 0, 0, 0) != 0) {
         return false;
     }
-    return YLIBCFileCheckKeyValue(kConfigFile, kJoinFlag, "rejoin", 0) != 1 || SetJoinFlag("no");
+    return YLIBCFileCheckKeyValue(kConfigFile, kJoinFlag, "rejoin", 0) == 0 || SetJoinFlag("no");
+}
+
+// --- What is gone for certain: what cannot be read may be there ---------------------------------
+
+bool AreCredentialsGone() {
+    for (const char *szApplication : {kServerApplication, kNotificationCenter}) {
+        ZELO_CRED *pList = nullptr;
+        const int count = ZELOCredListGet(&pList, ZELOCredKeepByApplication, szApplication);
+        const CredListHandle list(pList);
+        if (count != 0) {
+            return false;
+        }
+    }
+    return true;
+}
+
+bool AreSessionsGone() {
+    ZELO_CGI_CONTEXT context = {};
+    bool blGone = ZeloCgiInit("", &context) != 0;
+    for (const char *szSession : kClientSessions) {
+        YLIBCErrSetEx(YLIBC_ERR_NONE, "", 0);
+        blGone = blGone && ZeloCgiSessionExistByIndex(&context, kSessionIndex, szSession) == 0 &&
+                 YLIBCErrGet() == YLIBC_ERR_NONE;
+    }
+    ZeloCgiFree(&context);
+    return blGone;
+}
+
+bool IsFlagGone(bool blRejoin) {
+    return YLIBCFileCheckKeyValue(kConfigFile, kJoinFlag, "yes", 0) == 0 &&
+           (blRejoin || YLIBCFileCheckKeyValue(kConfigFile, kJoinFlag, "rejoin", 0) == 0);
 }
 
 }  // namespace
@@ -166,6 +198,11 @@ bool CreateServiceAccount() {
     return SeedGenerator() && ZELOQRMClientCreateServerUser();
 }
 
+bool IsAccountGone() {
+    MovingHandle<ZELO_USER, ZELOUserFree> user;
+    return ZELOUserGet(kServiceAccount, user.Address()) < 0 && YLIBCErrGet() == YLIBC_ERR_NOT_FOUND;
+}
+
 bool SetJoinFlag(const char *szValue) {
     return YLIBCINFOSetKeyValue(kJoinFlag, szValue) >= 0;
 }
@@ -183,7 +220,9 @@ bool LeaveWholly(const LeaveRequest &request) {
             return false;
         }
     }
-    return ZELOQRMClientStatus() == 0 && RemoveRemains(request.blRejoin);
+    // To the library's look-ups, what cannot be read and what is not there are the same.
+    return ZELOQRMClientStatus() == 0 && RemoveRemains(request.blRejoin) && AreCredentialsGone() &&
+           AreSessionsGone() && IsAccountGone() && IsFlagGone(request.blRejoin);
 }
 
 }  // namespace qrmctl

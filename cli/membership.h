@@ -37,6 +37,9 @@ bool AddClientSessions();
 // Seeds the generator that the account's password comes from, and creates the account.
 bool CreateServiceAccount();
 
+// Whether the account is not there for certain. Accounts that cannot be read may hold it.
+bool IsAccountGone();
+
 bool SetJoinFlag(const char *szValue);
 
 // What the time counts for while a turn is waited for.
@@ -73,7 +76,8 @@ struct LeaveRequest {
 };
 
 // Leaves until nothing is left, from any half-way state: the library's leave as often as it takes,
-// then what it does not look for. Returns false when a step failed.
+// then what it does not look for. Returns false when a step failed, and when it is not certain that
+// nothing is left.
 bool LeaveWholly(const LeaveRequest &request);
 
 }  // namespace qrmctl

@@ -125,7 +125,8 @@ ExitCode Leave(const LeaveRequest &request, Report &report) {
     const bool blJoined = ZELOQRMClientStatus() != 0;
     if (!LeaveWholly(request)) {
         return report.Fail(ErrorId::kLeaveFailed,
-                           "a step of leaving failed, what came before it is done: -v shows which; "
+                           "a step of leaving failed, or what is left cannot be read; what came "
+                           "before is done: -v shows which; "
                            "run 'qrmctl leave' again when its cause is mended");
     }
     report.Fact("was_joined", blJoined);

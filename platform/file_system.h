@@ -20,7 +20,9 @@ ZELO_PLATFORM_API int YLIBCFileStat(const char *szPath, int blNoFollow, struct s
 // Creates a directory with its missing parents. Each one that it creates gets the mode, whatever
 // the process's umask, and, when blOwner is not 0, the owner uid and the group gid, as far as the
 // process may give directories away. One that is there already is left as it is, and what leads to
-// a directory is one. flags is reserved: callers pass 0, a port ignores it.
+// a directory is one, except for a link that belongs neither to the caller nor to the folder's
+// owner in a folder that everybody can write to. flags is reserved: callers pass 0, a port ignores
+// it.
 //
 // Returns 0 or more when the directory is there, a negative value otherwise; parents that were
 // created by then stay.

@@ -44,10 +44,14 @@ struct ZELO_USER {
 // and the list itself. A caller who puts a list of its own there hands it over in the same form and
 // takes over the list that was there, to be released in the same way, once. Exchanging the two
 // pointers does both. Null stands for no members.
+//
+// The port notes in the record who the members were when they were read. A record of a caller's own
+// making is filled with zeros first, and released with ZELOGroupFree too.
 struct ZELO_GROUP {
     char szName[256];  // as of a user
     gid_t gid;
     char **ppszMembers;
+    void *pPort;  // the port's
 };
 
 // What became of a change to several users.
@@ -87,8 +91,9 @@ ZELO_PLATFORM_API void YLIBCMResultFree(YLIBCM_RESULT *pResult);
 // --- Users --------------------------------------------------------------------------------------
 
 // Looks a user up. On success *ppUser is a new record with the stored fields and an empty password;
-// the caller owns it and releases it with ZELOUserFree. On failure *ppUser is null: with
-// YLIBC_ERR_NOT_FOUND when there is no such user.
+// the caller owns it and releases it with ZELOUserFree. On failure *ppUser is null.
+// YLIBC_ERR_NOT_FOUND says that there is no such user, and no other last error does: after any
+// other there may be one.
 ZELO_PLATFORM_API int ZELOUserGet(const char *szName, ZELO_USER **ppUser);
 
 // Stores a user: a new one when szCurrentName is null, else the one with that name, which must be
@@ -126,12 +131,17 @@ ZELO_PLATFORM_API int ZELOUserPreferenceDirGet(const char *szName, char *szPath,
 
 // Looks a group up. On success *ppGroup is a new record whose list has the members in the stored
 // order, and is never null; the caller owns it and releases it with ZELOGroupFree. On failure
-// *ppGroup is null: with YLIBC_ERR_NOT_FOUND when there is no such group.
+// *ppGroup is null; YLIBC_ERR_NOT_FOUND alone says that there is no such group.
 ZELO_PLATFORM_API int ZELOGroupGet(const char *szName, ZELO_GROUP **ppGroup);
 
 // Makes the record's members the members of the group szName, in their order; name and gid of the
-// group stay. The record and its list stay the caller's. A member's name is refused when it is
-// empty or holds ":", "," or a line feed; whether it is a user's is not asked.
+// group stay. Where the group has changed since ZELOGroupGet read the record, only the difference
+// is written: who was put on the record's list is added, who was taken off it is removed, and what
+// others have changed meanwhile stays. A record of the caller's own making is written as it is.
+//
+// The record and its list stay the caller's; after a success its members count as read. A member's
+// name is refused when it is empty or holds ":", "," or a line feed; whether it is a user's is not
+// asked.
 ZELO_PLATFORM_API int ZELOGroupSet(const char *szName, const ZELO_GROUP *pGroup);
 
 // Whether a user is a member of the group "administrators", as one of its listed members or because

@@ -5,9 +5,17 @@
 
 #include <unistd.h>
 
+#include <utility>
+
 class Descriptor {
   public:
+    Descriptor() = default;
     explicit Descriptor(int fd) : m_fd(fd) {}
+    Descriptor(Descriptor &&other) noexcept : m_fd(std::exchange(other.m_fd, -1)) {}
+    Descriptor &operator=(Descriptor &&other) noexcept {
+        std::swap(m_fd, other.m_fd);
+        return *this;
+    }
     ~Descriptor() {
         if (m_fd >= 0) {
             close(m_fd);
@@ -20,7 +28,7 @@ class Descriptor {
     int Get() const { return m_fd; }
 
   private:
-    int m_fd;
+    int m_fd = -1;
 };
 
 #endif

@@ -203,12 +203,17 @@ bool FromString(const std::string &strText, Json::Value &value, std::string *pst
     return false;
 }
 
-bool FromFile(const char *szPath, Json::Value &value) {
+bool FromFile(const char *szPath, Json::Value &value, struct stat *pStatus) {
     // A pipe that somebody put there must not make the caller wait.
     const Descriptor file(open(szPath, O_RDONLY | O_CLOEXEC | O_NONBLOCK));
     struct stat status = {};
-    if (file.Get() < 0 || fstat(file.Get(), &status) != 0 || !S_ISREG(status.st_mode) ||
-        status.st_size > kMaxFile) {
+    if (file.Get() < 0 || fstat(file.Get(), &status) != 0) {
+        return false;
+    }
+    if (pStatus != nullptr) {
+        *pStatus = status;
+    }
+    if (!S_ISREG(status.st_mode) || status.st_size > kMaxFile) {
         return false;
     }
     std::string strText(static_cast<std::size_t>(status.st_size), '\0');
@@ -226,17 +231,19 @@ bool FromFile(const char *szPath, Json::Value &value) {
     return FromString(strText, value);
 }
 
-bool ToFile(const Json::Value &value, const char *szPath) {
+bool ToFile(const Json::Value &value, int fd) {
     std::string strText;
     if (!ToString(value, strText)) {
         return false;
     }
     strText += '\n';
-    unlink(szPath);
-    const Descriptor file(open(szPath, O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0644));
+    if (ftruncate(fd, 0) != 0) {
+        return false;
+    }
     std::size_t cbWritten = 0;
-    while (file.Get() >= 0 && cbWritten < strText.size()) {
-        const ssize_t cb = write(file.Get(), &strText[cbWritten], strText.size() - cbWritten);
+    while (cbWritten < strText.size()) {
+        const ssize_t cb = pwrite(fd, &strText[cbWritten], strText.size() - cbWritten,
+                                  static_cast<off_t>(cbWritten));
         if (cb < 0 && errno == EINTR) {
             continue;
         }
@@ -245,7 +252,7 @@ bool ToFile(const Json::Value &value, const char *szPath) {
         }
         cbWritten += static_cast<std::size_t>(cb);
     }
-    return file.Get() >= 0 && fsync(file.Get()) == 0;
+    return fsync(fd) == 0;
 }
 
 const Json::Value &Member(const Json::Value &object, const char *szKey) {

@@ -8,6 +8,7 @@
 #define ZELO_JSON_TEXT_H
 
 #include <json/value.h>
+#include <sys/stat.h>
 
 #include <cstddef>
 #include <string>
@@ -33,13 +34,13 @@ std::string ToLogText(const Json::Value &value);
 bool FromString(const std::string &strText, Json::Value &value, std::string *pstrError = nullptr);
 
 // Reads and parses a file; returns whether it succeeded, with the value unchanged when not. Only a
-// regular file of at most 64 MiB is read.
-bool FromFile(const char *szPath, Json::Value &value);
+// regular file of at most 64 MiB is read. *pStatus, when given, becomes the status of the very file
+// that was opened.
+bool FromFile(const char *szPath, Json::Value &value, struct stat *pStatus = nullptr);
 
-// Writes the value's JSON text and a line feed to a new file (mode 0644 less the umask), durably;
-// returns whether it succeeded. A file that stands there already is removed first, and nothing is
-// written through a link.
-bool ToFile(const Json::Value &value, const char *szPath);
+// Writes the value's JSON text and a line feed to an open file in the place of its content,
+// durably; returns whether it succeeded.
+bool ToFile(const Json::Value &value, int fd);
 
 // The member of an object; null (the shared null value) when there is none or the value is no
 // object. The result lives as long as the value.

@@ -8,19 +8,17 @@
 #include <array>
 #include <cerrno>
 #include <cstdio>
-#include <cstdlib>
-#include <cstring>
-#include <ctime>
 #include <vector>
 
+#include "connect_failed_marker.h"
 #include "descriptor.h"
+#include "destination.h"
 #include "file_system.h"
 #include "fixed_text.h"
 #include "guard.h"
 #include "json_text.h"
 #include "log.h"
 #include "platform_handles.h"
-#include "process.h"
 #include "terminated_text.h"
 #include "zeloqrmclient.h"
 
@@ -86,31 +84,13 @@ bool Reload() {
     return ReloadCredential(id) && ReloadSession(id);
 }
 
-// --- The connect-failed marker ------------------------------------------------------------------
+// --- The failure path ---------------------------------------------------------------------------
 
-constexpr const char *kMarker = "/tmp/qrmclientconnectfailed";
-constexpr const char *kTouch = "/bin/touch";
 constexpr const char *kConnectFailed = "QRMClientConnectFailed";
-constexpr long kNotifyInterval_s = 7200;
-
-// Whether the user was told lately: the marker's time is that of the latest notification. A clock
-// that was set back does not silence it for longer.
-bool IsNotifiedLately() {
-    struct stat status = {};
-    if (YLIBCFileStat(kMarker, 1, &status) != 0) {
-        return false;
-    }
-    if (S_ISLNK(status.st_mode)) {
-        // Somebody else's link: touching it would touch the file that it leads to.
-        unlink(kMarker);
-        return false;
-    }
-    return std::labs(static_cast<long>(std::time(nullptr) - status.st_mtime)) <= kNotifyInterval_s;
-}
 
 int Fail() {
-    if (!IsNotifiedLately()) {
-        static_cast<void>(YLIBCExec(kTouch, kMarker, nullptr, nullptr, nullptr));
+    if (!connect_failed_marker::IsRecent()) {
+        connect_failed_marker::Touch();
         SendNotification(kConnectFailed, nullptr);
     }
     return -1;
@@ -188,7 +168,7 @@ bool Call(Json::Value &resp, const std::string &api, int ver, const std::string 
         SetStatus(StatusOfFailure(reply));
     }
     resp.swap(reply);
-    unlink(kMarker);
+    connect_failed_marker::Remove();
     return true;
 }
 
@@ -219,10 +199,7 @@ std::string FolderOf(const std::string &path) {
 }
 
 FileHandle OpenDestination(const std::string &path) {
-    std::FILE *pFile = nullptr;
-    do {
-        pFile = fopen64(path.c_str(), "w");
-    } while (pFile == nullptr && errno == EINTR);
+    std::FILE *const pFile = destination::OpenToWrite(path);
     if (pFile != nullptr) {
         // The pieces that arrive are large: a buffer would only cut each into two writes.
         static_cast<void>(std::setvbuf(pFile, nullptr, _IONBF, 0));

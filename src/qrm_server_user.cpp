@@ -5,12 +5,14 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <chrono>
 #include <cstdlib>
 #include <cstring>
 
 #include "fixed_text.h"
 #include "guard.h"
 #include "json_text.h"
+#include "locked_file.h"
 #include "log.h"
 #include "platform_handles.h"
 #include "service.h"
@@ -40,6 +42,21 @@ using ResultHandle = MovingHandle<YLIBCM_RESULT, YLIBCMResultFree>;
 
 bool Exists(UserHandle &user) {
     return ZELOUserGet(kUser, user.Address()) == 0;
+}
+
+// Whether the account is known not to be there. Accounts that cannot be read may hold it.
+bool IsGone(UserHandle &user) {
+    const unsigned int code = YLIBCErrGet();
+    const char *const szFile = YLIBCErrorGetFile();
+    const int line = YLIBCErrorGetLine();
+    YLIBCErrSetEx(YLIBC_ERR_NONE, "", 0);
+    const bool blExists = Exists(user);
+    const unsigned int reason = YLIBCErrGet();
+    if (reason == YLIBC_ERR_NONE) {
+        YLIBCErrSetEx(code, szFile, line);
+    }
+    // A platform that gives no reason has none to give but that one.
+    return !blExists && (reason == YLIBC_ERR_NONE || reason == YLIBC_ERR_NOT_FOUND);
 }
 
 // --- The password -------------------------------------------------------------------------------
@@ -262,7 +279,7 @@ bool DeleteLocked(ResultHandle &result) {
         return false;
     }
     UserHandle user;
-    if (Exists(user)) {
+    if (!IsGone(user)) {
         ZELO_LOG("User delete fail");
         return false;
     }
@@ -275,7 +292,7 @@ bool DeleteLocked(ResultHandle &result) {
 
 bool Delete() {
     UserHandle user;
-    if (!Exists(user)) {
+    if (IsGone(user)) {
         return true;
     }
     ResultHandle result(YLIBCMResultAlloc());
@@ -294,6 +311,9 @@ bool Delete() {
 // --- Welcome pages ------------------------------------------------------------------------------
 
 constexpr const char *kSettingsFile = "usersettings";
+constexpr mode_t kModeOfNew = 0644;
+constexpr mode_t kModeOfOld = 0600;  // at first: it becomes that of the old file
+constexpr std::chrono::seconds kTurnWait{10};
 constexpr const char *kInstance = "ZELO.PKV.App.WelcomeApp.Instance";
 
 using PathText = FixedText<4096>;
@@ -305,6 +325,14 @@ void HidePages(Json::Value &settings, bool blHide) {
     }
     instance["welcome_nvo40_hide"] = blHide;
     instance["welcome_nvo50_hide"] = blHide;
+}
+
+// Gives the new file the mode and the owner of the old one, the owner as far as the process may.
+void KeepModeAndOwner(const struct stat &old, int fd) {
+    if (S_ISREG(old.st_mode)) {
+        static_cast<void>(fchown(fd, old.st_uid, old.st_gid) == 0);
+        static_cast<void>(fchmod(fd, old.st_mode & 07777U) == 0);
+    }
 }
 
 bool ShowPages(const char *szUser, bool blShow) {
@@ -319,15 +347,21 @@ bool ShowPages(const char *szUser, bool blShow) {
     PathText temporary;
     temporary.Format("%s.tmp", path.sz());
 
+    // Whoever holds the temporary file reads and replaces the settings; the next one reads those.
+    struct stat old = {};
+    const bool blThere = stat(path.sz(), &old) == 0;
+    const LockedFile file(temporary.sz(), blThere ? kModeOfOld : kModeOfNew, kTurnWait);
+
     Json::Value settings(Json::objectValue);
     if (access(path.sz(), R_OK) == 0) {
-        static_cast<void>(json_text::FromFile(path.sz(), settings));
+        static_cast<void>(json_text::FromFile(path.sz(), settings, &old));
     }
     if (!settings.isObject()) {
         settings = Json::Value(Json::objectValue);
     }
     HidePages(settings, !blShow);
-    if (!json_text::ToFile(settings, temporary.sz())) {
+    KeepModeAndOwner(old, file.Get());
+    if (!file.IsHeld() || !json_text::ToFile(settings, file.Get())) {
         ZELO_LOG("Failed to write usersettins [%s] to [%s]", json_text::ToLogText(settings).c_str(),
                  temporary.sz());
         return false;

@@ -89,8 +89,7 @@ inline Names Members() {
 }
 
 // Exchanges the record's list for a new one, and has the old one released, as any caller does.
-inline int SetMembers(const Names &members) {
-    const Group pGroup = Administrators();
+inline int SetMembers(const Names &members, const Group &pGroup = Administrators()) {
     const Group pOld(new ZELO_GROUP(), ZELOGroupFree);
     pOld->ppszMembers = static_cast<char **>(std::calloc(members.size() + 1, sizeof(char *)));
     for (std::size_t i = 0; i < members.size(); ++i) {

@@ -5,6 +5,7 @@
 
 #include <sys/stat.h>
 
+#include <cstdio>
 #include <fstream>
 #include <iterator>
 #include <string>
@@ -41,6 +42,19 @@ inline std::vector<std::string> FileLines(const std::string &strPath) {
 inline unsigned FileMode(const std::string &strPath) {
     struct stat status = {};
     return stat(strPath.c_str(), &status) == 0 ? status.st_mode & 07777U : 0;
+}
+
+// Puts something of another user's at the path, below "/tmp": a "file" that everybody may write to,
+// or a "link" to "/tmp/target". False where none is left, or never was: tests/in_box makes them as
+// root.
+inline bool PutStrangers(const std::string &strKind, const std::string &strPath) {
+    for (int i = 1; i <= 8; ++i) {
+        const std::string strKept = "/tmp/strangers/" + strKind + std::to_string(i);
+        if (std::rename(strKept.c_str(), strPath.c_str()) == 0) {
+            return true;
+        }
+    }
+    return false;
 }
 
 inline bool Holds(const std::string &strText, const std::string &strPart) {

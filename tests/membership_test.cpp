@@ -3,12 +3,14 @@
 
 #include <algorithm>
 #include <fstream>
+#include <map>
 
 #include "children.h"
 #include "indicators.h"
 #include "joined.h"
 #include "json_text.h"
 #include "last_error.h"
+#include "membership.h"
 #include "membership_state.h"
 #include "service.h"
 #include "torture.h"
@@ -350,6 +352,30 @@ TEST_F(Membership, LeavingGoesOnFromWhereAnyStepFailed) {
          LeaveState, kDone, LeaveSteps(false)});
 }
 
+// A look-up that fails once may tell the library that nothing is there.
+TEST_F(Membership, TheToolSaysThatItHasLeftOnlyWhereNothingIsLeft) {
+    bool blLeft = false;
+    const auto leave = [&](const seam::Fault &fault) {
+        BuildWhole();
+        return seam::Observe(fault, [&] { blLeft = qrmctl::LeaveWholly({}); }).calls;
+    };
+    const std::vector<std::string> calls = leave({});
+    EXPECT_TRUE(blLeft);
+    EXPECT_EQ(membership::Remains(), "");
+    std::map<std::string, int> counts;
+    for (const std::string &strCall : calls) {
+        ++counts[strCall];
+    }
+    for (const char *szLookUp : {"ZELOCredIDGetByApplication", "ZeloCgiInit", "ZELOUserGet"}) {
+        EXPECT_GT(counts[szLookUp], 0);
+        for (int nth = 1; nth <= counts[szLookUp]; ++nth) {
+            leave({szLookUp, nth});
+            EXPECT_TRUE(!blLeft || membership::Remains().empty())
+                << szLookUp << ' ' << nth << ": " << membership::Remains();
+        }
+    }
+}
+
 TEST_F(Membership, LeavingToJoinAgainKeepsRightsAndQuiet) {
     const std::string strTold = std::string(" |") + kPre + kLeft + " notified=0";
     const std::string strFailed = std::string(" |") + kPre + kFailed + " notified=0";
@@ -473,7 +499,7 @@ TEST_F(Membership, CreatingTheAccountSurvivesEveryFailingCall) {
         {"ZELOUserPreferenceDirGet('ZelonixQRM', buf, 4096)",
          {"1", std::string("Get preference dir failed. [ZelonixQRM] [E]\n") + szNotHidden,
           "account member folder"}},
-        {"access('" + strSettings + "', 4)\nunlink('" + strTemporary + "')", done},
+        {"access('" + strSettings + "', 4)", done},
         {"rename('" + strTemporary + "', '" + strSettings + "')",
          {"1",
           "Failed to rename [" + strTemporary + "] -> [" + strSettings +
@@ -537,6 +563,15 @@ TEST_F(Membership, AnAccountThatThePlatformStillFindsIsNotDeleted) {
                          [] { EXPECT_FALSE(ZELOQRMClientDeleteServerUser()); }),
               "User delete fail");
     EXPECT_EQ(membership::Remains(), "folder");
+
+    membership::Clear(s_with);
+    std::filesystem::rename("/etc/passwd", "/etc/passwd.kept");
+    std::filesystem::create_directory("/etc/passwd");
+    EXPECT_EQ(MessagesOf([] { EXPECT_FALSE(ZELOQRMClientDeleteServerUser()); }),
+              "ZELOUserDelete fail[400]");
+    std::filesystem::remove("/etc/passwd");
+    std::filesystem::rename("/etc/passwd.kept", "/etc/passwd");
+    EXPECT_EQ(membership::Remains(), "account member");
 }
 
 TEST_F(Membership, TheMemberListIsRebuiltWithTheAccountAtItsEnd) {
@@ -623,6 +658,11 @@ TEST_F(Membership, SettingsOfAnyKindKeepTheirOtherMembers) {
         EXPECT_TRUE(FileText(kSettings) == row.strAfter) << FileText(kSettings).substr(0, 200);
     }
     EXPECT_FALSE(ZELOQRMUserWelcomPage(nullptr, false));
+    for (const mode_t mode : {0600U, 0646U}) {
+        chmod(kSettings, mode);
+        EXPECT_TRUE(ZELOQRMUserWelcomPage(kUser, false));
+        EXPECT_EQ(files::FileMode(kSettings), mode);
+    }
 
     // A folder in the way of either name, and a link that somebody has left for the program to
     // write through.
@@ -630,7 +670,11 @@ TEST_F(Membership, SettingsOfAnyKindKeepTheirOtherMembers) {
     std::ofstream("/tmp/target") << "kept";
     std::filesystem::create_symlink("/tmp/target", strTemporary);
     EXPECT_TRUE(ZELOQRMUserWelcomPage(kUser, false));
-    EXPECT_EQ(FileText("/tmp/target"), "kept");
+    const std::string strOther = std::string(membership::kPreference) + "/other";
+    std::ofstream(strOther) << "kept";
+    std::filesystem::create_hard_link(strOther, strTemporary);
+    EXPECT_TRUE(ZELOQRMUserWelcomPage(kUser, false));
+    EXPECT_EQ(FileText(strOther), "kept");
     std::filesystem::create_directories(strTemporary + "/x");
     const auto hide = [] { EXPECT_FALSE(ZELOQRMUserWelcomPage(kUser, false)); };
     EXPECT_EQ(MessagesOf(hide).substr(0, 30), "Failed to write usersettins [{");
@@ -640,6 +684,35 @@ TEST_F(Membership, SettingsOfAnyKindKeepTheirOtherMembers) {
     EXPECT_EQ(MessagesOf(hide),
               "Failed to rename [" + strTemporary + "] -> [" + kSettings + "] Is a directory");
     EXPECT_TRUE(std::filesystem::exists(strTemporary)) << "the new settings stay for a look";
+    std::filesystem::remove(kSettings);
+    EXPECT_TRUE(ZELOQRMUserWelcomPage(kUser, true)) << "and keep nobody waiting";
+    EXPECT_FALSE(std::filesystem::exists(strTemporary));
+}
+
+TEST_F(Membership, OverlappingChangesOfOneUsersSettingsLoseNothing) {
+    constexpr int kCalls = 150;
+    std::string strMembers;
+    for (int i = 0; i < 2000; ++i) {
+        strMembers += (i == 0 ? "\"m" : ",\"m") + std::to_string(i) + "\":" + std::to_string(i);
+    }
+    accounts::WriteFiles(s_with);
+    std::filesystem::create_directories(membership::kPreference);
+    files::WriteFile(kSettings, '{' + strMembers + '}');
+    std::string strContents[2];
+    for (const bool blShow : {false, true}) {
+        ASSERT_TRUE(ZELOQRMUserWelcomPage(kUser, blShow));
+        strContents[blShow ? 1 : 0] = FileText(kSettings);
+    }
+    EXPECT_TRUE(children::InEach(4, [&](int process) {
+        bool blAll = true;
+        for (int i = 0; blAll && i < kCalls; ++i) {
+            const std::string strContent = FileText(kSettings);
+            blAll = (strContent == strContents[0] || strContent == strContents[1]) &&
+                    (process == 0 || ZELOQRMUserWelcomPage(kUser, process == 1));
+        }
+        return blAll;
+    }));
+    EXPECT_FALSE(std::filesystem::exists(std::string(kSettings) + ".tmp"));
 }
 
 }  // namespace

@@ -98,8 +98,7 @@ TEST_F(SendWebapi, TheFailurePathNotifiesHoweverItsOwnCallsFail) {
          told,
          {{"ZELOCredIDGetByApplication('ZELO.QRM')", told},
           {"YLIBCFileStat('/tmp/qrmclientconnectfailed', 1, *)", told},
-          {"YLIBCExec('/bin/touch', '/tmp/qrmclientconnectfailed', null, null, null)",
-           {"-1", told.strLog, "status= marker=no notified=1"}},
+          {"YLIBCExec('/bin/touch', '/tmp/qrmclientconnectfailed', null, null, null)", told},
           {"YLIBCSzHashAlloc(512)",
            {"-1", strAbsent + "qrm_send_notificatioin Failed to YLIBCSzHashAlloc[E]", szUntold}},
           {"ZELOCredListGet(*, *, 'ZELO.QRM')\n"
@@ -196,40 +195,66 @@ TEST_F(SendWebapi, NamesWithControlCharactersStayOnTheirLine) {
 
 TEST_F(SendWebapi, UsersAreToldAgainAfterTwoHoursAndAtOnceAfterAReply) {
     constexpr long kNow = 2'000'000'000;
-    constexpr const char *kTarget = "/tmp/target";
-    const auto file = [](const char *szPath) { return [szPath] { WriteFile(szPath, ""); }; };
-    const struct {
-        std::function<void()> mark;
-        long age;
-        bool blTold;
-        bool blKept;                    // the time of
-        const char *szTimed = kMarker;  // this file
-    } rows[] = {
-        {file(kMarker), 0, false, true},
-        {file(kMarker), 7200, false, true},
-        {file(kMarker), 7201, true, false},
-        {file(kMarker), -7200, false, true},
-        {file(kMarker), -7201, true, false},
-        // A folder that somebody put there counts by its time too, and not at each call.
-        {[] { std::filesystem::create_directory(kMarker); }, 0, false, true},
-        // A link is not followed: the file that it leads to keeps its time.
-        {[&] { file(kTarget)(), std::filesystem::create_symlink(kTarget, kMarker); }, 0, true, true,
-         kTarget},
-    };
-    for (const auto &row : rows) {
-        SCOPED_TRACE(&row - rows);
+    for (const long age : {0, 7200, 7201, -7200, -7201}) {
+        SCOPED_TRACE(age);
+        const bool blTold = std::abs(age) > 7200;
         Reset();
         ZELOQRMClientDeleteServerCredential();
-        row.mark();
-        const timespec times[] = {{kNow - row.age, 0}, {kNow - row.age, 0}};
+        WriteFile(kMarker, "");
+        const timespec times[] = {{kNow - age, 0}, {kNow - age, 0}};
         utimensat(AT_FDCWD, kMarker, times, 0);
         seam::Observe({"time", 1, true, kNow}, [] { EXPECT_EQ(Call(), "-1"); });
         EXPECT_EQ(State(),
-                  row.blTold ? "status= marker=yes notified=1" : "status= marker=yes notified=0");
+                  blTold ? "status= marker=yes notified=1" : "status= marker=yes notified=0");
         struct stat status = {};
-        stat(row.szTimed, &status);
-        EXPECT_EQ(status.st_mtime == kNow - row.age, row.blKept);
+        stat(kMarker, &status);
+        EXPECT_EQ(status.st_mtime == kNow - age, !blTold);
     }
+}
+
+TEST_F(SendWebapi, WhatOthersPutInTheMarkersPlaceNeitherSilencesNorMisleadsIt) {
+    constexpr const char *kTarget = "/tmp/target";
+    const std::function<bool()> rows[] = {
+        [] { return symlink(kTarget, kMarker) == 0; },
+        [] { return symlink("/tmp/absent", kMarker) == 0; },
+        [] { return link(kTarget, kMarker) == 0; },
+        [] { return mkfifo(kMarker, 0666) == 0; },
+        [] { return std::filesystem::create_directory(kMarker); },
+        [] { return std::filesystem::create_directories(std::string(kMarker) + "/full"); },
+        [] { return files::PutStrangers("link", kMarker); },
+        [] { return files::PutStrangers("file", kMarker); }};
+    for (const auto &put : rows) {
+        // It stands there when the marker is looked at, or comes right afterwards.
+        for (const char *szLook : {"", "YLIBCFileStat"}) {
+            SCOPED_TRACE(&put - rows);
+            Reset();
+            ZELOQRMClientDeleteServerCredential();
+            std::filesystem::remove(kTarget);
+            WriteFile(kTarget, "");
+            const timespec times[] = {{1000, 0}, {1000, 0}};
+            utimensat(AT_FDCWD, kTarget, times, 0);
+            if (!put()) {
+                continue;  // there is no other user here
+            }
+            seam::Observe({szLook, 1, true, -1}, [] { EXPECT_EQ(Call(), "-1"); });
+            EXPECT_EQ(State(), "status= marker=yes notified=1");
+            struct stat status = {};
+            EXPECT_EQ(lstat(kMarker, &status), 0);
+            EXPECT_TRUE(S_ISREG(status.st_mode) && status.st_uid == geteuid());
+            EXPECT_EQ(stat(kTarget, &status), 0);
+            EXPECT_EQ(status.st_mtime, 1000);
+            EXPECT_FALSE(std::filesystem::exists("/tmp/absent"));
+        }
+    }
+
+    // Where others can rename what is ours, nothing is touched by its name.
+    chmod("/tmp", 0777);
+    Reset();
+    ZELOQRMClientDeleteServerCredential();
+    const seam::Outcome outcome = seam::Observe([] { EXPECT_EQ(Call(), "-1"); });
+    chmod("/tmp", 01777);
+    EXPECT_EQ(State(), "status= marker=yes notified=1");
+    EXPECT_EQ(std::count(outcome.calls.begin(), outcome.calls.end(), "YLIBCExec"), 0);
 }
 
 TEST_F(SendWebapi, TheCacheIsUsedOnlyWhenAskedFor) {
@@ -512,6 +537,59 @@ TEST_F(SendWebapi, ADownloadTellsTheCopyThatItHas) {
         std::filesystem::current_path("/");
     }
     EXPECT_TRUE(std::filesystem::is_directory("/tmp/got/a"));
+}
+
+TEST_F(SendWebapi, ADownloadGoesThroughNobodysTrap) {
+    constexpr const char *kTarget = "/tmp/target";
+    constexpr const char *kShared = "/tmp/shared";
+    constexpr const char *kLink = "/tmp/shared/link";
+    const auto own = [] { return symlink(kTarget, kLink) == 0; };
+    const auto strangers = [] { return files::PutStrangers("link", kLink); };
+    const struct {
+        mode_t mode;
+        std::function<bool()> put;
+        const char *szPath;
+        const char *szResult;
+    } rows[] = {
+        {01777, own, kLink, "0"},
+        {0777, own, kLink, "0"},
+        {0755, strangers, kLink, "0"},
+        {01777, strangers, kLink, "-1"},
+        {0777, strangers, kLink, "-1"},
+        {01777, strangers, "/tmp/leads-there", "-1"},
+        {01777, strangers, "/tmp/shared/link/deeper/file", "-1"},
+        {0777, [] { return files::PutStrangers("file", kTarget); }, kTarget, "0"},
+        {0777, [] { return true; }, "/tmp/shared/new", "0"},
+        {01777, [] { return true; }, "/tmp/shared/new", "0"},
+    };
+    std::filesystem::create_symlink(kLink, "/tmp/leads-there");
+    for (const auto &row : rows) {
+        SCOPED_TRACE(&row - rows);
+        const std::string strPath = row.szPath;
+        std::filesystem::remove_all(kTarget);
+        std::filesystem::remove_all(kShared);
+        std::filesystem::create_directory(kShared);
+        chmod(kShared, row.mode);
+        const bool blFolder = files::Holds(strPath, "deeper");
+        blFolder ? static_cast<void>(std::filesystem::create_directory(kTarget))
+                 : WriteFile(kTarget, "kept");
+        if (!row.put()) {
+            continue;  // there is no other user here
+        }
+        EXPECT_EQ(Download(row.szPath), row.szResult);
+        const bool blFetched = row.szResult[0] == '0';
+        if (blFolder) {
+            EXPECT_TRUE(std::filesystem::is_empty(kTarget));
+        } else {
+            EXPECT_EQ(FileText(blFetched ? row.szPath : kTarget).size(), blFetched ? 100'000U : 4U);
+        }
+    }
+
+    mkfifo("/tmp/fifo", 0600);
+    const pid_t reader = children::Start([] { return FileText("/tmp/fifo").size() == 100'000; });
+    EXPECT_EQ(Download("/tmp/fifo"), "0");
+    EXPECT_TRUE(children::Ended(reader));
+    EXPECT_EQ(Download("/dev/null"), "0");
 }
 
 TEST_F(SendWebapi, AnErrorPageIsNoFile) {

@@ -4,15 +4,36 @@
 #include <gtest/gtest.h>
 #include <sys/resource.h>
 
+#include <algorithm>
 #include <atomic>
+#include <ctime>
 #include <filesystem>
 #include <fstream>
+#include <functional>
 #include <thread>
 
 #include "accounts.h"
 #include "children.h"
 #include "key_value_file.h"
 #include "last_error.h"
+
+namespace {
+
+// What the clock shows; 0: the machine's.
+std::time_t g_now = 0;
+
+}  // namespace
+
+// Takes the C library's place, for the platform too.
+std::time_t time(std::time_t *pTime) noexcept {
+    timespec now = {};
+    clock_gettime(CLOCK_REALTIME, &now);
+    const std::time_t shown = g_now == 0 ? now.tv_sec : g_now;
+    if (pTime != nullptr) {
+        *pTime = shown;
+    }
+    return shown;
+}
 
 namespace {
 
@@ -136,6 +157,73 @@ TEST_F(UserGroup, OnlyMembersAreAdministrators) {
     for (const char *szBad : {"", "a,b", "a:b", "a\nb"}) {
         EXPECT_LT(SetMembers({"nobody", szBad}), 0);
         EXPECT_EQ(Members(), Names({"ghost"}));
+    }
+}
+
+TEST_F(UserGroup, OnlyTheDifferenceToWhatWasReadIsWritten) {
+    const struct {
+        Names now;  // what others have made of {a, b, c} since it was read
+        Names set;
+        Names after;
+    } rows[] = {
+        {{"a", "b", "c"}, {"c", "x", "a"}, {"c", "x", "a"}},
+        {{"a", "b", "c", "new"}, {"a", "b", "c", "x"}, {"a", "b", "c", "new", "x"}},
+        {{"b", "c"}, {"a", "b", "c", "x"}, {"b", "c", "x"}},
+        {{"a", "b", "c", "new"}, {"a"}, {"a", "new"}},
+        {{"x"}, {"a", "b", "c", "x"}, {"x"}},
+        {{"new"}, {"a", "b", "c"}, {"new"}},
+    };
+    for (const auto &row : rows) {
+        EXPECT_EQ(SetMembers({"a", "b", "c"}), 0);
+        const Group pGroup = Administrators();
+        EXPECT_EQ(SetMembers(row.now), 0);
+        EXPECT_EQ(SetMembers(row.set, pGroup), 0);
+        EXPECT_EQ(Members(), row.after);
+        EXPECT_EQ(SetMembers({"a", "b", "c"}, pGroup), 0);
+        EXPECT_EQ(SetMembers(row.set, pGroup), 0) << "what was set counts as read";
+        const Names again = Members();
+        EXPECT_TRUE(
+            std::is_permutation(row.after.begin(), row.after.end(), again.begin(), again.end()));
+    }
+    const Group pOwn(new ZELO_GROUP(), ZELOGroupFree);
+    EXPECT_EQ(SetMembers({"b"}, pOwn), 0);
+    EXPECT_EQ(Members(), Names({"b"}));
+}
+
+TEST_F(UserGroup, WhatCannotBeReadIsNotTakenForMissing) {
+    ASSERT_EQ(Add(NewUser(kName, 50000)), 0);
+    const std::function<int()> lookUps[] = {
+        [] { return Get(kName) == nullptr ? -1 : 0; },
+        [] { return Administrators() == nullptr ? -1 : 0; },
+        [] { return YLIBGroupIsAdminGroupMem(kName, 0); },
+        [] { return YLIBGroupExtraAdminSet("QRM", 0, 0, 0, 0); }};
+    for (const char *szFile : {"/etc/passwd", "/etc/group", kConfig}) {
+        const std::string strKept = std::string(szFile) + ".kept";
+        fs::rename(szFile, strKept);
+        for (const bool blFolder : {true, false}) {
+            int failed = 0;
+            blFolder ? fs::create_directory(szFile) : fs::remove(szFile);
+            for (const auto &lookUp : lookUps) {
+                YLIBCErrSetEx(YLIBC_ERR_NOT_FOUND, "", 0);
+                failed += lookUp() < 0 && YLIBCErrGet() == YLIBC_ERR_FILE ? 1 : 0;
+            }
+            // Of a setting that the missing file does not hold there is nothing to clear.
+            EXPECT_EQ(failed, szFile == kConfig ? blFolder : 2) << szFile;
+        }
+        fs::rename(strKept, szFile);
+    }
+    EXPECT_EQ(Get("nosuchuser"), nullptr);
+    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_NOT_FOUND));
+}
+
+TEST_F(UserGroup, APasswordThatIsSetWithoutAClockNeedNotBeChanged) {
+    for (const std::time_t now : {5L, 86'400L * 20'000}) {
+        g_now = now;
+        EXPECT_EQ(Add(NewUser(kName, 50000)), 0);
+        g_now = 0;
+        const std::string strLine = PasswordIn("shadow", kName) + (now == 5 ? "::" : ":20000:");
+        EXPECT_TRUE(files::Holds(ReadFiles()["shadow"], ':' + strLine));
+        EXPECT_EQ(Delete({kName}), 0);
     }
 }
 

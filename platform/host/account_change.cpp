@@ -135,6 +135,13 @@ bool PutPasswd(const ZELO_USER &user, const char *szPassword, PasswdFile &passwd
     return passwd.Put(entry, passwd.Find(user.szName));
 }
 
+// The day of a change, -1 for an empty field where the clock has not been set: day 0 would mean
+// that the password has to be changed before it lets anybody in.
+long Today() {
+    const long day = static_cast<long>(std::time(nullptr)) / kSecondsPerDay;
+    return day > 0 ? day : -1;
+}
+
 // The line that an earlier user of the same name has left behind gives a new one nothing.
 bool PutShadow(const ZELO_USER &user, bool blNew, const char *szPassword, ShadowFile &shadow) {
     const spwd *const pPlace = shadow.Find(user.szName);
@@ -147,7 +154,7 @@ bool PutShadow(const ZELO_USER &user, bool blNew, const char *szPassword, Shadow
         entry.sp_flag = ~0UL;
     }
     if (blNew || user.szPassword[0] != '\0') {
-        entry.sp_lstchg = static_cast<long>(std::time(nullptr)) / kSecondsPerDay;
+        entry.sp_lstchg = Today();
     }
     entry.sp_pwdp = Text(szPassword);
     entry.sp_expire = user.nExpireDay < 0 ? -1 : user.nExpireDay;
@@ -219,7 +226,38 @@ void RemoveDirectories(const Names &names, const Names &homes, const PasswdFile 
     }
 }
 
+// --- Members of a group -------------------------------------------------------------------------
+
+bool Holds(const Names &names, const std::string &strName) {
+    return std::find(names.begin(), names.end(), strName) != names.end();
+}
+
+// What the list becomes when it has changed since it was got: those who were added come to its end,
+// those who were taken off go, and what others have changed meanwhile stays.
+Names Merged(const Names &now, const Names &got, const Names &wanted) {
+    if (now == got) {
+        return wanted;
+    }
+    Names merged;
+    for (const std::string &strName : now) {
+        if (Holds(wanted, strName) || !Holds(got, strName)) {
+            merged.push_back(strName);
+        }
+    }
+    for (const std::string &strName : wanted) {
+        if (!Holds(got, strName) && !Holds(merged, strName)) {
+            merged.push_back(strName);
+        }
+    }
+    return merged;
+}
+
 }  // namespace
+
+Names ListNames(char **ppszList) {
+    const std::vector<char *> texts = ListTexts(ppszList);
+    return Names(texts.begin(), texts.end());
+}
 
 bool LetsIn(const std::string &strPassword) {
     return strPassword.empty() || (strPassword[0] != kLockMark && strPassword[0] != kNoHashMark);
@@ -320,7 +358,7 @@ bool DeleteUsers(const Names &names) {
     return true;
 }
 
-bool StoreMembers(const std::string &strGroup, char **ppszMembers) {
+bool StoreMembers(const std::string &strGroup, const Names *pGot, const Names &wanted) {
     const AccountLock lock;
     GroupFile group;
     GroupShadowFile groupShadow;
@@ -331,8 +369,15 @@ bool StoreMembers(const std::string &strGroup, char **ppszMembers) {
     if (pPlace == nullptr) {
         return REFUSE(YLIBC_ERR_NOT_FOUND);
     }
+    const Names members =
+        pGot == nullptr ? wanted : Merged(ListNames(pPlace->gr_mem), *pGot, wanted);
+    std::vector<char *> list;
+    for (const std::string &strName : members) {
+        list.push_back(Text(strName.c_str()));
+    }
+    list.push_back(nullptr);
     struct group entry = *pPlace;
-    entry.gr_mem = ppszMembers;
+    entry.gr_mem = list.data();
     if (!groupShadow.Exists()) {
         return group.Put(entry, pPlace) && WriteInOrder(group);
     }
@@ -346,7 +391,7 @@ bool StoreMembers(const std::string &strGroup, char **ppszMembers) {
     if (pShadow != nullptr) {
         shadowEntry = *pShadow;
     }
-    shadowEntry.sg_mem = ppszMembers;
+    shadowEntry.sg_mem = list.data();
     entry.gr_passwd = Text(kInShadow);
     return groupShadow.Put(shadowEntry, pShadow) && group.Put(entry, pPlace) &&
            WriteInOrder(groupShadow, group);

@@ -41,8 +41,14 @@ bool StoreUser(const char *szCurrentName, const ZELO_USER &user);
 // Deletes the users, all of them or none, with the directories that go with them.
 bool DeleteUsers(const std::vector<std::string> &names);
 
-// Makes the names of a list, which ends with a null, the members of a group.
-bool StoreMembers(const std::string &strGroup, char **ppszMembers);
+// The names of a list that ends with a null.
+std::vector<std::string> ListNames(char **ppszList);
+
+// Makes the wanted names the members of a group. Where pGot says which ones there were when the
+// caller read them, it changes what differs between the two and leaves what others have changed
+// since.
+bool StoreMembers(const std::string &strGroup, const std::vector<std::string> *pGot,
+                  const std::vector<std::string> &wanted);
 
 }  // namespace host
 

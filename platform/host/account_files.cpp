@@ -74,7 +74,7 @@ template <typename Format>
 bool AccountFile<Format>::Read() {
     switch (FindFile(Format::kPath, m_found)) {
         case Find::kNoFile:
-            return true;
+            return !Format::kRequired || HOST_FAIL(YLIBC_ERR_FILE) == 0;
         case Find::kFailed:
             return false;
         case Find::kFile:

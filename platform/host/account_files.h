@@ -23,6 +23,7 @@ namespace host {
 struct PasswdFormat {
     using Entry = passwd;
     static constexpr const char *kPath = "/etc/passwd";
+    static constexpr bool kRequired = true;
     static constexpr auto kRead = fgetpwent_r;
     static constexpr auto kWrite = putpwent;
     static constexpr auto kName = &passwd::pw_name;
@@ -31,6 +32,7 @@ struct PasswdFormat {
 struct ShadowFormat {
     using Entry = spwd;
     static constexpr const char *kPath = "/etc/shadow";
+    static constexpr bool kRequired = false;
     static constexpr auto kRead = fgetspent_r;
     static constexpr auto kWrite = putspent;
     static constexpr auto kName = &spwd::sp_namp;
@@ -39,6 +41,7 @@ struct ShadowFormat {
 struct GroupFormat {
     using Entry = group;
     static constexpr const char *kPath = "/etc/group";
+    static constexpr bool kRequired = true;
     static constexpr auto kRead = fgetgrent_r;
     static constexpr auto kWrite = putgrent;
     static constexpr auto kName = &group::gr_name;
@@ -47,6 +50,7 @@ struct GroupFormat {
 struct GroupShadowFormat {
     using Entry = sgrp;
     static constexpr const char *kPath = "/etc/gshadow";
+    static constexpr bool kRequired = false;
     static constexpr auto kRead = fgetsgent_r;
     static constexpr auto kWrite = putsgent;
     static constexpr auto kName = &sgrp::sg_namp;
@@ -68,7 +72,8 @@ class AccountFile {
   public:
     using Entry = typename Format::Entry;
 
-    // Reads the file. One that is not there has no entries and does not exist.
+    // Reads the file. A shadow file that is not there has no entries and does not exist; without
+    // one of the other two nobody can say which accounts there are.
     bool Read();
     bool Exists() const { return m_found.file.IsOpen(); }
 

@@ -31,18 +31,36 @@ bool SetOwnerAndMode(int fd, const Owner &owner, mode_t mode) {
     return fchmod(fd, mode) == 0;
 }
 
+// Whether it is a link that somebody else has put into a folder that everybody can write to: it may
+// lead into a folder of the caller's.
+bool IsForeignLink(int parent, const char *szName) {
+    struct stat folder = {};
+    struct stat entry = {};
+    return fstatat(parent, szName, &entry, AT_SYMLINK_NOFOLLOW) == 0 && S_ISLNK(entry.st_mode) &&
+           (fstat(parent, &folder) != 0 ||
+            ((folder.st_mode & S_IWOTH) != 0 && entry.st_uid != geteuid() &&
+             entry.st_uid != folder.st_uid));
+}
+
 // Opens a directory in the parent, creating it when there is nothing of that name.
 host::FileDescriptor OpenDirectory(int parent, const char *szName, const Owner &owner,
                                    mode_t mode) {
     constexpr int kLook = O_PATH | O_DIRECTORY | O_CLOEXEC;
     constexpr int kChange = O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC;
-    host::FileDescriptor found(openat(parent, szName, kLook));
-    if (found.IsOpen() || errno != ENOENT) {
-        return found;
+    host::FileDescriptor entry(openat(parent, szName, kLook | O_NOFOLLOW));
+    if (entry.IsOpen()) {
+        return entry;
+    }
+    if (errno == ENOTDIR && !IsForeignLink(parent, szName)) {
+        return host::FileDescriptor(openat(parent, szName, kLook));
+    }
+    if (errno != ENOENT) {
+        return entry;
     }
     if (mkdirat(parent, szName, mode) != 0) {
         // Another process may have been quicker.
-        return host::FileDescriptor(errno == EEXIST ? openat(parent, szName, kLook) : -1);
+        return host::FileDescriptor(errno == EEXIST ? openat(parent, szName, kLook | O_NOFOLLOW)
+                                                    : -1);
     }
     host::FileDescriptor created(openat(parent, szName, kChange));
     if (created.IsOpen() && !SetOwnerAndMode(created.Get(), owner, mode)) {

@@ -72,12 +72,20 @@ int FillUser(const host::UserFiles &files, const struct passwd &entry, ZELO_USER
     return 0;
 }
 
+// What a record keeps of its group: the members as the store had them when they were read, or when
+// they were last set.
+struct GotGroup {
+    std::string strName;
+    std::vector<std::string> members;
+};
+
 int FillGroup(const struct group &entry, ZELO_GROUP *pGroup) {
     if (!SetText(pGroup->szName, entry.gr_name)) {
         return HOST_FAIL(YLIBC_ERR_FILE);
     }
     pGroup->gid = entry.gr_gid;
     const std::vector<char *> members = host::ListTexts(entry.gr_mem);
+    pGroup->pPort = new GotGroup{entry.gr_name, host::ListNames(entry.gr_mem)};
     pGroup->ppszMembers = static_cast<char **>(std::calloc(members.size() + 1, sizeof(char *)));
     if (pGroup->ppszMembers == nullptr) {
         return HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
@@ -151,6 +159,7 @@ void ZELOGroupFree(ZELO_GROUP *pGroup) {
         std::free(*ppsz);
     }
     std::free(pGroup->ppszMembers);
+    delete static_cast<GotGroup *>(pGroup->pPort);
     delete pGroup;
 }
 
@@ -292,7 +301,18 @@ int ZELOGroupSet(const char *szName, const ZELO_GROUP *pGroup) {
             return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
         }
     }
-    return NoThrow([&] { return host::StoreMembers(szName, ppszMembers) ? 0 : -1; });
+    return NoThrow([&] {
+        std::vector<std::string> members = host::ListNames(ppszMembers);
+        auto *const pGot = static_cast<GotGroup *>(pGroup->pPort);
+        const bool blSame = pGot != nullptr && pGot->strName == szName;
+        if (!host::StoreMembers(szName, blSame ? &pGot->members : nullptr, members)) {
+            return -1;
+        }
+        if (blSame) {
+            pGot->members.swap(members);
+        }
+        return 0;
+    });
 }
 
 int YLIBGroupIsAdminGroupMem(const char *szName, int /*flags*/) {
@@ -326,9 +346,9 @@ int YLIBGroupExtraAdminSet(const char *szName, int n1, int n2, int n3, int n4) {
         const std::string strKey = kExtraAdminKey + std::string(szName);
         std::string strValue;
         const bool blClear = n1 == 0 && n2 == 0 && n3 == 0 && n4 == 0;
-        const bool blFound =
-            host::LookUpKey(host::kConfigFile, strKey.c_str(), strValue) == host::LookUp::kFound;
-        if (blClear && (!blFound || strValue.empty())) {
+        const host::LookUp found = host::LookUpKey(host::kConfigFile, strKey.c_str(), strValue);
+        if (blClear && (found == host::LookUp::kAbsent ||
+                        (found == host::LookUp::kFound && strValue.empty()))) {
             return 0;
         }
         strValue.clear();

@@ -1,0 +1,89 @@
+#include "locked_file.h"
+
+#include <fcntl.h>
+#include <sys/file.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <thread>
+
+namespace {
+
+using Clock = std::chrono::steady_clock;
+
+constexpr std::chrono::milliseconds kPause{1};
+
+// The kernel's own wait cannot be given a limit without signals, which are the program's.
+bool Lock(int fd, Clock::time_point end) {
+    while (flock(fd, LOCK_EX | LOCK_NB) != 0) {
+        if ((errno != EWOULDBLOCK && errno != EINTR) || Clock::now() >= end) {
+            return false;
+        }
+        std::this_thread::sleep_for(kPause);
+    }
+    return true;
+}
+
+bool LeadsTo(const char *szPath, const struct stat &opened) {
+    struct stat named = {};
+    return lstat(szPath, &named) == 0 && named.st_ino == opened.st_ino &&
+           named.st_dev == opened.st_dev;
+}
+
+}  // namespace
+
+bool IsOwnFile(const struct stat &status) {
+    return S_ISREG(status.st_mode) && status.st_nlink == 1 && status.st_uid == geteuid();
+}
+
+LockedFile::LockedFile(const char *szPath, std::optional<mode_t> mode,
+                       std::chrono::milliseconds wait) {
+    const Clock::time_point end = Clock::now() + wait;
+    Try result = Try::kAgain;
+    do {
+        result = Open(szPath, mode, end);
+        if (result != Try::kHeld) {
+            Close();
+        }
+    } while (result == Try::kAgain && Clock::now() < end);
+}
+
+LockedFile::~LockedFile() {
+    Close();
+}
+
+LockedFile::Try LockedFile::Open(const char *szPath, std::optional<mode_t> mode,
+                                 Clock::time_point end) {
+    constexpr int kFlags = O_RDWR | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC;
+    m_fd = open(szPath, kFlags);
+    if (m_fd < 0 && errno == ENOENT && mode) {
+        // With O_CREAT alone, the kernel may refuse what somebody else has put there.
+        m_fd = open(szPath, kFlags | O_CREAT | O_EXCL, *mode);
+        if (m_fd < 0 && errno == EEXIST) {
+            return Try::kAgain;
+        }
+    }
+    if (m_fd < 0) {
+        // A link or a socket.
+        const bool blInTheWay = errno == ELOOP || errno == ENXIO;
+        return blInTheWay && unlink(szPath) == 0 ? Try::kAgain : Try::kFailed;
+    }
+    struct stat status = {};
+    if (!Lock(m_fd, end) || fstat(m_fd, &status) != 0) {
+        return Try::kFailed;
+    }
+    if (!LeadsTo(szPath, status)) {
+        return Try::kAgain;
+    }
+    // Somebody else's process, if one took a turn by this file, has ended it.
+    return IsOwnFile(status) ? Try::kHeld : unlink(szPath) == 0 ? Try::kAgain : Try::kFailed;
+}
+
+void LockedFile::Close() {
+    if (m_fd >= 0) {
+        // A child process that was forked meanwhile has a copy of the descriptor.
+        flock(m_fd, LOCK_UN);
+        close(m_fd);
+        m_fd = -1;
+    }
+}
