@@ -55,7 +55,13 @@ TEST(CredentialStore, LooksAreNotWrites) {
     EXPECT_EQ(ZELOCredListGet(&pList, ZELOCredKeepByApplication, "ZELO.QRM"), 0);
     EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_NONE)) << "nothing has failed";
     EXPECT_FALSE(fs::exists(stored::kFolder));
+    YLIBSZLIST *pslPaths = YLIBCSzListAlloc(0);
+    EXPECT_EQ(ZELOCredStoreListSetAside(&pslPaths), 0);
+    WriteFile(stored::kFolder, "a file in the folder's place");
+    EXPECT_LT(ZELOCredStoreListSetAside(&pslPaths), 0);
+    YLIBCSzListFree(pslPaths);
 
+    RemoveStore();
     stored::AddCredential("ZELO.QRM", "a");
     EXPECT_EQ(FileMode(stored::kFolder), 0700U);
     EXPECT_EQ(FileMode(stored::kDatabase), 0600U);
