@@ -52,6 +52,10 @@ Check StoreUnreadable() {
             return {"credential", Outcome::kFailed, 0,
                     "another program keeps the credential store locked",
                     "wait for that program, or find and end it; then try again"};
+        case YLIBC_ERR_UNSAFE_FILE:
+            return {"credential", Outcome::kFailed, 0,
+                    "the credential store, or its folder, belongs to another user",
+                    "look what it holds, and make it root's; -v names it"};
         default:
             return {"credential", Outcome::kFailed, 0, "the credential store cannot be read",
                     "run this as root; -v shows the reason"};

@@ -65,6 +65,8 @@ const std::vector<ErrorEntry> &AllErrors() {
          "this appliance is not joined: there is no server to ask"},
         {ErrorId::kNotReplaced, "not-replaced", kFailed,
          "the fetched file could not take the old one's place, which is as it was"},
+        {ErrorId::kNotificationNotSent, "notification-not-sent", kFailed,
+         "the notification could not be handed to the notification service"},
         {ErrorId::kOutOfMemory, "out-of-memory", kFailed, "memory is short"},
         {ErrorId::kOutput, "output", kFailed,
          "the result could not be written to standard output; told on standard error alone"},

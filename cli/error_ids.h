@@ -53,6 +53,7 @@ enum class ErrorId {
     kNoSuchText,
     kNotJoined,
     kNotReplaced,
+    kNotificationNotSent,
     kOutOfMemory,
     kOutput,
     kPluginFailed,

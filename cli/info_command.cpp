@@ -4,7 +4,10 @@
 #include <vector>
 
 #include "commands.h"
+#include "joined_server.h"
 #include "key_value_file.h"
+#include "last_error.h"
+#include "notification.h"
 #include "platform_handles.h"
 #include "zeloqrmclient.h"
 
@@ -65,6 +68,36 @@ bool SetVariable(const std::string &strText, YLIBSZHASH **ppHash) {
     return YLIBCSzHashSetValue(ppHash, strName.c_str(), strText.substr(equals + 1).c_str()) >= 0;
 }
 
+// As the library does, which keeps to itself whether a notification was sent.
+int Send(const std::string &strTag, YLIBSZHASH **ppHash) {
+    constexpr const char *kServer = "%QRM_SERVER%";
+    if (YLIBCSzHashGetValue(*ppHash, kServer) == nullptr) {
+        const std::optional<JoinedServer> server = FindJoinedServer();
+        const bool blKnown = server && server->host.isString();
+        const std::string strHost = blKnown ? server->host.asString() : "Unknown";
+        if (YLIBCSzHashSetValue(ppHash, kServer, strHost.c_str()) < 0) {
+            return -1;
+        }
+    }
+    return ZELOSysNotifySendNotifiction(strTag.c_str(), ppHash);
+}
+
+std::string WhyNotSent() {
+    const std::string strJournal = "the journal '/var/log/notifications.jsonl' ";
+    switch (YLIBCErrGet()) {
+        case YLIBC_ERR_OUT_OF_MEMORY:
+            return "out of memory";
+        case YLIBC_ERR_BUSY:
+            return strJournal + "is held by another program: wait for that one and try again";
+        case YLIBC_ERR_UNSAFE_FILE:
+            return strJournal + "is a link or no regular file: remove what stands there";
+        default:
+            return strJournal +
+                   "cannot be written: see to what stands there, its rights and the disk; -v "
+                   "shows the reason";
+    }
+}
+
 ExitCode Notify(const std::string &strTag, const std::vector<std::string> &variables,
                 Report &report) {
     constexpr int kHashSize = 512;
@@ -81,7 +114,10 @@ ExitCode Notify(const std::string &strTag, const std::vector<std::string> &varia
         }
     }
     Report::Stage("handing over the notification, with its hooks");
-    SendNotification(strTag.c_str(), hash.Address());
+    if (Send(strTag, hash.Address()) < 0) {
+        return report.Fail(ErrorId::kNotificationNotSent,
+                           "cannot send the notification '" + strTag + "': " + WhyNotSent());
+    }
     report.Say("The notification '" + strTag + "' is handed to the notification service.");
     return report.Done();
 }

@@ -22,7 +22,10 @@
 //     process after fork as it did in the parent.
 //   - Operations on different records may run in different threads at once; one record belongs to
 //     one thread at a time.
-//   - Neither token ever appears in a log line.
+//   - Neither token ever appears in a log line, and the store is readable for its owner alone. One
+//     that others have rights over, as a copy that was put back may be, loses those rights when it
+//     is next used, be it for a look. Where they cannot be taken away, or the store, or its folder,
+//     belongs to somebody else (root excepted), operations fail with YLIBC_ERR_UNSAFE_FILE.
 
 #ifndef ZELO_PLATFORM_CREDENTIAL_STORE_H
 #define ZELO_PLATFORM_CREDENTIAL_STORE_H
@@ -71,9 +74,11 @@ ZELO_PLATFORM_API int ZELOCredItemGetID(long *pId, const ZELO_CRED *pCred);
 
 // --- Credential records in the store ------------------------------------------------------------
 
-// Writes the record to the store, durably. A record without an id is added and gets an id, which no
-// record had before and none will have after it is removed. A record with an id replaces the stored
-// one; it fails with YLIBC_ERR_NOT_FOUND when that has been removed meanwhile.
+// Writes the record to the store, durably. A record without an id is added and gets an id that is
+// higher than every id that the store has given before, also to records that have been removed. A
+// store that was set aside, or replaced by an older copy, takes what it knew of this with it: the
+// one in its place may give an id anew. A record with an id replaces the stored one; it fails with
+// YLIBC_ERR_NOT_FOUND when that has been removed meanwhile.
 ZELO_PLATFORM_API int ZELOCredSave(ZELO_CRED *pCred);
 
 // Replaces the record's content by that of the stored record with this id. Id -1 is the default
@@ -111,10 +116,11 @@ ZELO_PLATFORM_API int ZELOCredRemoveByID(long id);
 // A store whose file is damaged or of another format is left as it is: operations on it fail with
 // YLIBC_ERR_STORE_DAMAGED until somebody restores a copy or sets it aside. Nothing but the
 // following operation sets it aside, and no other failure (a busy store, missing rights, a full
-// disk) counts as damage.
+// disk, a disk that cannot read) counts as damage.
 
-// Looks through the whole store; where it is damaged, renames its file to one in the same folder
-// whose name says when, and never replaces another. The store is empty then.
+// Looks through the whole store; where its file could be read whole, and is damaged, renames it to
+// one in the same folder whose name says when, and never replaces another. The store is empty then,
+// and ids count from the beginning.
 //
 // Returns 1 when it was set aside, 0 when nothing is damaged, a negative value when that could not
 // be found out or done; the operation may be called again then. szPath, a buffer of cbPath bytes,

@@ -20,7 +20,12 @@
 // there, or belongs to somebody else (root excepted), or is a link or a second name of another file
 // is refused (YLIBC_ERR_UNSAFE_FILE), and a change does not wait for the disk. In any other folder
 // links are followed, a change through a link replaces the file that it leads to, and a change is
-// durable when the operation returns. A failure sets the last error (last_error.h).
+// durable when the operation returns.
+//
+// A failure sets the last error (last_error.h): YLIBC_ERR_NOT_FOUND where a file that has to be
+// there is not, YLIBC_ERR_FILE where it cannot be read or written, which goes for a folder in its
+// place too, YLIBC_ERR_INVALID_ARGUMENT for an argument. A look-up that finds no such key sets
+// YLIBC_ERR_NOT_FOUND as well, though its result is 0.
 
 #ifndef ZELO_PLATFORM_KEY_VALUE_FILE_H
 #define ZELO_PLATFORM_KEY_VALUE_FILE_H

@@ -13,8 +13,9 @@
 //   - Unless stated otherwise they return 0 on success and a negative value on failure. A failure
 //     sets the last error (last_error.h); a null or unusable argument is
 //     YLIBC_ERR_INVALID_ARGUMENT, accounts that cannot be read or written are YLIBC_ERR_FILE.
-//   - A password is stored as a hash of all its characters and can be checked, but not read. It
-//     appears in no log line, no argument of a program and no environment.
+//   - A password is stored as a hash of all its characters, by which the system's own sign-in
+//     checks it; no operation here reads or checks it. It appears in no log line, no argument of a
+//     program and no environment.
 
 #ifndef ZELO_PLATFORM_USER_GROUP_H
 #define ZELO_PLATFORM_USER_GROUP_H

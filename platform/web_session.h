@@ -11,7 +11,8 @@
 // meets another process's write waits for it, within a bound.
 //
 // Results: non-zero for yes or done, 0 for no or failed. A failure sets the last error
-// (last_error.h); a session that is not there is no failure and leaves it as it was.
+// (last_error.h); a session that is not there is no failure and leaves it as it was. A store that
+// others have rights over, or own, is treated as the credential store is (credential_store.h).
 
 #ifndef ZELO_PLATFORM_WEB_SESSION_H
 #define ZELO_PLATFORM_WEB_SESSION_H

@@ -6,6 +6,7 @@
 #include <unistd.h>
 
 #include <cstring>
+#include <filesystem>
 #include <fstream>
 
 #include "host_name.h"
@@ -40,6 +41,13 @@ TEST(SerialNumber, TheCustomOneComesFirst) {
         EXPECT_EQ(client_description::ReadSerialNumber(strSerial), row.blRead);
         EXPECT_EQ(strSerial, row.szSerial);
     }
+    // What cannot be read is not the empty number.
+    char sz[] = "before";
+    std::filesystem::remove("/etc/custom_serial_number");
+    std::filesystem::create_directory("/etc/custom_serial_number");
+    EXPECT_LT(YLIBGetCustomSerialNumber(sz, sizeof(sz)), 0);
+    EXPECT_STREQ(sz, "before");
+    std::filesystem::remove("/etc/custom_serial_number");
 }
 
 TEST(HostName, IsCutToItsBuffer) {

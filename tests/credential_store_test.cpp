@@ -1,10 +1,12 @@
 // What any credential store has to promise, and what the host's adds: one file, safe for processes.
 
+#include <fcntl.h>
 #include <gtest/gtest.h>
 #include <sqlite3.h>
+#include <unistd.h>
 
+#include <cerrno>
 #include <filesystem>
-#include <set>
 
 #include "children.h"
 #include "files.h"
@@ -17,6 +19,17 @@ namespace fs = std::filesystem;
 using files::FileMode;
 using files::FileText;
 using files::WriteFile;
+
+// What belongs to another user: a box has none.
+const char *g_szOfOther = nullptr;
+
+int Status(const char *szPath, struct stat *pStatus, int flags) {
+    const int result = fstatat(AT_FDCWD, szPath, pStatus, flags);
+    if (g_szOfOther != nullptr && std::string(szPath) == g_szOfOther) {
+        pStatus->st_uid = 1000;
+    }
+    return result;
+}
 
 void RemoveStore() {
     fs::remove_all(stored::kFolder);
@@ -42,26 +55,45 @@ TEST(CredentialStore, LooksAreNotWrites) {
     EXPECT_EQ(ZELOCredListGet(&pList, ZELOCredKeepByApplication, "ZELO.QRM"), 0);
     EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_NONE)) << "nothing has failed";
     EXPECT_FALSE(fs::exists(stored::kFolder));
+    YLIBSZLIST *pslPaths = YLIBCSzListAlloc(0);
+    EXPECT_EQ(ZELOCredStoreListSetAside(&pslPaths), 0);
+    WriteFile(stored::kFolder, "a file in the folder's place");
+    EXPECT_LT(ZELOCredStoreListSetAside(&pslPaths), 0);
+    YLIBCSzListFree(pslPaths);
 
+    RemoveStore();
     stored::AddCredential("ZELO.QRM", "a");
-    EXPECT_EQ(FileMode(stored::kFolder), 0700U);
-    EXPECT_EQ(FileMode(stored::kDatabase), 0600U);
-    // As a copy that was put back may stand there.
-    chmod(stored::kFolder, 0755);
-    chmod(stored::kDatabase, 0644);
-    stored::AddCredential("Other", "h");
     EXPECT_EQ(FileMode(stored::kFolder), 0700U);
     EXPECT_EQ(FileMode(stored::kDatabase), 0600U);
 }
 
-TEST(CredentialStore, IdsAreNeverUsedAgain) {
+// As a copy that was put back may stand there.
+TEST(CredentialStore, OthersHaveNoRightsOverWhatIsUsed) {
     RemoveStore();
-    std::set<long> ids;
+    stored::AddCredential("ZELO.QRM", "a");
+    for (const char *szPath : {stored::kFolder, stored::kDatabase}) {
+        const unsigned mode = FileMode(szPath);
+        chmod(szPath, mode | 077U);
+        EXPECT_EQ(stored::Describe(), "https://a:443 ?") << "a look will do";
+        EXPECT_EQ(FileMode(szPath), mode) << szPath;
+        g_szOfOther = szPath;
+        EXPECT_LT(stored::AddCredential("ZELO.QRM", "b"), 0) << szPath;
+        chmod(szPath, mode);  // another status, so that nothing is answered from memory
+        EXPECT_LT(ZELOCredIDGetByApplication("ZELO.QRM"), 0) << szPath;
+        EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_UNSAFE_FILE));
+        g_szOfOther = nullptr;
+    }
+    EXPECT_EQ(stored::Describe(), "https://a:443 ?");
+}
+
+TEST(CredentialStore, ANewIdIsHigherThanEveryIdBefore) {
+    RemoveStore();
+    long last = -1;
     for (int i = 0; i < 5; ++i) {
         const long id = stored::AddCredential("ZELO.QRM", "a");
-        EXPECT_GE(id, 0);
-        EXPECT_TRUE(ids.insert(id).second);
+        EXPECT_GT(id, last);
         EXPECT_EQ(ZELOCredRemoveByID(id), 0);
+        last = id;
     }
 }
 
@@ -207,6 +239,39 @@ TEST(CredentialStore, DamagedOrForeignFilesAreLeftAsTheyAre) {
     }
 }
 
+// How SQLite reads a file, with one read that fails: it counts down to that one.
+int g_reads = 0;
+ssize_t g_failed = 0;
+ssize_t Read(int fd, void *pBuffer, std::size_t cb, off_t offset) {
+    errno = EIO;
+    return --g_reads == 0 ? g_failed : pread(fd, pBuffer, cb, offset);
+}
+
+// SQLite takes a failed read for damage, and what a short one leaves out for zeros.
+TEST(CredentialStore, AReadThatFailsIsNoDamage) {
+    RemoveStore();
+    stored::AddCredential("ZELO.QRM", "a");
+    const std::string strContent = FileText(stored::kDatabase);
+    sqlite3_vfs *const pVfs = sqlite3_vfs_find(nullptr);
+    pVfs->xSetSystemCall(pVfs, "pread64", reinterpret_cast<sqlite3_syscall_ptr>(&Read));
+    for (const ssize_t failed : {-1, 0}) {
+        g_failed = failed;
+        for (int nth = 1, left = 0; left <= 0; ++nth) {
+            char szPath[256] = {};
+            g_reads = nth;
+            EXPECT_NE(ZELOCredStoreSetAside(szPath, sizeof(szPath)), 1) << nth << " " << szPath;
+            left = g_reads;
+            ASSERT_TRUE(FileText(stored::kDatabase) == strContent);
+            g_reads = failed != 0 ? nth : 0;
+            if (ZELOCredIDGetByApplication("ZELO.QRM") < 0) {
+                EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_STORE)) << nth;
+            }
+        }
+    }
+    pVfs->xSetSystemCall(pVfs, "pread64", nullptr);
+    EXPECT_EQ(stored::Describe(), "https://a:443 ?");
+}
+
 TEST(CredentialStore, RemovedTokensAreGoneFromTheFile) {
     RemoveStore();
     const long id = stored::AddCredential("ZELO.QRM", "a");
@@ -217,3 +282,13 @@ TEST(CredentialStore, RemovedTokensAreGoneFromTheFile) {
 }
 
 }  // namespace
+
+// The host platform's looks at files come here.
+extern "C" __attribute__((visibility("default"))) int stat(const char *szPath,
+                                                           struct stat *pStatus) {
+    return Status(szPath, pStatus, 0);
+}
+extern "C" __attribute__((visibility("default"))) int lstat(const char *szPath,
+                                                            struct stat *pStatus) {
+    return Status(szPath, pStatus, AT_SYMLINK_NOFOLLOW);
+}

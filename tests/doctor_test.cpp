@@ -279,7 +279,10 @@ TEST_F(Doctor, JudgesWhatIsStoredAndShowsTheTokenToItsServerAlone) {
         {"f-", "qrmctl join", 1, 0,
          [] { return Write(kConfig, "join_nvo_qrm=\"yes\"\n"), Arguments(); }},
         {"f-", "damaged", 1, 0,
-         [&] { return Store(), Write(stored::kDatabase, std::string(99, 'x')), Arguments(); }},
+         [&] {
+             // Open to others, it would lose that.
+             return Store(), files::WriteFile(stored::kDatabase, std::string(99, 'x')), Arguments();
+         }},
         {"f-", "without an access token", 1, 0,
          [&] {
              stored::AddCredential("ZELO.QRM", "localhost", nullptr, "https",

@@ -174,7 +174,7 @@ TEST(FileLock, TrapsAreRefused) {
         {YLIBC_ERR_UNSAFE_FILE, [] { fs::create_symlink("/tmp/lured", kLock); }},
         {YLIBC_ERR_UNSAFE_FILE, [] { fs::create_hard_link(kVictim, kLock); }},
         {YLIBC_ERR_UNSAFE_FILE, [] { mkfifo(kLock, 0600); }},
-        {YLIBC_ERR_FILE, [] { fs::create_directory(kLock); }},
+        {YLIBC_ERR_UNSAFE_FILE, [] { fs::create_directory(kLock); }},
     };
     for (const auto &[code, set] : rows) {
         fs::remove(kLock);

@@ -146,7 +146,7 @@ TEST_F(KeyValueFile, GivesAllPairsInOrderAndOfAKeyTheFirst) {
     }
     EXPECT_EQ(strPairs, "old=new;own=stays;b=1;a=x \" y;empty=;");
     EXPECT_LT(YLIBCFileGetPair("/tmp/none", &pHash), 0);
-    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_FILE));
+    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_NOT_FOUND));
     EXPECT_LT(YLIBCFileGetPair(kFile, nullptr), 0);
     YLIBCSzHashFree(pHash);
 }
@@ -159,8 +159,11 @@ TEST_F(KeyValueFile, CutsAndRefuses) {
     EXPECT_EQ(YLIBCFileCheckKeyValue(kFile, "key", "0123", 0), 0);
     EXPECT_LT(YLIBCFileGetKeyValue("/tmp/none", "key", sz, sizeof(sz), 0), 0);
     EXPECT_STREQ(sz, "");
-    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_FILE));
+    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_NOT_FOUND));
     EXPECT_LT(YLIBCFileCheckKeyValue("/etc", "key", "x", 0), 0);
+    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_FILE));
+    EXPECT_EQ(YLIBCFileCheckKeyValue(kFile, "other", "x", 0), 0);
+    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_NOT_FOUND));
     EXPECT_LT(YLIBCFileGetKeyValue(nullptr, "key", sz, sizeof(sz), 0), 0);
     EXPECT_LT(YLIBCFileGetKeyValue(kFile, "key", sz, 0, 0), 0);
     EXPECT_LT(YLIBCFileCheckKeyValue(kFile, nullptr, "x", 0), 0);

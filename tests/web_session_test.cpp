@@ -47,6 +47,8 @@ TEST_F(WebSession, LookingAndRemovingCreateNothing) {
 
     EXPECT_TRUE(Add(13, kClient));
     EXPECT_EQ(fs::status(kFolder).permissions(), fs::perms::owner_all);
+    fs::permissions(kDatabase, fs::perms::all);
+    EXPECT_TRUE(Exists(13, kClient));
     EXPECT_EQ(fs::status(kDatabase).permissions(), fs::perms::owner_read | fs::perms::owner_write);
 }
 

@@ -223,8 +223,8 @@ int SetAsideIfDamaged(char *szPath, int cbPath) {
     return g_database.SetAsideIfDamaged(szPath, cbPath);
 }
 
-std::vector<std::string> ListSetAside() {
-    return host::ListSetAside(kStore.szPath);
+bool ListSetAside(std::vector<std::string> &paths) {
+    return host::ListSetAside(kStore.szPath, paths);
 }
 
 Result ReadSession(long id, ZELO_CRED_SESS &sess) {

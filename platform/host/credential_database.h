@@ -31,9 +31,10 @@ Result WriteCredential(ZELO_CRED &cred);
 // Removes the record; kDone also when it was not there.
 Result RemoveCredential(long id);
 
-// sqlite::Database::SetAsideIfDamaged, and the files that it has set aside, the oldest first.
+// sqlite::Database::SetAsideIfDamaged, and the files that it has set aside, the oldest first; false
+// when those cannot be found out.
 int SetAsideIfDamaged(char *szPath, int cbPath);
-std::vector<std::string> ListSetAside();
+bool ListSetAside(std::vector<std::string> &paths);
 
 Result ReadSession(long id, ZELO_CRED_SESS &sess);
 Result WriteSession(const ZELO_CRED_SESS &sess);

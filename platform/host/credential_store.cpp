@@ -237,7 +237,10 @@ int ZELOCredStoreListSetAside(YLIBSZLIST **ppslPaths) {
         return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
     }
     return NoThrow([&] {
-        const std::vector<std::string> paths = database::ListSetAside();
+        std::vector<std::string> paths;
+        if (!database::ListSetAside(paths)) {
+            return HOST_FAIL(YLIBC_ERR_FILE);
+        }
         for (const std::string &strPath : paths) {
             if (YLIBCSzListPush(ppslPaths, strPath.c_str()) < 0) {
                 return -1;

@@ -283,12 +283,20 @@ Try TakeLock(const LockFile &file, Clock::time_point end) {
     return WaitForLock(file, end);
 }
 
+// Why the lock file could not be opened. The kernel refuses some of what may not stand there, such
+// as a folder, before it can be looked at.
+int FailToOpen(const char *szPath) {
+    struct stat status = {};
+    const bool blUnsafe = lstat(szPath, &status) == 0 && !host::IsOwnFile(status);
+    return HOST_FAIL(blUnsafe ? YLIBC_ERR_UNSAFE_FILE : YLIBC_ERR_FILE);
+}
+
 int Lock(const char *szPath, int timeout_s, int &handle) {
     const Clock::time_point end = Clock::now() + std::chrono::seconds(timeout_s);
     for (;;) {
         LockFile file(szPath);
         if (file.Get() < 0) {
-            return HOST_FAIL(errno == ELOOP ? YLIBC_ERR_UNSAFE_FILE : YLIBC_ERR_FILE);
+            return FailToOpen(szPath);
         }
         const Try result = TakeLock(file, end);
         switch (result) {

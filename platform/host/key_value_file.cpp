@@ -145,7 +145,7 @@ bool Read(const char *szPath, std::string &strText) {
         case host::Find::kFile:
             return host::ReadContent(found, strText);
         case host::Find::kNoFile:
-            HOST_FAIL(YLIBC_ERR_FILE);
+            HOST_FAIL(YLIBC_ERR_NOT_FOUND);
             return false;
         default:
             return false;
@@ -311,7 +311,6 @@ host::LookUp host::LookUpKey(const char *szPath, const char *szKey, std::string 
     Line line;
     std::string_view rest = strText;
     if (!TakeLineWithKey(rest, szKey, line)) {
-        HOST_FAIL(YLIBC_ERR_NOT_FOUND);
         return LookUp::kAbsent;
     }
     strValue = ValueOf(line.value);
@@ -333,6 +332,7 @@ int YLIBCFileGetKeyValue(const char *szPath, const char *szKey, char *szValue, i
             case host::LookUp::kFound:
                 return host::CopyText(strValue, szValue, cbValue);
             case host::LookUp::kAbsent:
+                HOST_FAIL(YLIBC_ERR_NOT_FOUND);
                 return 0;
             default:
                 return -1;
@@ -351,6 +351,7 @@ int YLIBCFileCheckKeyValue(const char *szPath, const char *szKey, const char *sz
             case host::LookUp::kFound:
                 return strValue == szExpected ? 1 : 0;
             case host::LookUp::kAbsent:
+                HOST_FAIL(YLIBC_ERR_NOT_FOUND);
                 return 0;
             default:
                 return -1;

@@ -13,7 +13,8 @@ constexpr const char *kConfigFile = "/etc/zeloinfo.conf";
 
 enum class LookUp { kFound, kAbsent, kUnreadable };
 
-// Looks the key up in the file; strValue is set, whole, when it is found.
+// Looks the key up in the file; strValue is set, whole, when it is found. Only a file that cannot
+// be read sets the last error: a setting that is absent has its default.
 LookUp LookUpKey(const char *szPath, const char *szKey, std::string &strValue);
 
 }  // namespace host

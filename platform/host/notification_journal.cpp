@@ -56,8 +56,9 @@ class HeldJournal {
             m_file = host::FileDescriptor(open(
                 kJournal, O_RDWR | O_APPEND | O_CREAT | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC, 0640));
             if (!m_file.IsOpen()) {
-                return errno == ELOOP ? JOURNAL_FAIL(YLIBC_ERR_UNSAFE_FILE, "it is a link")
-                                      : JOURNAL_FAIL(YLIBC_ERR_FILE, std::strerror(errno));
+                return errno == ELOOP    ? JOURNAL_FAIL(YLIBC_ERR_UNSAFE_FILE, "it is a link")
+                       : errno == EISDIR ? JOURNAL_FAIL(YLIBC_ERR_UNSAFE_FILE, "it is a folder")
+                                         : JOURNAL_FAIL(YLIBC_ERR_FILE, std::strerror(errno));
             }
             if (Hold() < 0) {
                 return -1;

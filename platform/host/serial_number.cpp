@@ -17,11 +17,11 @@ constexpr const char *kFile = "serial_number";
 constexpr const char *kFlashFile = "/etc.defaults/serial_number";
 constexpr const char *kCustomFile = "/etc/custom_serial_number";
 
-std::string FirstLine(std::ifstream &file) {
-    std::string strLine;
+// False when it cannot be read; a file without a line has the empty one.
+bool ReadFirstLine(std::ifstream &file, std::string &strLine) {
     std::getline(file, strLine);
-    const std::size_t end = strLine.find_last_not_of(" \t\r");
-    return end == std::string::npos ? std::string() : strLine.substr(0, end + 1);
+    strLine.erase(strLine.find_last_not_of(" \t\r") + 1);  // npos + 1 is 0
+    return !file.bad();
 }
 
 }  // namespace
@@ -33,10 +33,11 @@ int YLIBGetCustomSerialNumber(char *szSerial, int cbSerial) {
     try {
         errno = 0;
         std::ifstream file(kCustomFile);
-        if (!file && errno != ENOENT) {
+        std::string strSerial;
+        if (file ? !ReadFirstLine(file, strSerial) : errno != ENOENT) {
             return HOST_FAIL(YLIBC_ERR_FILE);
         }
-        return host::CopyText(file ? FirstLine(file) : std::string(), szSerial, cbSerial);
+        return host::CopyText(strSerial, szSerial, cbSerial);
     } catch (const std::bad_alloc &) {
         return HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
     }
@@ -48,8 +49,8 @@ int YLIBGetSerialNumber(char *szSerial, int cbSerial) {
     }
     try {
         std::ifstream file(kFlashFile);
-        const std::string strSerial = file ? FirstLine(file) : std::string();
-        if (strSerial.empty()) {
+        std::string strSerial;
+        if (!file || !ReadFirstLine(file, strSerial) || strSerial.empty()) {
             return HOST_FAIL(YLIBC_ERR_NOT_FOUND);
         }
         return host::CopyText(strSerial, szSerial, cbSerial);

@@ -96,9 +96,8 @@ bool SetAside(const std::string &strPath, std::string &strAside) {
     return SyncFolder(fs::path(strPath).parent_path());
 }
 
-std::vector<std::string> ListSetAside(const std::string &strPath) {
+bool ListSetAside(const std::string &strPath, std::vector<std::string> &paths) {
     const std::string strBegin = fs::path(strPath).filename().string() + kMark;
-    std::vector<std::string> paths;
     std::error_code error;
     for (fs::directory_iterator entry(fs::path(strPath).parent_path(), error);
          !error && entry != fs::directory_iterator(); entry.increment(error)) {
@@ -109,7 +108,7 @@ std::vector<std::string> ListSetAside(const std::string &strPath) {
         }
     }
     std::sort(paths.begin(), paths.end());
-    return paths;
+    return !error || error == std::errc::no_such_file_or_directory;
 }
 
 }  // namespace host

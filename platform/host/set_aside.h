@@ -16,8 +16,9 @@ namespace host {
 bool SetAside(const std::string &strPath, std::string &strAside);
 
 // All files that were set aside from the path, the oldest first: databases, and what belonged to
-// one that was not moved with it.
-std::vector<std::string> ListSetAside(const std::string &strPath);
+// one that was not moved with it. False when the folder cannot be read; one that is not there has
+// none.
+bool ListSetAside(const std::string &strPath, std::vector<std::string> &paths);
 
 }  // namespace host
 

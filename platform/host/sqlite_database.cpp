@@ -17,6 +17,7 @@
 #include "file_state.h"
 #include "last_error.h"
 #include "set_aside.h"
+#include "sqlite_damage.h"
 #include "text_buffer.h"
 
 namespace host::sqlite {
@@ -32,15 +33,6 @@ constexpr int kBusyTimeout_ms = 10000;
 constexpr const char *kSettings =
     "PRAGMA synchronous = EXTRA; PRAGMA secure_delete = ON; PRAGMA trusted_schema = OFF;";
 
-struct CloseDatabase {
-    void operator()(sqlite3 *pDb) const { sqlite3_close_v2(pDb); }
-};
-struct FinalizeStatement {
-    void operator()(sqlite3_stmt *pStatement) const { sqlite3_finalize(pStatement); }
-};
-using DatabaseHandle = std::unique_ptr<sqlite3, CloseDatabase>;
-using StatementHandle = std::unique_ptr<sqlite3_stmt, FinalizeStatement>;
-
 // The chain of all databases. The mutex goes before those of the databases.
 std::mutex g_chainMutex;
 
@@ -53,18 +45,12 @@ Waiting NameWait(const Store &store) {
     return Waiting({"waiting for the ", store.szName, " '", store.szPath, "'"});
 }
 
-bool ReadPragma(sqlite3 *pDb, const char *szPragma, int &value, int &error) {
-    sqlite3_stmt *pRaw = nullptr;
-    error = sqlite3_prepare_v2(pDb, szPragma, -1, &pRaw, nullptr);
-    const StatementHandle pStatement(pRaw);
-    if (error == SQLITE_OK) {
-        error = sqlite3_step(pRaw);
-    }
-    if (error != SQLITE_ROW) {
-        return false;
-    }
-    value = sqlite3_column_int(pRaw, 0);
-    return true;
+// The rights that others must not have.
+constexpr mode_t kOthersOfFolder = 0077;
+constexpr mode_t kOthersOfFile = 0177;
+
+bool IsOurs(const struct stat &status) {
+    return status.st_uid == 0 || status.st_uid == geteuid();
 }
 
 }  // namespace
@@ -74,6 +60,7 @@ struct Connection {
     unsigned serial = ++g_connections;  // tells it from every other one of the process
     struct stat file = {};              // at the latest use
     bool blHasSchema = false;
+    bool blFailed = false;  // the next use opens the file anew
     DatabaseHandle pDb;
     std::vector<StatementHandle> statements;
 };
@@ -105,9 +92,18 @@ void Database::UnlockAllAfterFork() {
     g_chainMutex.unlock();
 }
 
-// SQLite's error as the platform's, with one log line.
-Result Database::Fail(int sqliteError, const char *szWhat, int line) const {
-    switch (sqliteError & 0xFF) {
+// SQLite's error as the platform's, with one log line. What SQLite calls damage is the system's
+// error where a read has failed.
+Result Database::Fail(int sqliteError, const char *szWhat, int line) {
+    int systemError = 0;
+    if (m_pConnection != nullptr) {
+        m_pConnection->blFailed = true;
+        if (IsDamage(sqliteError)) {
+            sqlite3_file_control(m_pConnection->pDb.get(), "main", SQLITE_FCNTL_LAST_ERRNO,
+                                 &systemError);
+        }
+    }
+    switch (systemError == 0 ? sqliteError & 0xFF : SQLITE_IOERR) {
         case SQLITE_NOTADB:
         case SQLITE_CORRUPT:
             syslog(LOG_ERR,
@@ -124,18 +120,18 @@ Result Database::Fail(int sqliteError, const char *szWhat, int line) const {
             break;
         default:
             syslog(LOG_ERR, "%s:%d %s '%s': %s", kFile, line, m_store.szName, m_store.szPath,
-                   szWhat);
+                   systemError == 0 ? szWhat : std::strerror(systemError));
             YLIBCErrSetEx(YLIBC_ERR_STORE, kFile, line);
     }
     return Result::kFailed;
 }
 
-Result Database::FailErrno(int line) const {
+Result Database::FailErrno(int line) {
     return Fail(SQLITE_CANTOPEN, std::strerror(errno), line);
 }
 
 // Makes sure that the file is there, ours alone. SQLite's journal takes over its mode.
-Result Database::CreateFile() const {
+Result Database::CreateFile() {
     if (mkdir(m_store.szFolder, 0700) != 0 && errno != EEXIST) {
         return FailErrno(__LINE__);
     }
@@ -147,39 +143,39 @@ Result Database::CreateFile() const {
     return Result::kDone;
 }
 
-// A store that was copied back, or made by hand, may be readable for others: what is written into
-// it is not to be.
-Result Database::TightenModes(mode_t fileMode) const {
-    struct stat folder = {};
-    if (stat(m_store.szFolder, &folder) != 0 ||
-        ((folder.st_mode & 0077) != 0 && chmod(m_store.szFolder, 0700) != 0) ||
-        ((fileMode & 0177) != 0 && chmod(m_store.szPath, 0600) != 0)) {
-        return FailErrno(__LINE__);
+// A store that was copied back, or made by hand, may be open to others, or theirs. What it holds is
+// not for them, and what they may have put there is not for us.
+Result Database::TakeFromOthers(const char *szPath, const struct stat &status, mode_t others) {
+    if (IsOurs(status) &&
+        ((status.st_mode & others) == 0 || chmod(szPath, 07777U & status.st_mode & ~others) == 0)) {
+        return Result::kDone;
     }
-    return Result::kDone;
+    const char *const szWhy =
+        IsOurs(status) ? "others have rights over it, which cannot be taken back"
+                       : "it belongs to another user: look what it holds, and make it root's";
+    syslog(LOG_ERR, "%s:%d %s '%s' is not used: %s", kFile, __LINE__, m_store.szName, szPath,
+           szWhy);
+    YLIBCErrSetEx(YLIBC_ERR_UNSAFE_FILE, kFile, __LINE__);
+    return Result::kFailed;
 }
 
-// Is it ours? kAbsent: nothing is in it yet, as a process leaves it that dies while creating it.
-// That is asked of SQLite, not of the file's size: its journal may still have to undo something.
-Result Database::CheckFormat() {
-    sqlite3 *const pDb = m_pConnection->pDb.get();
-    int pages = 0;
-    int applicationId = 0;
-    int format = 0;
-    int error = SQLITE_OK;
-    if (!ReadPragma(pDb, "PRAGMA page_count", pages, error) ||
-        !ReadPragma(pDb, "PRAGMA application_id", applicationId, error) ||
-        !ReadPragma(pDb, "PRAGMA user_version", format, error)) {
-        return Fail(error, sqlite3_errmsg(pDb), __LINE__);
+// Looks at the folder and then, when nobody else can put another one there, at the file. kAbsent:
+// there is none.
+Result Database::LookAtFile(struct stat &file) {
+    struct stat folder = {};
+    if (stat(m_store.szFolder, &folder) != 0) {
+        return errno == ENOENT ? Result::kAbsent : FailErrno(__LINE__);
     }
-    if (pages == 0) {
-        return Result::kAbsent;
+    if (TakeFromOthers(m_store.szFolder, folder, kOthersOfFolder) != Result::kDone) {
+        return Result::kFailed;
     }
-    if (applicationId != m_store.applicationId || format != m_store.format) {
-        return Fail(SQLITE_NOTADB, "", __LINE__);
+    if (lstat(m_store.szPath, &file) != 0) {
+        return errno == ENOENT ? Result::kAbsent : FailErrno(__LINE__);
     }
-    m_pConnection->blHasSchema = true;
-    return Result::kDone;
+    if (!S_ISREG(file.st_mode)) {
+        return Fail(SQLITE_CANTOPEN, "it is no regular file", __LINE__);
+    }
+    return TakeFromOthers(m_store.szPath, file, kOthersOfFile);
 }
 
 Result Database::Open() {
@@ -216,34 +212,34 @@ Result Database::CreateSchema() {
     return Result::kDone;
 }
 
+// Is it ours? kAbsent: nothing is in it yet, as a process leaves it that dies while creating it.
+// That is asked of SQLite, not of the file's size: its journal may still have to undo something.
+Result Database::CheckFormat() {
+    const Finding finding = sqlite::CheckFormat(m_pConnection->pDb.get(), m_store);
+    if (finding.error == SQLITE_EMPTY) {
+        return Result::kAbsent;
+    }
+    if (finding.error != SQLITE_OK) {
+        return Fail(finding.error, finding.szWhy, __LINE__);
+    }
+    m_pConnection->blHasSchema = true;
+    return Result::kDone;
+}
+
 // Makes m_pConnection a connection to the file that stands at the path now, or none when that
 // fails. kAbsent: there is no file, or nothing in it.
 Result Database::Connect(bool blWrite) {
     struct stat status = {};
-    if (lstat(m_store.szPath, &status) != 0) {
-        if (errno != ENOENT) {
-            return FailErrno(__LINE__);
-        }
+    Result result = LookAtFile(status);
+    if (result == Result::kAbsent && blWrite) {
+        result = CreateFile() == Result::kDone ? LookAtFile(status) : Result::kFailed;
+    }
+    if (result != Result::kDone) {
         m_pConnection.reset();
-        if (!blWrite) {
-            return Result::kAbsent;
-        }
-        if (CreateFile() != Result::kDone) {
-            return Result::kFailed;
-        }
-        if (lstat(m_store.szPath, &status) != 0) {
-            return FailErrno(__LINE__);
-        }
+        return result;
     }
-    if (!S_ISREG(status.st_mode)) {
-        m_pConnection.reset();
-        return Fail(SQLITE_CANTOPEN, "it is no regular file", __LINE__);
-    }
-    if (blWrite && TightenModes(status.st_mode) != Result::kDone) {
-        return Result::kFailed;
-    }
-    Result result = Result::kDone;
-    if (m_pConnection == nullptr || !IsSameFile(m_pConnection->file, status)) {
+    if (m_pConnection == nullptr || m_pConnection->blFailed ||
+        !IsSameFile(m_pConnection->file, status)) {
         m_pConnection.reset();
         result = Open();
     }
@@ -260,23 +256,6 @@ Result Database::Connect(bool blWrite) {
     return result;
 }
 
-Result Database::CheckWhole() {
-    sqlite3 *const pDb = m_pConnection->pDb.get();
-    sqlite3_stmt *pRaw = nullptr;
-    int error = sqlite3_prepare_v2(pDb, "PRAGMA integrity_check(1)", -1, &pRaw, nullptr);
-    const StatementHandle pStatement(pRaw);
-    if (error == SQLITE_OK) {
-        error = sqlite3_step(pRaw);
-    }
-    if (error != SQLITE_ROW) {
-        return Fail(error, sqlite3_errmsg(pDb), __LINE__);
-    }
-    const auto *pText = sqlite3_column_text(pRaw, 0);
-    const bool blWhole =
-        pText != nullptr && std::strcmp(reinterpret_cast<const char *>(pText), "ok") == 0;
-    return blWhole ? Result::kDone : Fail(SQLITE_CORRUPT, "", __LINE__);
-}
-
 Result Database::MoveIfDamaged(std::string &strPath) {
     const Waiting waiting = NameWait(m_store);
     const std::lock_guard<std::mutex> lock(m_mutex);
@@ -284,16 +263,20 @@ Result Database::MoveIfDamaged(std::string &strPath) {
     if (lstat(m_store.szPath, &judged) != 0) {
         return errno == ENOENT ? Result::kAbsent : FailErrno(__LINE__);
     }
-    Result result = Connect(false);
-    if (result == Result::kDone) {
-        result = CheckWhole();
+    // This waits for a writer, and plays back the journal of one that has died. Its closing writes
+    // a log's changes into the file.
+    const Result result = Connect(false);
+    m_pConnection.reset();
+    if (result == Result::kAbsent ||
+        (result == Result::kFailed && YLIBCErrGet() != YLIBC_ERR_STORE_DAMAGED)) {
+        return result;
     }
-    if (result != Result::kFailed) {
+    const Finding finding = FindDamage(m_store);
+    if (finding.error == SQLITE_OK) {
         return Result::kAbsent;
     }
-    m_pConnection.reset();
-    if (YLIBCErrGet() != YLIBC_ERR_STORE_DAMAGED) {
-        return Result::kFailed;
+    if (!IsDamage(finding.error)) {
+        return Fail(finding.error, finding.szWhy, __LINE__);
     }
     // A copy that was restored meanwhile is another file.
     struct stat now = {};
@@ -348,7 +331,10 @@ bool Database::ReadChanges(std::uint32_t &changes) const {
 // --- Glance -------------------------------------------------------------------------------------
 
 Glance::Glance(Database &database) : m_lock(database.m_mutex, std::try_to_lock) {
+    struct stat folder = {};
     m_blKnown = m_lock.owns_lock() && database.m_pConnection != nullptr &&
+                stat(database.m_store.szFolder, &folder) == 0 && IsOurs(folder) &&
+                (folder.st_mode & kOthersOfFolder) == 0 &&
                 lstat(database.m_store.szPath, &m_now.file) == 0 &&
                 IsSameFile(m_now.file, database.m_pConnection->file) &&
                 database.ReadChanges(m_now.changes);

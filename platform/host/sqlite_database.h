@@ -2,11 +2,12 @@
 //
 // What every store keeps to. A statement is a transaction, durable when it returns; another
 // process's write is waited for, within a bound. Reading never creates or changes the file: a store
-// that does not exist yet has no records. A file that is damaged or of another format is left as it
-// is, and each operation on it fails with a log line; only SetAsideIfDamaged moves it. What is
-// removed is overwritten. The process keeps one connection to each store, which its threads take in
-// turn; it is closed before a fork, and opened anew when another file has taken the place of the
-// one that it leads to.
+// that does not exist yet has no records. Rights that others have over the file or its folder are
+// taken away by every operation; a file or folder of somebody else's is refused. A file that is
+// damaged or of another format is left as it is, and each operation on it fails with a log line;
+// only SetAsideIfDamaged moves it. What is removed is overwritten. The process keeps one connection
+// to each store, which its threads take in turn; it is closed before a fork, and opened anew after
+// a failure and when another file has taken the place of the one that it leads to.
 
 #ifndef ZELO_HOST_SQLITE_DATABASE_H
 #define ZELO_HOST_SQLITE_DATABASE_H
@@ -76,15 +77,15 @@ class Database {
     // The caller of these holds the mutex.
     Result Connect(bool blWrite);
     Result Open();
-    Result CreateFile() const;
-    Result TightenModes(mode_t fileMode) const;
+    Result CreateFile();
+    Result TakeFromOthers(const char *szPath, const struct stat &status, mode_t others);
+    Result LookAtFile(struct stat &file);
     Result CheckFormat();
-    Result CheckWhole();
     Result MoveIfDamaged(std::string &strPath);
     Result CreateSchema();
     bool ReadChanges(std::uint32_t &changes) const;
-    Result Fail(int sqliteError, const char *szWhat, int line) const;
-    Result FailErrno(int line) const;
+    Result Fail(int sqliteError, const char *szWhat, int line);
+    Result FailErrno(int line);
 
     const Store &m_store;
     std::mutex m_mutex;

@@ -3,7 +3,9 @@
 #include "../strings_file.h"
 
 #include <sys/stat.h>
+#include <unistd.h>
 
+#include <cerrno>
 #include <new>
 #include <optional>
 #include <string>
@@ -183,7 +185,8 @@ int YLIBCFileGetSectionValue(const char *szPath, const char *szSection, const ch
             case Result::kAbsent:
                 return HOST_FAIL(YLIBC_ERR_NOT_FOUND);
             default:
-                return HOST_FAIL(YLIBC_ERR_FILE);
+                return HOST_FAIL(access(szPath, F_OK) != 0 && errno == ENOENT ? YLIBC_ERR_NOT_FOUND
+                                                                              : YLIBC_ERR_FILE);
         }
     } catch (const std::bad_alloc &) {
         return HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);

@@ -49,6 +49,15 @@ Find LookAtOpened(FoundFile &found) {
     return S_ISREG(found.status.st_mode) ? Find::kFile : Failed(YLIBC_ERR_FILE, __LINE__);
 }
 
+// Why there is a file that cannot be opened. In a shared folder the reason is whose it is.
+Find FailToOpen(const FoundFile &found) {
+    struct stat status = {};
+    bool blShared = false;
+    const bool blUnsafe = lstat(found.Path().c_str(), &status) == 0 && !IsOwnFile(status) &&
+                          ReadShared(found.strFolder, blShared) && blShared;
+    return Failed(blUnsafe ? YLIBC_ERR_UNSAFE_FILE : YLIBC_ERR_FILE, __LINE__);
+}
+
 bool FollowLink(FoundFile &found) {
     bool blShared = false;
     if (!ReadShared(found.strFolder, blShared)) {
@@ -99,7 +108,7 @@ Find FindFile(const char *szPath, FoundFile &found) {
             return Find::kNoFile;
         }
         if (errno != ELOOP) {
-            break;
+            return FailToOpen(found);
         }
         if (!FollowLink(found)) {
             return Find::kFailed;
