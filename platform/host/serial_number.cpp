@@ -17,7 +17,9 @@ constexpr const char *kFile = "serial_number";
 constexpr const char *kFlashFile = "/etc.defaults/serial_number";
 constexpr const char *kCustomFile = "/etc/custom_serial_number";
 
+// A file that cannot be read further throws: it is not one without a number.
 std::string FirstLine(std::ifstream &file) {
+    file.exceptions(std::ios::badbit);
     std::string strLine;
     std::getline(file, strLine);
     const std::size_t end = strLine.find_last_not_of(" \t\r");
@@ -37,6 +39,8 @@ int YLIBGetCustomSerialNumber(char *szSerial, int cbSerial) {
             return HOST_FAIL(YLIBC_ERR_FILE);
         }
         return host::CopyText(file ? FirstLine(file) : std::string(), szSerial, cbSerial);
+    } catch (const std::ios_base::failure &) {
+        return HOST_FAIL(YLIBC_ERR_FILE);
     } catch (const std::bad_alloc &) {
         return HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
     }
@@ -53,6 +57,8 @@ int YLIBGetSerialNumber(char *szSerial, int cbSerial) {
             return HOST_FAIL(YLIBC_ERR_NOT_FOUND);
         }
         return host::CopyText(strSerial, szSerial, cbSerial);
+    } catch (const std::ios_base::failure &) {
+        return HOST_FAIL(YLIBC_ERR_FILE);
     } catch (const std::bad_alloc &) {
         return HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
     }
