@@ -219,6 +219,7 @@ std::optional<Stop> Program::Read(std::vector<std::string> words) {
             return Wrong(*m_pApp, error);
         }
         std::ostringstream shown;
+        shown.exceptions(std::ios::badbit);  // or short memory would cut the help
         m_pApp->exit(error, shown, shown);
         return Stop{false, shown.str()};
     }

@@ -4,11 +4,14 @@
 #include <pthread.h>
 #include <unistd.h>
 
+#include <array>
 #include <chrono>
 #include <condition_variable>
 #include <csignal>
+#include <cstddef>
 #include <exception>
 #include <mutex>
+#include <new>
 #include <sstream>
 #include <string_view>
 #include <thread>
@@ -28,13 +31,14 @@ using Clock = std::chrono::steady_clock;
 
 constexpr std::chrono::milliseconds kLongestCleanup(500);
 constexpr std::chrono::milliseconds kLongestTelling(250);
+constexpr const char *kRemedy = "mend what it waited for, or give it more time with --deadline";
 
 struct Stage {
     std::string strName;
     Clock::duration time;
 };
 
-// Never destroyed: the thread that keeps the time waits on it while the process ends.
+// Its members take no memory before they are set: output needs it when memory is short.
 struct Watch {
     std::mutex mutex;
     std::condition_variable wake;
@@ -46,7 +50,7 @@ struct Watch {
     std::string strStage = "starting";
     Clock::time_point begin = Clock::now();
     Clock::time_point end = Clock::time_point::max();
-    std::string strRemedy = "mend what it waited for, or give it more time with --deadline";
+    std::string strRemedy;  // "" for kRemedy
     std::function<void()> cleanup;
     std::mutex cleanupMutex;
     std::condition_variable cleanupWake;
@@ -54,8 +58,10 @@ struct Watch {
     bool blCleaned = false;
 };
 
+// Never destroyed: the thread that keeps the time waits on it while the process ends.
 Watch &TheWatch() {
-    static auto *const pWatch = new Watch;
+    alignas(Watch) static std::array<std::byte, sizeof(Watch)> place;
+    static Watch *const pWatch = new (place.data()) Watch;
     return *pWatch;
 }
 
@@ -139,7 +145,7 @@ void Tell(const Watch &watch, const std::string &strStage, Clock::duration time)
     if (blEarlier) {
         strError += ", after '" + strLongest + "' had taken " + Seconds(watch.longest.time);
     }
-    strError += "; " + watch.strRemedy;
+    strError += "; " + (watch.strRemedy.empty() ? kRemedy : watch.strRemedy);
     if (watch.blJson && !watch.blOutput) {
         Json::Value result;
         result["schema"] = kSchema;

@@ -6,8 +6,8 @@
 #include <cstring>
 #include <fstream>
 #include <iostream>
+#include <iterator>
 #include <memory>
-#include <sstream>
 
 #include "json_text.h"
 #include "words.h"
@@ -17,25 +17,25 @@ namespace {
 
 bool ReadAll(const char *szWhat, const std::string &strFile, std::string &strText,
              std::string &strError, const char *szStandardInput = "-") {
-    std::ostringstream text;
-    if (strFile == "-") {
-        text << std::cin.rdbuf();
-    } else {
-        errno = 0;
-        std::ifstream file(strFile, std::ios::binary);
-        if (file && file.peek() != std::ifstream::traits_type::eof()) {
-            text << file.rdbuf();
+    std::ifstream file;
+    bool blRead = true;
+    errno = 0;
+    try {
+        if (strFile != "-") {
+            file.open(strFile, std::ios::binary);
+            blRead = file.is_open();
         }
-        if (!file.is_open() || file.bad() || errno == EISDIR) {
-            strError = std::string("cannot read ") + szWhat + " '" + strFile +
-                       "': " + std::strerror(errno == 0 ? EIO : errno) +
-                       "; name a file that can be read, or " + szStandardInput +
-                       " for standard input";
-            return false;
-        }
+        std::istream &input = strFile == "-" ? std::cin : file;
+        strText.assign(std::istreambuf_iterator<char>(input), {});
+    } catch (const std::ios_base::failure &) {
+        blRead = false;
     }
-    strText = text.str();
-    return true;
+    if (!blRead) {
+        strError = std::string("cannot read ") + szWhat + " '" + strFile +
+                   "': " + std::strerror(errno == 0 ? EIO : errno) +
+                   "; name a file that can be read, or " + szStandardInput + " for standard input";
+    }
+    return blRead;
 }
 
 // The library's reader leaves what follows the value alone. Here it is part of a slip, such as a

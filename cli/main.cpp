@@ -1,12 +1,15 @@
 // qrmctl: the library at a shell.
 
+#include <json/value.h>
 #include <syslog.h>
 
 #include <algorithm>
 #include <exception>
 #include <iostream>
+#include <new>
 #include <string>
 #include <string_view>
+#include <system_error>
 
 #include "command_line.h"
 #include "deadline.h"
@@ -52,6 +55,26 @@ int Run(int argc, char **argv) {
     return action(report);
 }
 
+// JsonCpp throws errors of its own where memory is short, and a thread's start an error number.
+bool IsShortOfMemory(const std::exception &error) {
+    const auto *const pSystem = dynamic_cast<const std::system_error *>(&error);
+    return dynamic_cast<const std::bad_alloc *>(&error) != nullptr ||
+           dynamic_cast<const Json::RuntimeError *>(&error) != nullptr ||
+           (pSystem != nullptr && (pSystem->code() == std::errc::not_enough_memory ||
+                                   pSystem->code() == std::errc::resource_unavailable_try_again));
+}
+
+int FailUnexpectedly(const std::exception &error, bool blJson) {
+    if (!IsShortOfMemory(error)) {
+        try {
+            return qrmctl::Report(blJson).Fail(qrmctl::ErrorId::kInternal, error.what());
+        } catch (const std::exception &) {
+            // Memory is short for the telling.
+        }
+    }
+    return qrmctl::FailShortOfMemory(blJson);
+}
+
 }  // namespace
 
 int main(int argc, char **argv) {
@@ -59,7 +82,6 @@ int main(int argc, char **argv) {
     try {
         return Run(argc, argv);
     } catch (const std::exception &error) {
-        return qrmctl::Report(AsksForJson(argc, argv))
-            .Fail(qrmctl::ErrorId::kInternal, error.what());
+        return FailUnexpectedly(error, AsksForJson(argc, argv));
     }
 }

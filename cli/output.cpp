@@ -7,18 +7,15 @@
 #include <unistd.h>
 
 #include <algorithm>
-#include <array>
 #include <cerrno>
 #include <climits>
 #include <iostream>
+#include <utility>
 
 #include "deadline.h"
 
 namespace qrmctl {
 namespace {
-
-// Gathered text goes out when it has this length; to a terminal line by line.
-constexpr std::size_t kGathered = 4096;
 
 // How a standard stream is written to. Setting O_NONBLOCK on it would set it for everybody who has
 // it; a pipe or a terminal can be opened once more, with a flag of its own.
@@ -33,50 +30,20 @@ struct Way {
         }
         blSocket = S_ISSOCK(status.st_mode);
         if (S_ISFIFO(status.st_mode) || isatty(standard) == 1) {
-            const std::string strPath = "/proc/self/fd/" + std::to_string(standard);
-            const int own = open(strPath.c_str(), O_WRONLY | O_NONBLOCK | O_NOCTTY | O_CLOEXEC);
+            const char *const szPath =
+                standard == STDOUT_FILENO ? "/proc/self/fd/1" : "/proc/self/fd/2";
+            const int own = open(szPath, O_WRONLY | O_NONBLOCK | O_NOCTTY | O_CLOEXEC);
             fd = own >= 0 ? own : standard;
         }
     }
 };
 
-// Never destroyed: the deadline may strike while the process ends.
+// Nothing to destroy: the deadline may strike while the process ends.
 const Way &WayOf(int fd) {
-    static const auto *const pOut = new Way(STDOUT_FILENO);
-    static const auto *const pErr = new Way(STDERR_FILENO);
-    return fd == STDOUT_FILENO ? *pOut : *pErr;
+    static const Way out(STDOUT_FILENO);
+    static const Way err(STDERR_FILENO);
+    return fd == STDOUT_FILENO ? out : err;
 }
-
-class GuardedBuffer : public std::streambuf {
-  public:
-    explicit GuardedBuffer(int fd) : m_fd(fd), m_blTerminal(isatty(WayOf(fd).fd) == 1) {}
-
-    bool PutOut(bool blLast) {
-        const bool blOut = Deliver(m_fd, m_strText, blLast);
-        m_strText.clear();
-        return blOut;
-    }
-
-  protected:
-    int_type overflow(int_type c) override {
-        const char byte = traits_type::to_char_type(c);
-        return traits_type::eq_int_type(c, traits_type::eof()) || xsputn(&byte, 1) == 1
-                   ? traits_type::not_eof(c)
-                   : traits_type::eof();
-    }
-    std::streamsize xsputn(const char *pText, std::streamsize cb) override {
-        m_strText.append(pText, static_cast<std::size_t>(cb));
-        const bool blFull = m_strText.size() >= kGathered ||
-                            (m_blTerminal && m_strText.find('\n') != std::string::npos);
-        return blFull && !PutOut(false) ? 0 : cb;
-    }
-    int sync() override { return PutOut(false) ? 0 : -1; }
-
-  private:
-    int m_fd;
-    bool m_blTerminal;
-    std::string m_strText;
-};
 
 }  // namespace
 
@@ -98,14 +65,47 @@ bool AwaitRoom(int fd, std::chrono::milliseconds limit) {
     return poll(&output, 1, static_cast<int>(limit.count())) == 1;
 }
 
+GuardedBuffer::GuardedBuffer(int fd) : m_fd(fd), m_blTerminal(isatty(WayOf(fd).fd) == 1) {}
+
+bool GuardedBuffer::PutOut(bool blLast) {
+    return Deliver(m_fd, {m_text.data(), std::exchange(m_cb, 0)}, blLast);
+}
+
+GuardedBuffer::int_type GuardedBuffer::overflow(int_type c) {
+    const char byte = traits_type::to_char_type(c);
+    return traits_type::eq_int_type(c, traits_type::eof()) || xsputn(&byte, 1) == 1
+               ? traits_type::not_eof(c)
+               : traits_type::eof();
+}
+
+// To a terminal text goes out line by line.
+std::streamsize GuardedBuffer::xsputn(const char *pText, std::streamsize cb) {
+    const std::string_view text(pText, static_cast<std::size_t>(cb));
+    if (text.size() > m_text.size() - m_cb && !PutOut(false)) {
+        return 0;
+    }
+    if (text.size() > m_text.size()) {
+        return Deliver(m_fd, text, false) ? cb : 0;
+    }
+    m_cb += text.copy(m_text.data() + m_cb, text.size());
+    const bool blLine = m_blTerminal && text.find('\n') != std::string_view::npos;
+    return blLine && !PutOut(false) ? 0 : cb;
+}
+
+int GuardedBuffer::sync() {
+    return PutOut(false) ? 0 : -1;
+}
+
 GuardedOutput::GuardedOutput()
-    : m_pOut(std::cout.rdbuf(new GuardedBuffer(STDOUT_FILENO))),
-      m_pErr(std::cerr.rdbuf(new GuardedBuffer(STDERR_FILENO))) {}
+    : m_out(STDOUT_FILENO),
+      m_err(STDERR_FILENO),
+      m_pFormerOut(std::cout.rdbuf(&m_out)),
+      m_pFormerErr(std::cerr.rdbuf(&m_err)) {}
 
 GuardedOutput::~GuardedOutput() {
     std::cout.flush();
-    delete std::cerr.rdbuf(m_pErr);
-    delete std::cout.rdbuf(m_pOut);
+    std::cerr.rdbuf(m_pFormerErr);
+    std::cout.rdbuf(m_pFormerOut);
 }
 
 bool PutOutLast(std::ostream &stream) {

@@ -6,9 +6,9 @@
 
 #include <sys/types.h>
 
+#include <array>
 #include <chrono>
 #include <streambuf>
-#include <string>
 #include <string_view>
 
 namespace qrmctl {
@@ -21,7 +21,28 @@ ssize_t WriteNow(int fd, std::string_view text);
 // Waits for room, for at most the time; a negative one has no end. False when it is over.
 bool AwaitRoom(int fd, std::chrono::milliseconds limit);
 
-// While it lives, std::cout and std::cerr go through the deadline (deadline.h).
+// Gathers text for a standard stream and puts it out through the deadline (deadline.h). It has all
+// the memory that it needs.
+class GuardedBuffer : public std::streambuf {
+  public:
+    explicit GuardedBuffer(int fd);
+
+    // blLast: as Deliver() of deadline.h has it.
+    bool PutOut(bool blLast);
+
+  protected:
+    int_type overflow(int_type c) override;
+    std::streamsize xsputn(const char *pText, std::streamsize cb) override;
+    int sync() override;
+
+  private:
+    int m_fd;
+    bool m_blTerminal;
+    std::size_t m_cb = 0;
+    std::array<char, 4096> m_text;
+};
+
+// While it lives, std::cout and std::cerr go through the deadline.
 class GuardedOutput {
   public:
     GuardedOutput();
@@ -31,8 +52,10 @@ class GuardedOutput {
     GuardedOutput &operator=(const GuardedOutput &) = delete;
 
   private:
-    std::streambuf *m_pOut;
-    std::streambuf *m_pErr;
+    GuardedBuffer m_out;
+    GuardedBuffer m_err;
+    std::streambuf *m_pFormerOut;
+    std::streambuf *m_pFormerErr;
 };
 
 // Puts out what the stream has, as the program's last bytes: the deadline strikes until they are

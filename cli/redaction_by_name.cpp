@@ -3,11 +3,11 @@
 #include <algorithm>
 #include <array>
 #include <cctype>
-#include <sstream>
 #include <string_view>
 
 #include "json_text.h"
 #include "redaction.h"
+#include "words.h"
 
 namespace qrmctl {
 namespace {
@@ -185,9 +185,8 @@ bool IsSecretName(const std::string &strName) {
 }
 
 std::string MaskNamed(const std::string &strLines) {
-    std::istringstream lines(strLines);
     std::string strMasked;
-    for (std::string strLine; std::getline(lines, strLine);) {
+    for (const std::string &strLine : words::Split(strLines, '\n')) {
         strMasked += MaskLine(strLine) + '\n';
     }
     return strMasked;

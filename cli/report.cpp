@@ -87,6 +87,21 @@ ExitCode Report::Fail(ErrorId id, const std::string &strError) {
     return ErrorOf(id).exitCode;
 }
 
+ExitCode FailShortOfMemory(bool blJson) noexcept {
+    constexpr const char *kLine = "qrmctl: memory is short\n";
+    if (blJson) {
+        std::cerr << kLine;
+        std::cout << R"({"error":"memory is short","error_id":"out-of-memory",)"
+                  << R"("schema":"qrmctl/1","success":false})" << '\n';
+        static_cast<void>(PutOutLast(std::cout));
+    } else {
+        std::cout.flush();
+        std::cerr << std::nounitbuf << kLine;
+        static_cast<void>(PutOutLast(std::cerr));
+    }
+    return kFailed;
+}
+
 // A sentence about a certificate authority that cannot be read; empty when all can.
 static std::string AuthorityFlaw() {
     std::array<char, 4096> place = {};

@@ -60,6 +60,9 @@ class Report {
     Json::Value m_result{Json::objectValue};
 };
 
+// Ends a command that memory was too short for, with ErrorId::kOutOfMemory; takes no memory itself.
+ExitCode FailShortOfMemory(bool blJson) noexcept;
+
 }  // namespace qrmctl
 
 #endif

@@ -17,7 +17,6 @@
 #include <cerrno>
 #include <ctime>
 #include <filesystem>
-#include <sstream>
 
 #include "connection_checks.h"
 #include "deadline.h"
@@ -27,6 +26,7 @@
 #include "platform_handles.h"
 #include "redaction.h"
 #include "report.h"
+#include "words.h"
 
 namespace qrmctl {
 namespace {
@@ -64,8 +64,7 @@ std::string Tail(const char *szPath) {
 std::string LastLines(const std::string &strText, std::size_t count,
                       bool (*pfnKeep)(const std::string &)) {
     std::vector<std::string> lines;
-    std::istringstream stream(strText);
-    for (std::string strLine; std::getline(stream, strLine);) {
+    for (const std::string &strLine : words::Split(strText, '\n')) {
         if (pfnKeep == nullptr || pfnKeep(strLine)) {
             lines.push_back(strLine);
         }

@@ -15,6 +15,7 @@ std::string Joined(const std::vector<std::string> &words, const char *szBetween)
 std::vector<std::string> Split(const std::string &strText, char separator) {
     std::vector<std::string> words;
     std::istringstream text(strText);
+    text.exceptions(std::ios::badbit);  // or short memory would cut the text
     for (std::string strWord; std::getline(text, strWord, separator);) {
         words.push_back(strWord);
     }

@@ -207,13 +207,24 @@ TEST(InterfaceTexts, EveryLanguageHasEveryTextWithTheSameMarkers) {
 
 }  // namespace
 
-// The host platform's log lines end here.
+static void KeepLogLine(const char *szFormat, va_list args) {
+    char sz[1024];
+    std::vsnprintf(sz, sizeof(sz), szFormat, args);
+    g_logLines.emplace_back(sz);
+}
+
+// The host platform's log lines end here; a fortified build calls the second one.
 extern "C" __attribute__((visibility("default"))) void syslog(int /*level*/, const char *szFormat,
                                                               ...) {
-    char sz[1024];
     va_list args;
     va_start(args, szFormat);
-    std::vsnprintf(sz, sizeof(sz), szFormat, args);
+    KeepLogLine(szFormat, args);
     va_end(args);
-    g_logLines.emplace_back(sz);
+}
+extern "C" __attribute__((visibility("default"))) void __syslog_chk(int /*level*/, int /*flag*/,
+                                                                    const char *szFormat, ...) {
+    va_list args;
+    va_start(args, szFormat);
+    KeepLogLine(szFormat, args);
+    va_end(args);
 }

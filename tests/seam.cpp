@@ -178,3 +178,12 @@ void Wrap_syslog(int level, const char *szFormat, ...) {
     seam::WriteLog(level, szFormat, args);
     va_end(args);
 }
+
+// What a fortified build calls.
+void Wrap_syslog_chk(int level, int flag, const char *szFormat, ...) asm("__wrap___syslog_chk");
+void Wrap_syslog_chk(int level, int /*flag*/, const char *szFormat, ...) {
+    va_list args;
+    va_start(args, szFormat);
+    seam::WriteLog(level, szFormat, args);
+    va_end(args);
+}

@@ -2,6 +2,9 @@
 
 #include <gtest/gtest.h>
 
+#include <new>
+
+#include "guard.h"
 #include "json_text.h"
 #include "stored.h"
 #include "torture.h"
@@ -291,6 +294,18 @@ TEST(ServerCredential, TokensAreReadAsTheyAreStored) {
     stored::AddCredential("ZELO.QRM", "second");
     EXPECT_TRUE(ZELOQRMClientGetServerCredential(out));
     EXPECT_EQ(out["host"], "qrm");
+}
+
+TEST(Guard, WhatIsThrownBecomesTheFailureValueAndALine) {
+    const auto guarded = [](const auto &thrown) {
+        int result = 0;
+        const seam::Outcome outcome =
+            seam::Observe({}, [&] { result = ZELO_GUARD(-1, [&]() -> int { throw thrown; }); });
+        EXPECT_EQ(result, -1);
+        return seam::Messages(outcome);
+    };
+    EXPECT_EQ(guarded(std::bad_alloc()), "Unexpected exception: std::bad_alloc");
+    EXPECT_EQ(guarded(7), "Unexpected exception");
 }
 
 }  // namespace

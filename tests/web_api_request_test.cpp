@@ -121,6 +121,25 @@ TEST_F(Request, OnlyKnownProtocolsAndPlainHostsAreUsed) {
     }
 }
 
+TEST_F(Request, AnAddressOfIPv6IsAHostToo) {
+    if (std::ifstream("/proc/net/if_inet6").peek() == std::ifstream::traits_type::eof()) {
+        GTEST_SKIP() << "this machine has no IPv6";
+    }
+    devserver::Options options;
+    options.host = "::1";
+    Start(options);
+    Write(kCaFile, m_pServer->CaPem());
+    for (const char *szHost : {"::1", "[::1]"}) {
+        EXPECT_EQ(PathOf("https", m_pServer->HttpsPort(), szHost), "/qrm/rpc") << szHost;
+        ZELO::CredRequest request;
+        const Cred pCred = ServerAt("https", m_pServer->HttpsPort(), szHost);
+        EXPECT_TRUE(ZELO::CredRequestUtil::SetWebAPIURL(pCred.get(), kApi, 1, "info", &request));
+        EXPECT_EQ(request.GetURL(),
+                  "https://[::1]:" + std::to_string(m_pServer->HttpsPort()) + "/qrm/rpc");
+        EXPECT_TRUE(request.Process(true, 0)) << szHost;
+    }
+}
+
 TEST_F(Request, ProxyVariablesCountOnlyWhereTheConfigurationSaysSo) {
     for (const char *szName :
          {"http_proxy", "https_proxy", "HTTPS_PROXY", "all_proxy", "ALL_PROXY"}) {
