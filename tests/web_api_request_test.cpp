@@ -120,10 +120,7 @@ TEST_F(Request, OnlyAVerifiedServerIsSpokenTo) {
     Write(kCaFile, m_pServer->CaPem());
     EXPECT_EQ(Https(), "/qrm/rpc");
     std::ofstream(kCaFile) << "no certificate";
-    const auto end = std::chrono::steady_clock::now() + std::chrono::seconds(10);
-    while (!Https().empty() && std::chrono::steady_clock::now() < end) {
-    }
-    EXPECT_EQ(Https(), "") << "a file that is written to is another one, after a second at most";
+    EXPECT_EQ(Https(), "") << "a file that is written to is another one";
     Write(kCaFile, m_pServer->CaPem());
     EXPECT_EQ(Https(), "/qrm/rpc");
     Write(kOtherCaFile, "no certificate");

@@ -3,25 +3,15 @@
 #include "http_exchange.h"
 
 #include <curl/curl.h>
-#include <openssl/ssl.h>
-#include <poll.h>
-#include <pthread.h>
-#include <sys/socket.h>
 #include <syslog.h>
-#include <unistd.h>
 
 #include <algorithm>
-#include <array>
-#include <cstdlib>
 #include <cstring>
 #include <limits>
 #include <memory>
-#include <mutex>
-#include <new>
-#include <set>
 #include <string_view>
 
-#include "appliance_ca.h"
+#include "connection_pool.h"
 #include "key_value_lookup.h"
 #include "last_error.h"
 #include "reply_sink.h"
@@ -44,22 +34,10 @@ constexpr long kReplyBuffer = 16 * 1024L;
 // What is sent is small, while libcurl allocates and frees its buffer for each exchange.
 constexpr long kUploadBuffer = 16 * 1024L;
 
-// Of the ciphers of TLS 1.3: takes less time than the one that OpenSSL puts first.
-constexpr std::string_view kFirstCipher = "TLS_AES_128_GCM_SHA256";
-
-// More idle handles than this are not kept.
-constexpr std::size_t kMaxIdle = 8;
-// A connection that is idle for longer is not used again: servers close theirs after 5 s or more,
-// and a call must not meet that moment.
-constexpr long kMaxIdle_s = 3;
-
 constexpr long kStatusBadRequest = 400;
 constexpr long kStatusForbidden = 403;
 constexpr long kStatusProxyAuthentication = 407;
 
-struct CleanupEasy {
-    void operator()(CURL *pEasy) const { curl_easy_cleanup(pEasy); }
-};
 struct FreeList {
     void operator()(curl_slist *pList) const { curl_slist_free_all(pList); }
 };
@@ -72,86 +50,7 @@ struct FreeText {
 
 using HeaderList = std::unique_ptr<curl_slist, FreeList>;
 
-// A handle with the connections that it keeps. The sockets are known by number, so that a child
-// process can close its copies without a word on the wire.
-struct Connection {
-    std::set<curl_socket_t> sockets;
-    CaState caState;
-    bool blNamesProxy = false;  // whether the environment did when the handle was made
-    std::array<char, CURL_ERROR_SIZE> reason = {};
-    // What TLS said in the latest exchange.
-    bool blEndAnnounced = false;
-    bool blCertificateAsked = false;  // of this client
-    // Goes first: cleaning it up closes its sockets, which calls back to the set above.
-    std::unique_ptr<CURL, CleanupEasy> pEasy;
-};
-
-// All handles of the process, idle and in use. Never destroyed: other threads may still be in an
-// exchange while the process ends.
-struct Pool {
-    std::mutex mutex;
-    std::vector<std::unique_ptr<Connection>> idle;
-    std::set<Connection *> inUse;
-    std::vector<Connection *> abandoned;
-};
-
-Pool &ThePool() {
-    static auto *const pPool = new Pool;
-    return *pPool;
-}
-
-void LockBeforeFork() {
-    ThePool().mutex.lock();
-}
-
-void UnlockInParent() {
-    ThePool().mutex.unlock();
-}
-
-// The child closes its copies of the sockets and forgets the handles without cleaning them up: an
-// orderly end of a TLS connection would end the parent's.
-void AbandonInChild() {
-    Pool &pool = ThePool();
-    for (auto &pConnection : pool.idle) {
-        pool.abandoned.push_back(pConnection.release());
-    }
-    pool.abandoned.insert(pool.abandoned.end(), pool.inUse.begin(), pool.inUse.end());
-    pool.idle.clear();
-    pool.inUse.clear();
-    for (Connection *pConnection : pool.abandoned) {
-        for (curl_socket_t fd : pConnection->sockets) {
-            close(fd);
-        }
-        pConnection->sockets.clear();
-        pConnection->caState = CaState();
-    }
-    pool.mutex.unlock();
-}
-
-const int g_forkHandlers = pthread_atfork(LockBeforeFork, UnlockInParent, AbandonInChild);
-
 // --- Callbacks: they run inside libcurl, so nothing may be thrown out of them -------------------
-
-curl_socket_t OpenSocket(void *pContext, curlsocktype /*purpose*/, curl_sockaddr *pAddress) {
-    const int fd = socket(pAddress->family, pAddress->socktype | SOCK_CLOEXEC, pAddress->protocol);
-    if (fd < 0) {
-        return CURL_SOCKET_BAD;
-    }
-    try {
-        const std::lock_guard<std::mutex> lock(ThePool().mutex);
-        static_cast<Connection *>(pContext)->sockets.insert(fd);
-        return fd;
-    } catch (const std::bad_alloc &) {
-        close(fd);
-        return CURL_SOCKET_BAD;
-    }
-}
-
-int CloseSocket(void *pContext, curl_socket_t fd) {
-    const std::lock_guard<std::mutex> lock(ThePool().mutex);
-    static_cast<Connection *>(pContext)->sockets.erase(fd);
-    return close(fd);
-}
 
 struct Transfer {
     const HttpRequest &request;
@@ -223,58 +122,9 @@ int ShowProgress(void *pContext, curl_off_t cbExpected, curl_off_t /*cbReceived*
     return pTransfer->blStopped ? 1 : 0;
 }
 
-// Puts the cipher first where it is allowed; what the system's configuration leaves out stays out.
-void PreferCipher(SSL_CTX *pTls) {
-    std::string strFirst;
-    std::string strOthers;
-    const STACK_OF(SSL_CIPHER) *pCiphers = SSL_CTX_get_ciphers(pTls);
-    for (int i = 0; i < sk_SSL_CIPHER_num(pCiphers); ++i) {
-        const SSL_CIPHER *pCipher = sk_SSL_CIPHER_value(pCiphers, i);
-        const std::string_view name = SSL_CIPHER_get_name(pCipher);
-        if (name == kFirstCipher) {
-            strFirst = name;
-        } else if (SSL_CIPHER_get_version(pCipher) == std::string_view("TLSv1.3")) {
-            strOthers.append(":").append(name);
-        }
-    }
-    if (!strFirst.empty()) {
-        static_cast<void>(SSL_CTX_set_ciphersuites(pTls, (strFirst + strOthers).c_str()));
-    }
-}
+// --- Options ------------------------------------------------------------------------------------
 
-Connection *ConnectionOf(const SSL *pTls) {
-    return static_cast<Connection *>(SSL_CTX_get_app_data(SSL_get_SSL_CTX(pTls)));
-}
-
-// libcurl does not tell an end that TLS announces from one that anybody on the way can make.
-void NoteAlert(const SSL *pTls, int where, int alert) {
-    if (where == SSL_CB_READ_ALERT && (alert & 0xFF) == SSL_AD_CLOSE_NOTIFY) {
-        ConnectionOf(pTls)->blEndAnnounced = true;
-    }
-}
-
-int NoteCertificateRequest(SSL *pTls, X509 ** /*ppCertificate*/, EVP_PKEY ** /*ppKey*/) {
-    ConnectionOf(pTls)->blCertificateAsked = true;
-    return 0;  // there is none
-}
-
-CURLcode SetUpTls(CURL * /*pEasy*/, void *pSslContext, void *pConnection) {
-    try {
-        auto *const pTls = static_cast<SSL_CTX *>(pSslContext);
-        SSL_CTX_set_app_data(pTls, pConnection);
-        SSL_CTX_set_info_callback(pTls, NoteAlert);
-        SSL_CTX_set_client_cert_cb(pTls, NoteCertificateRequest);
-        PreferCipher(pTls);
-        X509_STORE *pStore = SSL_CTX_get_cert_store(pTls);
-        return AddApplianceCa(pStore) ? CURLE_OK : CURLE_SSL_CACERT_BADFILE;
-    } catch (const std::bad_alloc &) {
-        return CURLE_OUT_OF_MEMORY;
-    }
-}
-
-// --- What every exchange on a handle has in common ----------------------------------------------
-
-void SetTransport(CURL *pEasy, Connection *pConnection) {
+void SetTransport(CURL *pEasy) {
     curl_easy_setopt(pEasy, CURLOPT_NOSIGNAL, 1L);
     curl_easy_setopt(pEasy, CURLOPT_PROTOCOLS_STR, "http,https");
     curl_easy_setopt(pEasy, CURLOPT_FOLLOWLOCATION, 0L);
@@ -286,108 +136,11 @@ void SetTransport(CURL *pEasy, Connection *pConnection) {
     curl_easy_setopt(pEasy, CURLOPT_LOW_SPEED_TIME, kStallTime_s);
     curl_easy_setopt(pEasy, CURLOPT_UPLOAD_BUFFERSIZE, kUploadBuffer);
     curl_easy_setopt(pEasy, CURLOPT_SUPPRESS_CONNECT_HEADERS, 1L);
-    curl_easy_setopt(pEasy, CURLOPT_OPENSOCKETFUNCTION, OpenSocket);
-    curl_easy_setopt(pEasy, CURLOPT_OPENSOCKETDATA, pConnection);
-    curl_easy_setopt(pEasy, CURLOPT_CLOSESOCKETFUNCTION, CloseSocket);
-    curl_easy_setopt(pEasy, CURLOPT_CLOSESOCKETDATA, pConnection);
-    curl_easy_setopt(pEasy, CURLOPT_SSLVERSION, static_cast<long>(CURL_SSLVERSION_TLSv1_2));
-    curl_easy_setopt(pEasy, CURLOPT_SSL_VERIFYPEER, 1L);
-    curl_easy_setopt(pEasy, CURLOPT_SSL_VERIFYHOST, 2L);
-    curl_easy_setopt(pEasy, CURLOPT_SSL_CTX_FUNCTION, SetUpTls);
-    curl_easy_setopt(pEasy, CURLOPT_SSL_CTX_DATA, pConnection);
-    // A session that is resumed is not verified again.
-    curl_easy_setopt(pEasy, CURLOPT_SSL_SESSIONID_CACHE, 0L);
-    curl_easy_setopt(pEasy, CURLOPT_MAXAGE_CONN, kMaxIdle_s);
     curl_easy_setopt(pEasy, CURLOPT_PREREQFUNCTION, AllowSending);
     curl_easy_setopt(pEasy, CURLOPT_HEADERFUNCTION, TakeHeader);
     curl_easy_setopt(pEasy, CURLOPT_WRITEFUNCTION, TakeBody);
     curl_easy_setopt(pEasy, CURLOPT_XFERINFOFUNCTION, ShowProgress);
-    curl_easy_setopt(pEasy, CURLOPT_ERRORBUFFER, pConnection->reason.data());
 }
-
-// Whether the environment names a proxy, in one of the variables that libcurl looks at. Where it
-// names none, as on most appliances, an exchange need not read the configuration.
-bool NamesProxy() {
-    constexpr std::array<const char *, 5> kVariables = {"http_proxy", "https_proxy", "HTTPS_PROXY",
-                                                        "all_proxy", "ALL_PROXY"};
-    return std::any_of(kVariables.begin(), kVariables.end(),
-                       [](const char *szName) { return std::getenv(szName) != nullptr; });
-}
-
-// --- Pool ---------------------------------------------------------------------------------------
-
-// A handle borrowed from the pool, given back when the exchange is over.
-class Borrowed {
-  public:
-    Borrowed() {
-        static const CURLcode globalInit = curl_global_init(CURL_GLOBAL_DEFAULT);
-        if (globalInit != CURLE_OK) {
-            return;
-        }
-        m_pConnection = TakeIdle();
-        if (m_pConnection == nullptr) {
-            m_pConnection = std::make_unique<Connection>();
-            m_pConnection->pEasy.reset(curl_easy_init());
-            m_pConnection->caState = CaState::Now();
-            m_pConnection->blNamesProxy = NamesProxy();
-        }
-        const std::lock_guard<std::mutex> lock(ThePool().mutex);
-        ThePool().inUse.insert(m_pConnection.get());
-    }
-    ~Borrowed() {
-        if (m_pConnection == nullptr) {
-            return;
-        }
-        Pool &pool = ThePool();
-        const std::lock_guard<std::mutex> lock(pool.mutex);
-        pool.inUse.erase(m_pConnection.get());
-        if (pool.idle.size() < pool.idle.capacity() && m_pConnection->pEasy != nullptr) {
-            pool.idle.push_back(std::move(m_pConnection));
-        }
-    }
-    Borrowed(const Borrowed &) = delete;
-    Borrowed &operator=(const Borrowed &) = delete;
-
-    CURL *Easy() const { return m_pConnection == nullptr ? nullptr : m_pConnection->pEasy.get(); }
-    Connection *Get() const { return m_pConnection.get(); }
-
-  private:
-    // Between exchanges nothing comes but the other side's end. libcurl takes TLS's for data.
-    static bool IsQuiet(const Connection &connection) {
-        return std::all_of(connection.sockets.begin(), connection.sockets.end(),
-                           [](curl_socket_t fd) {
-                               pollfd look = {fd, POLLIN, 0};
-                               return poll(&look, 1, 0) == 0;
-                           });
-    }
-
-    // Connections that have ended, or that were verified against another set of authorities, are
-    // not used again.
-    static std::unique_ptr<Connection> TakeIdle() {
-        Pool &pool = ThePool();
-        std::unique_ptr<Connection> pConnection;
-        while (true) {
-            {
-                const std::lock_guard<std::mutex> lock(pool.mutex);
-                pool.idle.reserve(kMaxIdle);
-                if (pool.idle.empty()) {
-                    return nullptr;
-                }
-                pConnection = std::move(pool.idle.back());
-                pool.idle.pop_back();
-            }
-            if (pConnection->caState.Holds() && IsQuiet(*pConnection)) {
-                return pConnection;
-            }
-            // Outside the lock: closing a connection calls back into the pool.
-            pConnection.reset();
-        }
-    }
-
-    std::unique_ptr<Connection> m_pConnection;
-};
-
-// --- What each exchange on a handle sets anew ---------------------------------------------------
 
 // Chooses the way: through the relay, as the environment says where the configuration allows it, or
 // direct. False when the relay is asked for and none is named.
@@ -456,14 +209,6 @@ void SetRequest(CURL *pEasy, const HttpRequest &request, const curl_slist *pHead
     curl_easy_setopt(pEasy, CURLOPT_POSTFIELDS, request.strBody.c_str());
     curl_easy_setopt(pEasy, CURLOPT_POSTFIELDSIZE_LARGE,
                      static_cast<curl_off_t>(request.strBody.size()));
-}
-
-// Whether the text holds nothing but letters, digits, '.', '-', '_' and the one other character.
-bool IsPlain(const std::string &strText, char other) {
-    return std::all_of(strText.begin(), strText.end(), [other](char c) {
-        return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || (c >= '0' && c <= '9') ||
-               c == '.' || c == '-' || c == '_' || c == other;
-    });
 }
 
 // "https://host:port" of an URL.
@@ -606,9 +351,7 @@ int Perform(const HttpRequest &request, HttpReply &reply) {
     if (pEasy == nullptr || !BuildHeaders(request, headers)) {
         return Fail(ZELO::CRED_REQ_ERR_MEMORY, request, "out of memory", __LINE__);
     }
-    // Forgets the options of the exchange before, and how often libcurl has sent one again.
-    curl_easy_reset(pEasy);
-    SetTransport(pEasy, connection.Get());
+    SetTransport(pEasy);
     if (!SetWay(*connection.Get(), request.blRelay)) {
         return Fail(ZELO::CRED_REQ_ERR_NETWORK, request,
                     "no relay: set farlink_relay=\"host:port\" in /etc/zeloinfo.conf", __LINE__);
@@ -624,12 +367,6 @@ std::string BuildUrl(const std::string &strScheme, const std::string &strHost, l
                                       [](unsigned char c) { return c <= ' ' || c == 0x7F; });
     if (port < 1 || port > 65535 || !blPlain) {
         return {};
-    }
-    // Plain parts, as nearly all are, make an URL as they stand; all others are left to libcurl.
-    if (!strHost.empty() && IsPlain(strHost, '.') && IsPlain(strPath, '/') &&
-        IsPlain(strQuery, '=') && strQuery.find('=') == strQuery.rfind('=')) {
-        return strScheme + "://" + strHost + ':' + std::to_string(port) + strPath +
-               (strQuery.empty() ? "" : "?") + strQuery;
     }
     const bool blBareIPv6 = strHost.find(':') != std::string::npos && strHost.front() != '[';
     const std::string strUrlHost = blBareIPv6 ? '[' + strHost + ']' : strHost;
