@@ -87,6 +87,13 @@ Outcome Fetch(const std::string &strPath, const ApiCall &call, Json::Value &para
     return YLIBCErrGet() == YLIBC_ERR_UNCHANGED ? Outcome::kUnchanged : Outcome::kFetched;
 }
 
+// Of the file that is there; where none is, as at a pipe, of what was written.
+Json::Int64 SizeOf(const std::string &strPath, const Progress &progress) {
+    struct stat status = {};
+    const bool blFile = stat(strPath.c_str(), &status) == 0 && S_ISREG(status.st_mode);
+    return blFile ? status.st_size : progress.Bytes();
+}
+
 ExitCode Tell(Outcome outcome, const std::string &strPath, const Progress &progress,
               Report &report) {
     if (outcome == Outcome::kFailed) {
@@ -100,7 +107,7 @@ ExitCode Tell(Outcome outcome, const std::string &strPath, const Progress &progr
     }
     report.Fact("path", strPath);
     report.Fact("unchanged", outcome == Outcome::kUnchanged);
-    report.Fact("bytes", static_cast<Json::Int64>(progress.Bytes()));
+    report.Fact("bytes", SizeOf(strPath, progress));
     return report.Done();
 }
 

@@ -113,6 +113,12 @@ int VerifyAndWatch(X509_STORE_CTX *pContext, void *pArgument) {
     return result;
 }
 
+int NoteCertificateRequest(SSL *pTls, X509 ** /*ppCertificate*/, EVP_PKEY ** /*ppKey*/) {
+    auto *const pTransfer = static_cast<Transfer *>(SSL_CTX_get_app_data(SSL_get_SSL_CTX(pTls)));
+    pTransfer->probe.blCertificateAsked = true;
+    return 0;  // there is none
+}
+
 // --- libcurl's callbacks: nothing may be thrown out of them -------------------------------------
 
 CURLcode SetUpTls(CURL * /*pEasy*/, void *pSslContext, void *pArgument) {
@@ -123,6 +129,8 @@ CURLcode SetUpTls(CURL * /*pEasy*/, void *pSslContext, void *pArgument) {
         return CURLE_SSL_CACERT_BADFILE;
     }
     SSL_CTX_set_cert_verify_callback(pContext, VerifyAndWatch, pArgument);
+    SSL_CTX_set_app_data(pContext, pArgument);
+    SSL_CTX_set_client_cert_cb(pContext, NoteCertificateRequest);
     return CURLE_OK;
 }
 
@@ -279,7 +287,8 @@ Probe RunProbe(const Way &way, Extent extent, const char *szPath, const std::str
     const Easy pEasy(globalInit == CURLE_OK ? curl_easy_init() : nullptr);
     const Url pUrl = BuildUrl(way, extent, szPath, strQuery);
     const Headers pHeaders(curl_slist_append(nullptr, "Accept: application/json"));
-    if (pEasy == nullptr || pUrl == nullptr || pHeaders == nullptr) {
+    if (pEasy == nullptr || pUrl == nullptr ||
+        curl_slist_append(pHeaders.get(), "Accept-Encoding: identity") == nullptr) {
         probe.strReason = "the host or the port cannot stand in an URL";
         return probe;
     }

@@ -57,6 +57,7 @@ struct Probe {
     long relayStatus = 0;                // the relay's answer, 0 for none
     std::string strTlsVersion;
     Certificate certificate;
+    bool blCertificateAsked = false;  // the server asked for one of this client
     long duration_ms = 0;
 
     long status = 0;  // of HTTP, 0 for no answer

@@ -124,7 +124,7 @@ bool CertificateAuthority::Issue(const CertificateRequest &request,
     if (!pCertificate) {
         return false;
     }
-    certificate = {std::move(pKey), std::move(pCertificate)};
+    certificate = {std::move(pKey), std::move(pCertificate), request.of_clients};
     return true;
 }
 

@@ -35,11 +35,13 @@ struct CertificateRequest {
     std::vector<std::string> names = {"localhost", "127.0.0.1", "::1"};  // host names or addresses
     std::time_t not_before = std::time(nullptr) - kHour;
     std::time_t not_after = std::time(nullptr) + 30 * kDay;
+    bool of_clients = false;  // the server demands a certificate of its clients too
 };
 
 struct ServerCertificate {
     KeyOwner pKey;
     X509Owner pCertificate;
+    bool blOfClients = false;
 };
 
 class CertificateAuthority {

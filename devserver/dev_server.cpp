@@ -269,11 +269,11 @@ void DevServer::Handle(const char *szScheme, const httplib::Request &request,
                        httplib::Response &response) {
     const auto pause = [this](int ms) { return Delay(ms); };
     if (request.path.rfind("/dev/", 0) == 0) {
-        Send(HandleDevelopment(request), {}, pause, response);
+        Send(HandleDevelopment(request), {}, pause, {}, response);
         return;
     }
     if (request.method == "GET" && request.path == "/") {
-        Send(ToConsole(), {}, pause, response);
+        Send(ToConsole(), {}, pause, {}, response);
         return;
     }
     const Call call(request);
@@ -281,7 +281,13 @@ void DevServer::Handle(const char *szScheme, const httplib::Request &request,
     const NextAnswer answer = TakeAnswer(call).value_or(NextAnswer{});
     Delay(answer.delay_ms);
     const bool blTold = answer.status || answer.body || answer.error_code;
-    Send(blTold ? AsTold(answer) : HandleOrdinarily(call), answer, pause, response);
+    const Reply reply = blTold ? AsTold(answer) : HandleOrdinarily(call);
+    const LoopbackListener &listener = request.ssl == nullptr ? m_http : m_https;
+    if (answer.no_reply) {
+        listener.End(request, true);
+    }
+    const auto end = [&listener, &request] { listener.End(request, false); };
+    Send(reply, answer, pause, end, response);
 }
 
 Reply DevServer::HandleDevelopment(const httplib::Request &request) {

@@ -19,17 +19,26 @@ constexpr time_t kSilentClient_s = 60;
 constexpr std::size_t kMaxRequestBody = 16UL << 20U;
 constexpr const char *kAnyPath = "[\\s\\S]*";
 
+using AddressOf = decltype(getsockname);
+
+// -1 for what is no socket with a port.
+int PortOf(int fd, AddressOf *pfnAddressOf) {
+    // The port stands at the same place in the addresses of both families.
+    sockaddr_in6 address{};
+    socklen_t cb = sizeof(address);
+    const bool blHasPort = pfnAddressOf(fd, reinterpret_cast<sockaddr *>(&address), &cb) == 0 &&
+                           (address.sin6_family == AF_INET || address.sin6_family == AF_INET6);
+    return blHasPort ? ntohs(address.sin6_port) : -1;
+}
+
 // The HTTP library waits for the next request of an idle connection until its time is over, even
 // when it is stopped, and does not tell which sockets it accepted: they are those whose own port is
 // the one listened on. Descriptors beyond select()'s limit it does not wait for.
-void ShutDownConnections(int port) {
+// All of them, or the one with this port at its other end.
+void ShutDownConnections(int port, int peerPort = 0) {
     for (int fd = 0; fd < FD_SETSIZE; ++fd) {
-        // The port stands at the same place in the addresses of both families.
-        sockaddr_in6 local{};
-        socklen_t cb = sizeof(local);
-        if (getsockname(fd, reinterpret_cast<sockaddr *>(&local), &cb) == 0 &&
-            (local.sin6_family == AF_INET || local.sin6_family == AF_INET6) &&
-            ntohs(local.sin6_port) == port) {
+        if (PortOf(fd, getsockname) == port &&
+            (peerPort == 0 || PortOf(fd, getpeername) == peerPort)) {
             shutdown(fd, SHUT_RDWR);
         }
     }
@@ -52,6 +61,10 @@ std::unique_ptr<httplib::Server> MakeServer(const ServerCertificate *pCertificat
         return std::make_unique<httplib::Server>();
     }
     return std::make_unique<httplib::SSLServer>([pCertificate](SSL_CTX &context) {
+        if (pCertificate->blOfClients) {
+            SSL_CTX_set_verify(&context, SSL_VERIFY_PEER | SSL_VERIFY_FAIL_IF_NO_PEER_CERT,
+                               nullptr);
+        }
         return SSL_CTX_set_min_proto_version(&context, TLS1_2_VERSION) == 1 &&
                SSL_CTX_use_certificate(&context, pCertificate->pCertificate.get()) == 1 &&
                SSL_CTX_use_PrivateKey(&context, pCertificate->pKey.get()) == 1;
@@ -122,6 +135,15 @@ bool LoopbackListener::Start(const std::string &strHost, int port,
         }
     }
     return true;
+}
+
+void LoopbackListener::End(const httplib::Request &request, bool blAbruptly) const {
+    if (request.ssl != nullptr && !blAbruptly) {
+        SSL_shutdown(const_cast<SSL *>(request.ssl));
+        shutdown(SSL_get_fd(request.ssl), SHUT_RD);  // no request is read any more
+    } else {
+        ShutDownConnections(m_port, request.remote_port);
+    }
 }
 
 void LoopbackListener::Stop() {

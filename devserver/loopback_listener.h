@@ -36,6 +36,10 @@ class LoopbackListener {
     bool Start(const std::string &strHost, int port, const ServerCertificate *pCertificate,
                const Handler &handler, std::string &strReason);
 
+    // Ends the connection of a request that is being served. Over TLS it ends in TLS's own way
+    // alone, so that the reply before gets there, unless abruptly.
+    void End(const httplib::Request &request, bool blAbruptly) const;
+
     // Ends every connection and returns when no thread is left. A handler is waited for.
     void Stop();
 

@@ -66,6 +66,9 @@ constexpr AnswerMember kMembers[] = {
     {"cut_after", [](V v, A a) { return ReadNumber(v, 0, kMaxInt, a.cut_after); }},
     {"bytes_per_s", [](V v, A a) { return ReadNumber(v, 0, kMaxInt, a.bytes_per_s); }},
     {"endless", [](V v, A a) { return ReadFlag(v, a.endless); }},
+    {"no_length", [](V v, A a) { return ReadFlag(v, a.no_length); }},
+    {"no_reply", [](V v, A a) { return ReadFlag(v, a.no_reply); }},
+    {"closes", [](V v, A a) { return ReadFlag(v, a.closes); }},
     {"times", [](V v, A a) { return ReadNumber(v, 1, kMaxInt, a.times); }},
 };
 

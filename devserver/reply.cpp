@@ -19,8 +19,8 @@ constexpr int kSecond_ms = 1000;
 // The body piece by piece, at the rate that is asked for.
 class Pieces {
   public:
-    Pieces(const Reply &reply, const NextAnswer &answer, Pause pause)
-        : m_reply(reply), m_answer(answer), m_pause(std::move(pause)) {}
+    Pieces(const Reply &reply, const NextAnswer &answer, Pause pause, End end)
+        : m_reply(reply), m_answer(answer), m_pause(std::move(pause)), m_end(std::move(end)) {}
 
     std::uint64_t Size() const {
         return m_reply.pFile != nullptr ? m_reply.pFile->Size() : m_reply.strBody.size();
@@ -42,10 +42,23 @@ class Pieces {
             cb = std::min<std::uint64_t>(cb, blSlow ? 1 : bytes_per_s * kTick_ms / kSecond_ms);
         }
         const std::string strPiece = PieceAt(offset, cb);
-        return sink.write(strPiece.data(), strPiece.size());
+        if (!sink.write(strPiece.data(), strPiece.size())) {
+            return false;
+        }
+        if (EndsInOrder() && offset + strPiece.size() == Size()) {
+            m_end();
+            if (m_answer.no_length) {
+                sink.done();
+            }
+        }
+        return true;
     }
 
   private:
+    bool EndsInOrder() const {
+        return !m_answer.cut_after && (m_answer.closes || m_answer.no_length);
+    }
+
     static constexpr std::uint64_t kNoEnd = ~std::uint64_t{0};
 
     // Past the end of an endless body come blanks.
@@ -62,6 +75,7 @@ class Pieces {
     Reply m_reply;
     NextAnswer m_answer;
     Pause m_pause;
+    End m_end;
 };
 
 // Such as "Sun, 06 Nov 1994 08:49:37 GMT", whatever the language of the process.
@@ -86,7 +100,7 @@ Reply JsonReply(int status, const Json::Value &value) {
     return reply;
 }
 
-void Send(const Reply &reply, const NextAnswer &answer, const Pause &pause,
+void Send(const Reply &reply, const NextAnswer &answer, const Pause &pause, const End &end,
           httplib::Response &response) {
     response.status = reply.status;
     // A header that is set twice goes out twice.
@@ -102,13 +116,19 @@ void Send(const Reply &reply, const NextAnswer &answer, const Pause &pause,
     const std::string strType = typeOf == answer.headers.end() ? reply.strType : typeOf->second;
     response.headers.erase("Content-Type");
 
-    const auto pPieces = std::make_shared<const Pieces>(reply, answer, pause);
+    const auto pPieces = std::make_shared<const Pieces>(reply, answer, pause, end);
     if (answer.endless) {
         response.set_chunked_content_provider(
             strType, [pPieces](std::size_t offset, httplib::DataSink &sink) {
                 return pPieces->Write(offset, sink);
             });
-    } else if (reply.pFile != nullptr || answer.cut_after || answer.bytes_per_s > 0) {
+    } else if (answer.no_length) {
+        response.set_content_provider(strType,
+                                      [pPieces](std::size_t offset, httplib::DataSink &sink) {
+                                          return pPieces->Write(offset, sink);
+                                      });
+    } else if (reply.pFile != nullptr || answer.cut_after || answer.bytes_per_s > 0 ||
+               answer.closes) {
         // A cut reply promises more than it sends; giving up half-way is what closes.
         const std::uint64_t promised =
             std::max<std::uint64_t>(pPieces->Size(), answer.cut_after ? *answer.cut_after + 1 : 0);

@@ -32,9 +32,12 @@ Reply JsonReply(int status, const Json::Value &value);
 // Waits so many milliseconds; false when the server is ending.
 using Pause = std::function<bool(int ms)>;
 
+// Ends the connection, in its own way.
+using End = std::function<void()>;
+
 // Makes the response out of the reply, with the headers, the rate and the end that the answer asks
 // for.
-void Send(const Reply &reply, const NextAnswer &answer, const Pause &pause,
+void Send(const Reply &reply, const NextAnswer &answer, const Pause &pause, const End &end,
           httplib::Response &response);
 
 }  // namespace devserver

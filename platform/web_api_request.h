@@ -2,21 +2,29 @@
 //
 // A server is described by a credential record (credential_store.h) with three fields set:
 // protocol, host and port. The protocols are
-//     "https"  HTTP over TLS; the server's certificate and name are verified
+//     "https"  HTTP over TLS; the server's certificate and name are verified as
+//              certificate_authorities.h says
 //     "http"   plain HTTP
 //     "fld"    HTTPS through the platform's relay
-// and any other value fails. A request is built, sent once with Process, and read.
+// and any other value fails. A request is built, sent with Process, and read.
 //
 // What holds for every operation
 //   - Only http and https are ever spoken, a redirect is never followed, and a token goes only to
 //     the host and port of the record.
-//   - Every exchange ends by itself: connecting is limited, a stalled transfer is ended, and a body
-//     in memory has a largest size. One that goes to a stream may be of any size and takes as long
-//     as it moves; a full disk ends it, or the observer.
+//   - A call goes out at most once. When its connection ends before the reply, the request fails,
+//     and the server may have carried it out or not. The question for a path may be asked again.
+//   - A reply counts when it is there to its end. One whose body ends with the connection, instead
+//     of by a length or chunks, has its end announced by TLS; over plain HTTP, nothing tells that
+//     it is cut. A body with an encoding fails, since none is asked for.
+//   - Every exchange ends by itself: connecting has 10 s from the look-up of the name to the end of
+//     the TLS handshake, for all addresses of the name together, a stalled transfer is ended, and a
+//     body in memory has a largest size. One that goes to a stream may be of any size and takes as
+//     long as it moves; a full disk ends it, or the observer.
 //   - No operation throws, except that one which returns a std::string may throw std::bad_alloc.
-//   - Connections stay open between requests of one process and are used again. A child process
-//     after fork makes its own. Requests may be used in several threads at once, each request by
-//     one thread at a time.
+//   - Connections stay open between requests of one process and are used again within about 3 s,
+//   unless
+//     the server has closed them. A child process after fork makes its own. Requests may be used in
+//     several threads at once, each request by one thread at a time.
 //   - A failure sets the last error (last_error.h).
 
 #ifndef ZELO_PLATFORM_WEB_API_REQUEST_H
@@ -46,7 +54,7 @@ enum CRED_REQ_ERROR {
     CRED_REQ_ERR_NONE = 0,
     CRED_REQ_ERR_ARGUMENT = 1,  // the request has no URL, or its parameters cannot be written
     CRED_REQ_ERR_NETWORK = 2,   // no whole reply arrived
-    CRED_REQ_ERR_REPLY = 3,     // the reply is too large
+    CRED_REQ_ERR_REPLY = 3,     // the reply is too large, or its body is encoded
     CRED_REQ_ERR_STATUS = 4,    // a response stream was set, and the reply's HTTP status is not 2xx
     CRED_REQ_ERR_STREAM = 5,    // the response stream could not be written
     CRED_REQ_ERR_STOPPED = 6,   // the progress observer ended the transfer
@@ -72,9 +80,11 @@ ZELO_PLATFORM_API std::string GetWebAPIPath(const ZELO_CRED *pCred, const std::s
 ZELO_PLATFORM_API bool SetWebAPIURL(const ZELO_CRED *pCred, const std::string &api, int ver,
                                     const std::string &method, CredRequest *pRequest);
 
-// Called now and then during every exchange of the same thread: with the bytes written to a
-// response stream so far and, when the server has said so, the number of bytes to expect, else -1.
-// Returning false ends the exchange. It must not throw.
+// Called in every exchange of the thread that set it, discoveries included: about once a second or
+// more often from the look-up of the name on, and at the end. Not while the response stream keeps a
+// write waiting. Gets the bytes written to a response stream so far and, when the server has said
+// how long the body is and it is not empty, that length, else -1. Returning false ends the exchange
+// and fails it, also at the end. It must not throw.
 typedef bool (*ProgressObserver)(void *pContext, long long cbWritten, long long cbExpected);
 
 // Sets the observer of the calling thread's requests; null for none, as at the start of a thread.

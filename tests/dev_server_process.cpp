@@ -85,6 +85,9 @@ void DevServerProcess::AnswerNext(const std::string &strApi,
     next["delay_ms"] = answer.delay_ms;
     next["bytes_per_s"] = answer.bytes_per_s;
     next["endless"] = answer.endless;
+    next["no_length"] = answer.no_length;
+    next["no_reply"] = answer.no_reply;
+    next["closes"] = answer.closes;
     next["times"] = answer.times;
     next["headers"] = Json::objectValue;
     for (const auto &[strName, strValue] : answer.headers) {

@@ -601,9 +601,18 @@ TEST_F(SendWebapi, AnErrorPageIsNoFile) {
     devserver::NextAnswer cut;
     cut.method = "get";
     cut.cut_after = 1000;
-    s_pServer->AnswerNext(kFileApi, cut);
+    for (const bool blNoLength : {false, true}) {
+        cut.no_length = blNoLength;
+        s_pServer->AnswerNext(kFileApi, cut);
+        EXPECT_EQ(Download(), "-1");
+        EXPECT_EQ(DownloadState(), "1000");
+    }
+    devserver::NextAnswer encoded;
+    encoded.method = "get";
+    encoded.headers["Content-Encoding"] = "gzip";
+    s_pServer->AnswerNext(kFileApi, encoded);
     EXPECT_EQ(Download(), "-1");
-    EXPECT_EQ(DownloadState(), "1000");
+    EXPECT_EQ(DownloadState(), "0");
     EXPECT_EQ(Download("/dev/full"), "-1") << "a full disk is an error";
     Json::Value array(Json::arrayValue);
     EXPECT_EQ(Download(), "0");

@@ -1,6 +1,9 @@
 // What a Web API request promises about the wire: whom it trusts, where it goes, when it gives up.
 
 #include <gtest/gtest.h>
+#include <netinet/in.h>
+#include <poll.h>
+#include <sys/socket.h>
 
 #include <chrono>
 #include <climits>
@@ -42,6 +45,23 @@ std::string PathOf(const char *szProtocol, int port, const char *szHost = "local
     return ZELO::CredRequestUtil::GetWebAPIPath(ServerAt(szProtocol, port, szHost).get(), kApi);
 }
 
+// Waits until the server has ended a connection that this process keeps.
+void AwaitEnd(int port) {
+    const auto end = std::chrono::steady_clock::now() + std::chrono::seconds(10);
+    while (std::chrono::steady_clock::now() < end) {
+        for (int fd = 3; fd < 64; ++fd) {
+            sockaddr_in peer = {};
+            socklen_t cb = sizeof(peer);
+            pollfd look = {fd, POLLIN, 0};
+            if (getpeername(fd, reinterpret_cast<sockaddr *>(&peer), &cb) == 0 &&
+                ntohs(peer.sin_port) == port && poll(&look, 1, 0) == 1) {
+                return;
+            }
+        }
+    }
+    ADD_FAILURE() << "the server keeps its connections";
+}
+
 class Request : public testing::Test {
   protected:
     void SetUp() override {
@@ -64,6 +84,24 @@ class Request : public testing::Test {
     }
     std::string Https() const { return PathOf("https", m_pServer->HttpsPort()); }
     std::string Http() const { return PathOf("http", m_pServer->HttpPort()); }
+    // A call that the server answers as it is told to; whether it got a reply.
+    bool Call(const char *szProtocol, devserver::NextAnswer answer) {
+        const bool blTls = szProtocol == std::string("https");
+        const Cred pCred =
+            ServerAt(szProtocol, blTls ? m_pServer->HttpsPort() : m_pServer->HttpPort());
+        ZELO::CredRequest request;
+        EXPECT_TRUE(ZELO::CredRequestUtil::SetWebAPIURL(pCred.get(), kApi, 1, "join", &request));
+        answer.method = "join";
+        m_pServer->AnswerNext(kApi, answer);
+        return request.Process(true, 0);
+    }
+    int CountOf(const char *szMethod) const {
+        int count = 0;
+        for (const Json::Value &request : m_pServer->Requests()) {
+            count += request["api_method"] == szMethod ? 1 : 0;
+        }
+        return count;
+    }
     void AnswerDiscovery(devserver::NextAnswer answer) {
         answer.method = "discover";
         m_pServer->AnswerNext(kApi, answer);
@@ -82,10 +120,7 @@ TEST_F(Request, OnlyAVerifiedServerIsSpokenTo) {
     Write(kCaFile, m_pServer->CaPem());
     EXPECT_EQ(Https(), "/qrm/rpc");
     std::ofstream(kCaFile) << "no certificate";
-    const auto end = std::chrono::steady_clock::now() + std::chrono::seconds(10);
-    while (!Https().empty() && std::chrono::steady_clock::now() < end) {
-    }
-    EXPECT_EQ(Https(), "") << "a file that is written to is another one, after a second at most";
+    EXPECT_EQ(Https(), "") << "a file that is written to is another one";
     Write(kCaFile, m_pServer->CaPem());
     EXPECT_EQ(Https(), "/qrm/rpc");
     Write(kOtherCaFile, "no certificate");
@@ -172,17 +207,64 @@ TEST_F(Request, UnusableAnswersCountAsNone) {
     cut.cut_after = 5;
     devserver::NextAnswer endless;
     endless.endless = true;
+    devserver::NextAnswer encoded;
+    encoded.headers["Content-Encoding"] = "gzip";
     for (const devserver::NextAnswer &answer :
          {body("<html>"), body(""), body("[]"), body("7"), body(R"({"success":"yes"})"),
           body(R"({"success":true,"data":[]})"), body(R"({"success":true,"data":{"path":1}})"),
           path("relative"), path(""), path("/a b"), path("/a?b"), path("/a\\r\\nX: y"),
           path("/" + std::string(2000, 'a')), endless,
           body(std::string(2000, '[') + std::string(2000, ']')),
-          body(R"({"success":true,"data":{"path":"/x"}})", 500), redirect, cut}) {
+          body(R"({"success":true,"data":{"path":"/x"}})", 500), redirect, cut, encoded}) {
         AnswerDiscovery(answer);
         EXPECT_EQ(Http(), "") << answer.body.value_or("").substr(0, 60);
     }
+    encoded.headers["Content-Encoding"] = "identity";
+    AnswerDiscovery(encoded);
     EXPECT_EQ(Http(), "/qrm/rpc");
+    EXPECT_EQ(m_pServer->Requests()[0]["headers"]["Accept-Encoding"], "identity");
+}
+
+// Without a length a body ends with its connection. Over TLS that has to be announced.
+TEST_F(Request, ACutReplyIsNoReply) {
+    devserver::NextAnswer answer;
+    answer.no_length = true;
+    for (const bool blCut : {false, true}) {
+        if (blCut) {
+            answer.body = R"({"success":true,"data":{"path":"/x"}})";
+            answer.cut_after = answer.body->size();
+        }
+        AnswerDiscovery(answer);
+        EXPECT_EQ(Https(), blCut ? "" : "/qrm/rpc");
+        AnswerDiscovery(answer);
+        EXPECT_EQ(Http(), blCut ? "/x" : "/qrm/rpc") << "TCP alone does not tell them apart";
+    }
+}
+
+TEST_F(Request, ACallIsSentOnceAndSurvivesEveryIdlePause) {
+    devserver::NextAnswer closes;
+    closes.status = 200;
+    closes.body = "{}";
+    closes.closes = true;
+    devserver::NextAnswer drops;
+    drops.no_reply = true;
+    constexpr int kPauses = 8;  // libcurl's own count of repetitions ends before
+    for (const char *szProtocol : {"https", "http"}) {
+        SCOPED_TRACE(szProtocol);
+        const bool blTls = szProtocol == std::string("https");
+        for (int i = 0; i < kPauses; ++i) {
+            EXPECT_TRUE(Call(szProtocol, closes));
+            AwaitEnd(blTls ? m_pServer->HttpsPort() : m_pServer->HttpPort());
+        }
+        EXPECT_EQ(blTls ? Https() : Http(), "/qrm/rpc");
+        for (int i = 0; i < kPauses; ++i) {
+            AnswerDiscovery(drops);
+            EXPECT_EQ(blTls ? Https() : Http(), "/qrm/rpc") << "only a question, asked again";
+        }
+        m_pServer->ForgetRequests();
+        EXPECT_FALSE(Call(szProtocol, drops));
+        EXPECT_EQ(CountOf("join"), 1);
+    }
 }
 
 TEST_F(Request, ConnectionsAreUsedAgainButNotByAChild) {

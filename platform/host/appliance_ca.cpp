@@ -29,7 +29,6 @@ namespace fs = std::filesystem;
 
 constexpr const char *kFile = "appliance_ca";
 constexpr const char *kFolder = "/usr/zelo/etc/ssl/ca.d";
-constexpr std::chrono::seconds kLookInterval{1};
 
 struct FreeBio {
     void operator()(BIO *pBio) const { BIO_free(pBio); }
@@ -121,8 +120,6 @@ bool AddApplianceCa(X509_STORE *pStore) {
 CaState CaState::Now() {
     CaState state;
     // The folder first: what comes while it is read makes another state later.
-    state.m_folder = FileDescriptor(open(kFolder, O_PATH | O_DIRECTORY | O_CLOEXEC));
-    state.m_folderVersion = state.LookAtFolder();
     state.Add(kFolder);
     std::error_code error;
     fs::directory_iterator entries(kFolder, error);
@@ -134,14 +131,9 @@ CaState CaState::Now() {
     return state;
 }
 
-bool CaState::Holds() {
-    const auto isUnchanged = [](const auto &entry) { return Look(entry.first) == entry.second; };
-    const auto now = std::chrono::steady_clock::now();
-    if (m_folder.IsOpen() && now - m_looked < kLookInterval) {
-        return LookAtFolder() == m_folderVersion;
-    }
-    m_looked = now;
-    return std::all_of(m_entries.begin(), m_entries.end(), isUnchanged);
+bool CaState::Holds() const {
+    return std::all_of(m_entries.begin(), m_entries.end(),
+                       [](const auto &entry) { return Look(entry.first) == entry.second; });
 }
 
 bool CaState::Version::operator==(const Version &other) const {
@@ -149,18 +141,13 @@ bool CaState::Version::operator==(const Version &other) const {
            changed.tv_sec == other.changed.tv_sec && changed.tv_nsec == other.changed.tv_nsec;
 }
 
-CaState::Version::Version(const struct stat &status)
-    : device(status.st_dev), inode(status.st_ino), size(status.st_size), changed(status.st_ctim) {}
-
 // What is not there looks the same each time.
 CaState::Version CaState::Look(const std::string &strPath) {
     struct stat status = {};
-    return stat(strPath.c_str(), &status) == 0 ? Version(status) : Version();
-}
-
-CaState::Version CaState::LookAtFolder() const {
-    struct stat status = {};
-    return fstat(m_folder.Get(), &status) == 0 ? Version(status) : Version();
+    if (stat(strPath.c_str(), &status) != 0) {
+        return {};
+    }
+    return {status.st_dev, status.st_ino, status.st_size, status.st_ctim};
 }
 
 }  // namespace host

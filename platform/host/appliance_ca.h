@@ -8,13 +8,10 @@
 #include <sys/stat.h>
 #include <sys/types.h>
 
-#include <chrono>
 #include <ctime>
 #include <string>
 #include <utility>
 #include <vector>
-
-#include "file_descriptor.h"
 
 namespace host {
 
@@ -29,10 +26,8 @@ class CaState {
     // The state that the folder is in now.
     static CaState Now();
 
-    // Whether the folder is still in this state. Looks at the folder itself, which shows what
-    // comes, goes or is replaced, and at most once a second at each file, which may have been
-    // written to.
-    bool Holds();
+    // Whether the folder is still in this state.
+    bool Holds() const;
 
   private:
     struct Version {
@@ -41,20 +36,13 @@ class CaState {
         off_t size = 0;
         timespec changed = {};
 
-        Version() = default;
-        explicit Version(const struct stat &status);
         bool operator==(const Version &other) const;
     };
     static Version Look(const std::string &strPath);
-    Version LookAtFolder() const;
     void Add(const std::string &strPath) { m_entries.emplace_back(strPath, Look(strPath)); }
-
-    FileDescriptor m_folder;  // none where there was no folder
-    Version m_folderVersion;
 
     // The folder and its files.
     std::vector<std::pair<std::string, Version>> m_entries;
-    std::chrono::steady_clock::time_point m_looked = std::chrono::steady_clock::now();
 };
 
 }  // namespace host

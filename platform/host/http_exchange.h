@@ -1,8 +1,9 @@
 // One HTTP exchange over the connections that this process keeps open.
 //
-// What the transport promises: certificate and host name are verified against the system's and the
-// appliance's own authorities; only http and https; no redirect; connecting, stalling and a body in
-// memory are bounded; connections and TLS sessions are used again, but never by a child process.
+// What the transport promises: certificate and host name of each connection are verified against
+// the system's and the appliance's own authorities; only http and https; no redirect; a POST is
+// sent at most once; no reply counts that is cut or encoded; connecting, stalling and a body in
+// memory are bounded; connections are used again, but never by a child process.
 
 #ifndef ZELO_HOST_HTTP_EXCHANGE_H
 #define ZELO_HOST_HTTP_EXCHANGE_H

@@ -1,0 +1,239 @@
+#include "connection_pool.h"
+
+#include <openssl/ssl.h>
+#include <poll.h>
+#include <pthread.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cstdlib>
+#include <mutex>
+#include <new>
+#include <string>
+#include <string_view>
+#include <utility>
+#include <vector>
+
+namespace host {
+namespace {
+
+// Of the ciphers of TLS 1.3: takes less time than the one that OpenSSL puts first.
+constexpr std::string_view kFirstCipher = "TLS_AES_128_GCM_SHA256";
+
+// More idle handles than this are not kept.
+constexpr std::size_t kMaxIdle = 8;
+// A connection that is idle for longer is not used again: servers close theirs after 5 s or more,
+// and a call must not meet that moment.
+constexpr long kMaxIdle_s = 3;
+
+// All handles of the process, idle and in use. Never destroyed: other threads may still be in an
+// exchange while the process ends.
+struct Pool {
+    std::mutex mutex;
+    std::vector<std::unique_ptr<Connection>> idle;
+    std::set<Connection *> inUse;
+    std::vector<Connection *> abandoned;
+};
+
+Pool &ThePool() {
+    static auto *const pPool = new Pool;
+    return *pPool;
+}
+
+void LockBeforeFork() {
+    ThePool().mutex.lock();
+}
+
+void UnlockInParent() {
+    ThePool().mutex.unlock();
+}
+
+// The child closes its copies of the sockets and forgets the handles without cleaning them up: an
+// orderly end of a TLS connection would end the parent's.
+void AbandonInChild() {
+    Pool &pool = ThePool();
+    for (auto &pConnection : pool.idle) {
+        pool.abandoned.push_back(pConnection.release());
+    }
+    pool.abandoned.insert(pool.abandoned.end(), pool.inUse.begin(), pool.inUse.end());
+    pool.idle.clear();
+    pool.inUse.clear();
+    for (Connection *pConnection : pool.abandoned) {
+        for (curl_socket_t fd : pConnection->sockets) {
+            close(fd);
+        }
+        pConnection->sockets.clear();
+    }
+    pool.mutex.unlock();
+}
+
+const int g_forkHandlers = pthread_atfork(LockBeforeFork, UnlockInParent, AbandonInChild);
+
+// --- Callbacks: they run inside libcurl, so nothing may be thrown out of them -------------------
+
+curl_socket_t OpenSocket(void *pContext, curlsocktype /*purpose*/, curl_sockaddr *pAddress) {
+    const int fd = socket(pAddress->family, pAddress->socktype | SOCK_CLOEXEC, pAddress->protocol);
+    if (fd < 0) {
+        return CURL_SOCKET_BAD;
+    }
+    try {
+        const std::lock_guard<std::mutex> lock(ThePool().mutex);
+        static_cast<Connection *>(pContext)->sockets.insert(fd);
+        return fd;
+    } catch (const std::bad_alloc &) {
+        close(fd);
+        return CURL_SOCKET_BAD;
+    }
+}
+
+int CloseSocket(void *pContext, curl_socket_t fd) {
+    const std::lock_guard<std::mutex> lock(ThePool().mutex);
+    static_cast<Connection *>(pContext)->sockets.erase(fd);
+    return close(fd);
+}
+
+// Puts the cipher first where it is allowed; what the system's configuration leaves out stays out.
+void PreferCipher(SSL_CTX *pTls) {
+    std::string strFirst;
+    std::string strOthers;
+    const STACK_OF(SSL_CIPHER) *pCiphers = SSL_CTX_get_ciphers(pTls);
+    for (int i = 0; i < sk_SSL_CIPHER_num(pCiphers); ++i) {
+        const SSL_CIPHER *pCipher = sk_SSL_CIPHER_value(pCiphers, i);
+        const std::string_view name = SSL_CIPHER_get_name(pCipher);
+        if (name == kFirstCipher) {
+            strFirst = name;
+        } else if (SSL_CIPHER_get_version(pCipher) == std::string_view("TLSv1.3")) {
+            strOthers.append(":").append(name);
+        }
+    }
+    if (!strFirst.empty()) {
+        static_cast<void>(SSL_CTX_set_ciphersuites(pTls, (strFirst + strOthers).c_str()));
+    }
+}
+
+Connection *ConnectionOf(const SSL *pTls) {
+    return static_cast<Connection *>(SSL_CTX_get_app_data(SSL_get_SSL_CTX(pTls)));
+}
+
+// libcurl does not tell an end that TLS announces from one that anybody on the way can make.
+void NoteAlert(const SSL *pTls, int where, int alert) {
+    if (where == SSL_CB_READ_ALERT && (alert & 0xFF) == SSL_AD_CLOSE_NOTIFY) {
+        ConnectionOf(pTls)->blEndAnnounced = true;
+    }
+}
+
+int NoteCertificateRequest(SSL *pTls, X509 ** /*ppCertificate*/, EVP_PKEY ** /*ppKey*/) {
+    ConnectionOf(pTls)->blCertificateAsked = true;
+    return 0;  // there is none
+}
+
+CURLcode SetUpTls(CURL * /*pEasy*/, void *pSslContext, void *pConnection) {
+    try {
+        auto *const pTls = static_cast<SSL_CTX *>(pSslContext);
+        SSL_CTX_set_app_data(pTls, pConnection);
+        SSL_CTX_set_info_callback(pTls, NoteAlert);
+        SSL_CTX_set_client_cert_cb(pTls, NoteCertificateRequest);
+        PreferCipher(pTls);
+        X509_STORE *pStore = SSL_CTX_get_cert_store(pTls);
+        return AddApplianceCa(pStore) ? CURLE_OK : CURLE_SSL_CACERT_BADFILE;
+    } catch (const std::bad_alloc &) {
+        return CURLE_OUT_OF_MEMORY;
+    }
+}
+
+// --- Handles ------------------------------------------------------------------------------------
+
+// Whether the environment names a proxy, in one of the variables that libcurl looks at. Where it
+// names none, as on most appliances, an exchange need not read the configuration.
+bool NamesProxy() {
+    constexpr std::array<const char *, 5> kVariables = {"http_proxy", "https_proxy", "HTTPS_PROXY",
+                                                        "all_proxy", "ALL_PROXY"};
+    return std::any_of(kVariables.begin(), kVariables.end(),
+                       [](const char *szName) { return std::getenv(szName) != nullptr; });
+}
+
+void SetOptions(Connection &connection) {
+    CURL *const pEasy = connection.pEasy.get();
+    // Forgets the options of the exchange before, and how often libcurl has sent one again.
+    curl_easy_reset(pEasy);
+    curl_easy_setopt(pEasy, CURLOPT_ERRORBUFFER, connection.reason.data());
+    curl_easy_setopt(pEasy, CURLOPT_MAXAGE_CONN, kMaxIdle_s);
+    curl_easy_setopt(pEasy, CURLOPT_OPENSOCKETFUNCTION, OpenSocket);
+    curl_easy_setopt(pEasy, CURLOPT_OPENSOCKETDATA, &connection);
+    curl_easy_setopt(pEasy, CURLOPT_CLOSESOCKETFUNCTION, CloseSocket);
+    curl_easy_setopt(pEasy, CURLOPT_CLOSESOCKETDATA, &connection);
+    curl_easy_setopt(pEasy, CURLOPT_SSLVERSION, static_cast<long>(CURL_SSLVERSION_TLSv1_2));
+    curl_easy_setopt(pEasy, CURLOPT_SSL_VERIFYPEER, 1L);
+    curl_easy_setopt(pEasy, CURLOPT_SSL_VERIFYHOST, 2L);
+    curl_easy_setopt(pEasy, CURLOPT_SSL_CTX_FUNCTION, SetUpTls);
+    curl_easy_setopt(pEasy, CURLOPT_SSL_CTX_DATA, &connection);
+    // A session that is resumed is not verified again.
+    curl_easy_setopt(pEasy, CURLOPT_SSL_SESSIONID_CACHE, 0L);
+}
+
+// Between exchanges nothing comes but the other side's end. libcurl takes TLS's for data.
+bool IsQuiet(const Connection &connection) {
+    return std::all_of(connection.sockets.begin(), connection.sockets.end(), [](curl_socket_t fd) {
+        pollfd look = {fd, POLLIN, 0};
+        return poll(&look, 1, 0) == 0;
+    });
+}
+
+// Connections that have ended, or that were verified against another set of authorities, are not
+// used again.
+std::unique_ptr<Connection> TakeIdle() {
+    Pool &pool = ThePool();
+    std::unique_ptr<Connection> pConnection;
+    while (true) {
+        {
+            const std::lock_guard<std::mutex> lock(pool.mutex);
+            pool.idle.reserve(kMaxIdle);
+            if (pool.idle.empty()) {
+                return nullptr;
+            }
+            pConnection = std::move(pool.idle.back());
+            pool.idle.pop_back();
+        }
+        if (pConnection->caState.Holds() && IsQuiet(*pConnection)) {
+            return pConnection;
+        }
+        // Outside the lock: closing a connection calls back into the pool.
+        pConnection.reset();
+    }
+}
+
+}  // namespace
+
+Borrowed::Borrowed() {
+    static const CURLcode globalInit = curl_global_init(CURL_GLOBAL_DEFAULT);
+    if (globalInit != CURLE_OK) {
+        return;
+    }
+    m_pConnection = TakeIdle();
+    if (m_pConnection == nullptr) {
+        m_pConnection = std::make_unique<Connection>();
+        m_pConnection->pEasy.reset(curl_easy_init());
+        m_pConnection->caState = CaState::Now();
+        m_pConnection->blNamesProxy = NamesProxy();
+    }
+    if (m_pConnection->pEasy != nullptr) {
+        SetOptions(*m_pConnection);
+    }
+    const std::lock_guard<std::mutex> lock(ThePool().mutex);
+    ThePool().inUse.insert(m_pConnection.get());
+}
+
+Borrowed::~Borrowed() {
+    if (m_pConnection == nullptr) {
+        return;
+    }
+    Pool &pool = ThePool();
+    const std::lock_guard<std::mutex> lock(pool.mutex);
+    pool.inUse.erase(m_pConnection.get());
+    if (pool.idle.size() < pool.idle.capacity() && m_pConnection->pEasy != nullptr) {
+        pool.idle.push_back(std::move(m_pConnection));
+    }
+}
+
+}  // namespace host
