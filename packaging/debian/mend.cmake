@@ -1,7 +1,7 @@
 # Run by CPack on the finished packages. Takes out the maintainer scripts that it gives every package
 # with a library: they run ldconfig, which the package's trigger does once for all packages. And names
-# the libcurl that is needed: what is found by the functions that are called is too old, as it does not
-# know the options that they are given.
+# the libcurl that is needed: the dependency that CPack finds goes by the functions that are called,
+# which are older than the options that they are given.
 set(tree ${CPACK_TOPLEVEL_DIRECTORY}/repacked)
 foreach(package IN LISTS CPACK_PACKAGE_FILES)
     file(REMOVE_RECURSE ${tree})
