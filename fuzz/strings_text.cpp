@@ -26,8 +26,7 @@ Plain ReadPlainly(std::string_view all, std::string_view section, std::string_vi
             plain.sections.emplace_back(*name);
             blInside = *name == section;
         } else if (blInside && !plain.value) {
-            std::size_t latest = 0;
-            plain.value = text::FindKey(line, key, latest);
+            plain.value = text::FindKey(line, key);
         }
         begin += line.size() + 1;
     }

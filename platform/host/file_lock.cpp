@@ -1,18 +1,20 @@
-// Locks by lock file: the kernel's lock on an open file, which it drops with the last descriptor.
+// Locks by lock file: the kernel's locks on two bytes of an open file, which go when it is closed.
+//
+// Byte 0 is the lock, byte 1 the head of the queue: only who holds the head waits for the lock. So
+// a process that takes the lock over and over waits like the others.
 
 #include "../file_lock.h"
 
 #include <fcntl.h>
 #include <pthread.h>
-#include <sys/file.h>
+#include <sys/stat.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
 #include <chrono>
-#include <cstddef>
 #include <mutex>
 #include <new>
-#include <string>
 #include <thread>
 #include <utility>
 #include <vector>
@@ -28,259 +30,126 @@ using Clock = std::chrono::steady_clock;
 
 constexpr const char *kFile = "file_lock";
 constexpr int kTimeout_s = 30;
+constexpr off_t kLock = 0;
+constexpr off_t kHead = 1;
 
-// A lock that is held elsewhere is tried again after a wait that grows from the first to the last;
-// by the one who is next in turn after the first each time.
+// A byte that is held elsewhere is tried again after a wait that grows from the first to the last.
 constexpr std::chrono::microseconds kFirstWait{100};
 constexpr std::chrono::microseconds kLastWait{2000};
 
-// Of the lock files whose locks are released, these many stay open to be locked again, which takes
-// a quarter of the time of opening them anew.
-constexpr std::ptrdiff_t kMaxIdle = 8;
+// The lock files that the process has open; a handle is a descriptor. Opening and forking exclude
+// each other, so that a child process knows what it has to close. Never destroyed: other threads
+// may still hold locks while the process ends.
+std::mutex g_mutex;
+alignas(std::vector<int>) unsigned char g_openPlace[sizeof(std::vector<int>)];
+std::vector<int> &g_open = *new (g_openPlace) std::vector<int>;
 
-// Whoever takes a lock over and over looks this often whether the file still has its name, and
-// whether somebody waits; always, when it has not left the lock alone for as long as those pause
-// who wait.
-constexpr std::chrono::milliseconds kLookInterval{1};
-
-// An open lock file.
-struct OpenFile {
-    std::string strPath;
-    int fd = -1;
-    struct stat status = {};  // when it was opened
-    bool blUsed = true;       // or idle
-    Clock::time_point looked;
-    Clock::time_point released;
-};
-
-// All lock files that the process has open; a handle is a descriptor. Opening, closing and forking
-// exclude each other, so that a child process knows what it has to close. Never destroyed: other
-// threads may still hold locks while the process ends.
-struct OpenLocks {
-    std::mutex mutex;
-    std::vector<OpenFile> files;
-};
-
-OpenLocks &TheLocks() {
-    static auto *const pLocks = new OpenLocks;
-    return *pLocks;
-}
-
-void BeforeFork() {
-    TheLocks().mutex.lock();
-}
-
-void AfterForkInParent() {
-    TheLocks().mutex.unlock();
-}
-
-void AfterForkInChild() {
-    OpenLocks &locks = TheLocks();
-    for (const OpenFile &file : locks.files) {
-        close(file.fd);
+void CloseInChild() {
+    for (const int fd : g_open) {
+        close(fd);
     }
-    locks.files.clear();
-    locks.mutex.unlock();
+    g_open.clear();
+    g_mutex.unlock();
 }
 
-bool FollowForks() {
-    static const bool blFollows =
-        pthread_atfork(BeforeFork, AfterForkInParent, AfterForkInChild) == 0;
-    return blFollows;
-}
+const int g_forkHandlers =
+    pthread_atfork([] { g_mutex.lock(); }, [] { g_mutex.unlock(); }, CloseInChild);
 
-// A lock file that is opened, or has stayed open since the process held its lock before. What is
-// not handed out as a handle is closed.
+// A lock file, opened anew for each lock. What is not handed out as a handle is closed.
 class LockFile {
   public:
-    explicit LockFile(const char *szPath) : m_szPath(szPath) {
-        if (!FollowForks()) {
-            throw std::bad_alloc();
+    explicit LockFile(const char *szPath) {
+        const std::lock_guard<std::mutex> guard(g_mutex);
+        g_open.reserve(g_open.size() + 1);
+        m_fd =
+            open(szPath, O_RDWR | O_CREAT | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC, 0600);
+        if (m_fd >= 0) {
+            g_open.push_back(m_fd);
         }
-        OpenLocks &locks = TheLocks();
-        const std::lock_guard<std::mutex> guard(locks.mutex);
-        auto file = FindIdle(szPath);
-        m_blWasOpen = file != locks.files.end();
-        if (!m_blWasOpen) {
-            locks.files.reserve(locks.files.size() + 1);
-            OpenFile opened = Open(szPath);
-            if (opened.fd < 0) {
-                return;
-            }
-            file = locks.files.insert(locks.files.end(), std::move(opened));
-        }
-        file->blUsed = true;
-        m_fd = file->fd;
-        m_statusAtOpen = file->status;
-        const Clock::time_point now = Clock::now();
-        // A name without a folder depends on where the process is.
-        m_blLooks = szPath[0] != '/' || now - file->looked >= kLookInterval;
-        m_blGivesWay = m_blLooks || now - file->released < kFirstWait;
-        file->looked = m_blLooks ? now : file->looked;
     }
     LockFile(const LockFile &) = delete;
     LockFile &operator=(const LockFile &) = delete;
-    ~LockFile() { Release(m_fd, false); }
+    ~LockFile() { Close(m_fd); }
 
     int Get() const { return m_fd; }
-    const char *Path() const { return m_szPath; }
-    bool WasOpen() const { return m_blWasOpen; }
-    bool Looks() const { return m_blLooks; }
-    bool GivesWay() const { return m_blGivesWay; }
-    const struct stat &StatusAtOpen() const { return m_statusAtOpen; }
     int HandOut() { return std::exchange(m_fd, -1); }
 
-    // Ends the use of the descriptor, and with it the lock. False when it is no lock file's.
-    static bool Release(int fd, bool blStayOpen) {
-        OpenLocks &locks = TheLocks();
-        const std::lock_guard<std::mutex> guard(locks.mutex);
-        const auto file =
-            std::find_if(locks.files.begin(), locks.files.end(),
-                         [fd](const OpenFile &other) { return other.fd == fd && other.blUsed; });
-        if (file == locks.files.end()) {
+    // Closes the file, and so releases the lock. False when it is no lock file's descriptor.
+    static bool Close(int fd) {
+        const std::lock_guard<std::mutex> guard(g_mutex);
+        const auto open = std::find(g_open.begin(), g_open.end(), fd);
+        if (open == g_open.end()) {
             return false;
         }
-        const auto idle = std::count_if(locks.files.begin(), locks.files.end(),
-                                        [](const OpenFile &other) { return !other.blUsed; });
-        const bool blStays =
-            blStayOpen && idle < kMaxIdle && FindIdle(file->strPath.c_str()) == locks.files.end();
-        if (blStays && flock(fd, LOCK_UN) == 0) {
-            file->blUsed = false;
-            file->released = Clock::now();
-        } else {
-            close(fd);
-            locks.files.erase(file);
-        }
-        return true;
+        g_open.erase(open);
+        return close(fd) == 0;
     }
 
   private:
-    static std::vector<OpenFile>::iterator FindIdle(const char *szPath) {
-        auto &files = TheLocks().files;
-        return std::find_if(files.begin(), files.end(), [szPath](const OpenFile &file) {
-            return !file.blUsed && file.strPath == szPath;
-        });
-    }
-
-    static OpenFile Open(const char *szPath) {
-        OpenFile file;
-        file.strPath = szPath;
-        file.fd =
-            open(szPath, O_RDWR | O_CREAT | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC, 0600);
-        if (file.fd >= 0 && fstat(file.fd, &file.status) != 0) {
-            close(std::exchange(file.fd, -1));
-        }
-        return file;
-    }
-
-    const char *m_szPath;
     int m_fd = -1;
-    bool m_blWasOpen = false;
-    bool m_blLooks = true;
-    bool m_blGivesWay = true;
-    struct stat m_statusAtOpen = {};
 };
 
-// What a try to lock an open lock file came to.
 enum class Try { kHeld, kHeldElsewhere, kRemoved, kUnsafe, kFailed };
 
-// Reads the status of the file as it is now. False when its name has gone, or leads to another
-// file. Between two looks at the name an unchanged status tells as much: to be renamed or removed
-// changes it.
-bool ReadStatus(const LockFile &file, struct stat &status) {
-    const bool blRead = fstat(file.Get(), &status) == 0;
-    if (!file.WasOpen()) {
-        return blRead && status.st_nlink > 0;
-    }
-    return (blRead && !file.Looks() && host::IsUnchanged(status, file.StatusAtOpen())) ||
-           (lstat(file.Path(), &status) == 0 && host::IsSameFile(status, file.StatusAtOpen()));
+bool Set(int fd, off_t byte, short type) {
+    struct flock lock = {};
+    lock.l_type = type;
+    lock.l_whence = SEEK_SET;
+    lock.l_start = byte;
+    lock.l_len = 1;
+    return fcntl(fd, F_OFD_SETLK, &lock) == 0;
 }
 
-Try TryLock(const LockFile &file) {
-    const bool blHeld = flock(file.Get(), LOCK_EX | LOCK_NB) == 0;
-    if (!blHeld && errno != EWOULDBLOCK) {
-        return Try::kFailed;
-    }
-    // A cleaner of old files may have been there. Whoever comes next creates a new lock file.
-    struct stat status = {};
-    if (!ReadStatus(file, status)) {
-        return Try::kRemoved;
-    }
-    if (!host::IsOwnFile(status)) {
-        return Try::kUnsafe;
-    }
-    // Whoever may open the file can lock it: nobody else may.
-    if (blHeld && (status.st_mode & 07777U) != 0600 && fchmod(file.Get(), 0600) != 0) {
-        return Try::kFailed;
-    }
-    return blHeld ? Try::kHeld : Try::kHeldElsewhere;
-}
-
-// Only who is next in turn tries the lock itself. Without turns a process that takes the lock over
-// and over would get it each time before those who wait, and they would wait for ever. A turn goes
-// with the open lock file.
-struct flock Turn(short type) {
-    struct flock turn = {};
-    turn.l_type = type;
-    turn.l_whence = SEEK_SET;
-    turn.l_len = 1;
-    return turn;
-}
-
-bool TakeTurn(int fd, short type) {
-    struct flock turn = Turn(type);
-    return fcntl(fd, F_OFD_SETLK, &turn) == 0;
-}
-
-// Whether nobody waits.
-bool IsTurnFree(int fd) {
-    struct flock turn = Turn(F_WRLCK);
-    return fcntl(fd, F_OFD_GETLK, &turn) == 0 && turn.l_type == F_UNLCK;
-}
-
-// Waits a while, not beyond the end. False when the end has come.
-bool Wait(Clock::time_point end, std::chrono::microseconds wait) {
-    const Clock::duration left = end - Clock::now();
-    if (left <= Clock::duration::zero()) {
-        return false;
-    }
-    std::this_thread::sleep_for(std::min<Clock::duration>(wait, left));
-    return true;
-}
-
-// Waits for the turn and then for the lock.
-Try WaitForLock(const LockFile &file, Clock::time_point end) {
-    const host::Waiting waiting({"waiting for the lock '", file.Path(), "'"});
-    for (std::chrono::microseconds wait = kFirstWait; !TakeTurn(file.Get(), F_WRLCK);
-         wait = std::min(2 * wait, kLastWait)) {
+Try Await(int fd, off_t byte, Clock::time_point end) {
+    std::chrono::microseconds wait = kFirstWait;
+    while (!Set(fd, byte, F_WRLCK)) {
         if (errno != EAGAIN && errno != EACCES) {
             return Try::kFailed;
         }
-        if (!Wait(end, wait)) {
+        const Clock::duration left = end - Clock::now();
+        if (left <= Clock::duration::zero()) {
             return Try::kHeldElsewhere;
         }
+        std::this_thread::sleep_for(std::min<Clock::duration>(wait, left));
+        wait = std::min(2 * wait, kLastWait);
     }
-    Try result = TryLock(file);
-    while (result == Try::kHeldElsewhere && Wait(end, kFirstWait)) {
-        result = TryLock(file);
-    }
-    static_cast<void>(TakeTurn(file.Get(), F_UNLCK));
-    return result;
+    return Try::kHeld;
 }
 
-// Takes the lock, at once where nobody waits for it.
-Try TakeLock(const LockFile &file, Clock::time_point end) {
+// What holding the file's lock is worth: nothing when a cleaner of old files, say, has taken its
+// name away, since whoever comes next makes a new lock file.
+Try CheckHeld(int fd, const char *szPath) {
+    struct stat held = {};
+    struct stat named = {};
+    if (fstat(fd, &held) != 0) {
+        return Try::kFailed;
+    }
+    if (lstat(szPath, &named) != 0 || !host::IsSameFile(held, named)) {
+        return Try::kRemoved;
+    }
+    // Whoever may open the file can lock it: nobody else may.
+    if ((held.st_mode & 07777U) != 0600 && fchmod(fd, 0600) != 0) {
+        return Try::kFailed;
+    }
+    return Try::kHeld;
+}
+
+Try TakeLock(int fd, const char *szPath, Clock::time_point end) {
+    struct stat status = {};
+    if (fstat(fd, &status) != 0) {
+        return Try::kFailed;
+    }
     // What is refused is not waited for.
-    if (!host::IsOwnFile(file.StatusAtOpen())) {
+    if (status.st_nlink > 0 && !host::IsOwnFile(status)) {
         return Try::kUnsafe;
     }
-    if (!file.GivesWay() || IsTurnFree(file.Get())) {
-        const Try result = TryLock(file);
-        if (result != Try::kHeldElsewhere) {
-            return result;
-        }
+    const host::Waiting waiting({"waiting for the lock '", szPath, "'"});
+    Try result = Await(fd, kHead, end);
+    if (result == Try::kHeld) {
+        result = Await(fd, kLock, end);
+        static_cast<void>(Set(fd, kHead, F_UNLCK));
     }
-    return WaitForLock(file, end);
+    return result == Try::kHeld ? CheckHeld(fd, szPath) : result;
 }
 
 // Why the lock file could not be opened. The kernel refuses some of what may not stand there, such
@@ -298,8 +167,7 @@ int Lock(const char *szPath, int timeout_s, int &handle) {
         if (file.Get() < 0) {
             return FailToOpen(szPath);
         }
-        const Try result = TakeLock(file, end);
-        switch (result) {
+        switch (TakeLock(file.Get(), szPath, end)) {
             case Try::kHeld:
                 handle = file.HandOut();
                 return 1;
@@ -337,5 +205,5 @@ int YLIBCFileLockTimeByFile(const char *szLockFile, int /*flags*/, int timeout_s
 }
 
 int YLIBCFileUnlockByFile(int handle) {
-    return LockFile::Release(handle, true) ? 0 : HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
+    return LockFile::Close(handle) ? 0 : HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
 }

@@ -21,9 +21,6 @@ struct PlaceInHash {
 // std::bad_alloc, with the hash as it was.
 PlaceInHash FindOrAddKey(YLIBSZHASH &hash, std::string_view key);
 
-// Keeps the hash from growing step by step while so many keys are added.
-void MakeRoomForKeys(YLIBSZHASH &hash, std::size_t more);
-
 }  // namespace host
 
 #endif

@@ -2,9 +2,6 @@
 
 #include "../key_value_file.h"
 
-#include <fcntl.h>
-
-#include <mutex>
 #include <new>
 #include <string_view>
 #include <utility>
@@ -12,9 +9,7 @@
 
 #include "../file_lock.h"
 #include "file_replacement.h"
-#include "file_state.h"
 #include "hash_place.h"
-#include "kept_file.h"
 #include "key_value_lookup.h"
 #include "last_error.h"
 #include "text_buffer.h"
@@ -156,13 +151,11 @@ bool Read(const char *szPath, std::string &strText) {
 struct OldFile {
     host::FoundFile found;
     std::string strText;
-    bool blSettled = false;  // the text holds for as long as the file's status does
 };
 
 // Reads a file that may be missing: it then counts as empty.
 bool ReadForChange(const char *szPath, OldFile &old) {
     const host::Find find = host::FindFile(szPath, old.found);
-    old.blSettled = host::IsSettled(old.found.status);
     return find == host::Find::kNoFile ||
            (find == host::Find::kFile && host::ReadContent(old.found, old.strText));
 }
@@ -173,60 +166,7 @@ int Replace(OldFile &old, const std::string &strNew) {
     return host::ReplaceFile(old.found, strNew);
 }
 
-// The pair that was to be set last and was found in place. What is reported over and over, such as
-// the status after each request, then costs a look at the file and not its reading. Never
-// destroyed, so that it serves until the very end of a process. Who finds the mutex taken, as it
-// may stay in a child process, does without.
-struct StandingPair {
-    std::mutex mutex;
-    std::string strPath;
-    std::string strKey;
-    std::string strValue;
-    struct stat status = {};
-    host::KeptFile file;
-};
-
-StandingPair &TheStandingPair() {
-    static auto *const pPair = new StandingPair;
-    return *pPair;
-}
-
-bool IsStanding(const char *szPath, std::string_view key, std::string_view value) {
-    StandingPair &pair = TheStandingPair();
-    const std::unique_lock<std::mutex> lock(pair.mutex, std::try_to_lock);
-    if (!lock.owns_lock() || pair.strPath != szPath) {
-        return false;
-    }
-    struct stat status = {};
-    if (pair.strKey == key && pair.strValue == value &&
-        pair.file.Holds(szPath, AT_SYMLINK_NOFOLLOW, status) &&
-        host::IsUnchanged(status, pair.status)) {
-        return true;
-    }
-    // A file system takes longer to replace a file that is still open.
-    pair.file.Drop();
-    return false;
-}
-
-void RememberStanding(const char *szPath, std::string_view key, std::string_view value,
-                      OldFile &old) {
-    StandingPair &pair = TheStandingPair();
-    const std::unique_lock<std::mutex> lock(pair.mutex, std::try_to_lock);
-    if (!lock.owns_lock() || !old.blSettled || !host::IsOwnFile(old.found.status)) {
-        return;
-    }
-    pair.file.Drop();  // for as long as the rest is not whole
-    pair.strPath = szPath;
-    pair.strKey = key;
-    pair.strValue = value;
-    pair.status = old.found.status;
-    pair.file.Keep(std::move(old.found.file), old.found.status);
-}
-
 int SetValue(const char *szPath, std::string_view key, std::string_view value) {
-    if (IsStanding(szPath, key, value)) {
-        return 0;
-    }
     OldFile old;
     if (!ReadForChange(szPath, old)) {
         return -1;
@@ -237,7 +177,6 @@ int SetValue(const char *szPath, std::string_view key, std::string_view value) {
     std::string_view rest = old.strText;
     if (TakeLineWithKey(rest, key, line)) {
         if (ValueOf(line.value) == value) {
-            RememberStanding(szPath, key, value, old);
             return 0;
         }
         strNew.assign(old.strText, 0, old.strText.size() - rest.size() - line.text.size());
@@ -278,8 +217,6 @@ int ReadPairs(const char *szPath, YLIBSZHASH **ppHash) {
     // Of several lines with a key the first one holds: what it has set is not set again.
     YLIBSZHASH &hash = **ppHash;
     std::vector<bool> blOldSet(static_cast<std::size_t>(hash.nItem), false);
-    constexpr std::size_t kUsualLine = 16;
-    host::MakeRoomForKeys(hash, strText.size() / kUsualLine);
     int keys = 0;
     Line line;
     for (std::string_view rest = strText; TakeLine(rest, line);) {

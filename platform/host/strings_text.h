@@ -116,22 +116,15 @@ inline std::optional<std::string> ValueOf(std::string_view line, std::string_vie
     return Unquote(Trim(rest.substr(1)));
 }
 
-// The value of the key in the lines of one section. Looks first at the line that begins at
-// `latest`, where the latest key was found in the same lines, and keeps it up to date: no line has
-// two keys.
-inline std::optional<std::string> FindKey(std::string_view lines, std::string_view key,
-                                          std::size_t &latest) {
+// The value of the key in the lines of one section.
+inline std::optional<std::string> FindKey(std::string_view lines, std::string_view key) {
     if (key.empty() || key.front() == '#' || key.find('=') != std::string_view::npos ||
         Trim(key) != key) {
         return std::nullopt;  // no line can have such a key
     }
-    if (auto value = ValueOf(LineAt(lines, latest), key)) {
-        return value;
-    }
     for (std::size_t begin = 0; begin < lines.size();) {
         const std::string_view line = LineAt(lines, begin);
         if (auto value = ValueOf(line, key)) {
-            latest = begin;
             return value;
         }
         begin += line.size() + 1;

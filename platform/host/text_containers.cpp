@@ -6,14 +6,13 @@
 #include "../text_containers.h"
 
 #include <algorithm>
-#include <cstdint>
 #include <cstring>
 #include <deque>
-#include <functional>
 #include <memory>
 #include <new>
 #include <string>
 #include <string_view>
+#include <unordered_map>
 #include <vector>
 
 #include "hash_place.h"
@@ -27,18 +26,12 @@ struct YLIBSZLIST_ITEMS {
 
 struct YLIBSZHASH_PAIRS {
     struct Pair {
-        Pair(std::string_view key, std::size_t keyHash) : strKey(key), hash(keyHash) {}
-
         std::string strKey;
         std::string strValue;
-        std::size_t hash;
     };
     YLIBSZHASH record = {0, this};
     std::deque<Pair> inOrder;  // of the keys' coming; what a deque holds never moves
-
-    // Where the keys stand in there, plus 1; 0 in a free slot. Their number is a power of two. A
-    // key has the first slot free for it from that of its hash on. At least half are free.
-    std::vector<std::uint32_t> slots;
+    std::unordered_map<std::string_view, std::size_t> places;  // of the keys in there
 };
 
 namespace {
@@ -129,41 +122,6 @@ int Replace(const char *szText, const char *szOld, std::string_view replacement,
     return AppendWithin(cbMost, szRest, strResult) ? occurrences : -1;
 }
 
-// --- Slots of a hash ----------------------------------------------------------------------------
-
-// The key's slot, or the free one that would be its.
-std::uint32_t &SlotOf(YLIBSZHASH_PAIRS &pairs, std::string_view key, std::size_t hash) {
-    const std::size_t last = pairs.slots.size() - 1;
-    std::size_t at = hash & last;
-    while (pairs.slots[at] != 0) {
-        const YLIBSZHASH_PAIRS::Pair &pair = pairs.inOrder[pairs.slots[at] - 1];
-        if (pair.hash == hash && pair.strKey == key) {
-            break;
-        }
-        at = (at + 1) & last;
-    }
-    return pairs.slots[at];
-}
-
-// Makes room for more keys.
-void GrowSlots(YLIBSZHASH_PAIRS &pairs, std::size_t more) {
-    constexpr std::size_t kFirstSlots = 64;
-    const auto keys = static_cast<std::size_t>(pairs.record.nItem);
-    if (2 * (keys + more) <= pairs.slots.size()) {
-        return;
-    }
-    std::size_t count = std::max(kFirstSlots, pairs.slots.size());
-    while (count < 2 * (keys + more)) {
-        count *= 2;
-    }
-    std::vector<std::uint32_t> slots(count, 0);
-    pairs.slots.swap(slots);
-    for (std::size_t i = 0; i < keys; ++i) {
-        const YLIBSZHASH_PAIRS::Pair &pair = pairs.inOrder[i];
-        SlotOf(pairs, pair.strKey, pair.hash) = static_cast<std::uint32_t>(i) + 1;
-    }
-}
-
 }  // namespace
 
 // --- Lists --------------------------------------------------------------------------------------
@@ -195,25 +153,27 @@ const char *YLIBCSzListGet(const YLIBSZLIST *pslList, int index) {
 
 // --- Hashes -------------------------------------------------------------------------------------
 
-void host::MakeRoomForKeys(YLIBSZHASH &hash, std::size_t more) {
-    GrowSlots(*hash.pPairs, more);
-}
-
 host::PlaceInHash host::FindOrAddKey(YLIBSZHASH &hash, std::string_view key) {
     YLIBSZHASH_PAIRS &pairs = *hash.pPairs;
-    GrowSlots(pairs, 1);
-    const std::size_t keyHash = std::hash<std::string_view>()(key);
-    std::uint32_t &slot = SlotOf(pairs, key, keyHash);
-    if (slot != 0) {
-        return {slot - 1, pairs.inOrder[slot - 1].strValue};
+    const auto known = pairs.places.find(key);
+    if (known != pairs.places.end()) {
+        return {known->second, pairs.inOrder[known->second].strValue};
     }
-    std::string &strValue = pairs.inOrder.emplace_back(key, keyHash).strValue;
-    slot = static_cast<std::uint32_t>(++hash.nItem);
-    return {slot - 1, strValue};
+    const std::size_t index = pairs.inOrder.size();
+    YLIBSZHASH_PAIRS::Pair &pair = pairs.inOrder.emplace_back();
+    try {
+        pair.strKey = key;
+        pairs.places.emplace(pair.strKey, index);
+    } catch (const std::bad_alloc &) {
+        pairs.inOrder.pop_back();
+        throw;
+    }
+    ++hash.nItem;
+    return {index, pair.strValue};
 }
 
 YLIBSZHASH *YLIBCSzHashAlloc(int cbInitial) {
-    return NewRecord(cbInitial, &YLIBSZHASH_PAIRS::slots);
+    return NewRecord(cbInitial, &YLIBSZHASH_PAIRS::places);
 }
 
 void YLIBCSzHashFree(YLIBSZHASH *pHash) {
@@ -240,14 +200,12 @@ const char *YLIBCSzHashGetValue(const YLIBSZHASH *pHash, const char *szKey) {
         HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
         return nullptr;
     }
-    YLIBSZHASH_PAIRS &pairs = *pHash->pPairs;
-    const std::uint32_t slot =
-        pairs.slots.empty() ? 0 : SlotOf(pairs, szKey, std::hash<std::string_view>()(szKey));
-    if (slot == 0) {
+    const auto known = pHash->pPairs->places.find(szKey);
+    if (known == pHash->pPairs->places.end()) {
         HOST_FAIL(YLIBC_ERR_NOT_FOUND);
         return nullptr;
     }
-    return pairs.inOrder[slot - 1].strValue.c_str();
+    return pHash->pPairs->inOrder[known->second].strValue.c_str();
 }
 
 const char *YLIBCSzHashKeyAt(const YLIBSZHASH *pHash, int index) {

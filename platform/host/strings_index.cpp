@@ -1,0 +1,108 @@
+#include "strings_index.h"
+
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <functional>
+#include <map>
+#include <mutex>
+#include <new>
+
+#include "file_state.h"
+#include "held_mutex.h"
+#include "strings_text.h"
+
+namespace host {
+namespace {
+
+using IndexHandle = std::shared_ptr<const StringsIndex>;
+
+// More than an interface has languages. Past it all are made anew.
+constexpr std::size_t kMaxIndexes = 64;
+
+// Larger files are refused: nobody translates so much.
+constexpr off_t kMaxFile = off_t{64} * 1024 * 1024;
+
+std::mutex g_mutex;
+const int g_forkHandlers = HoldAroundForks<g_mutex>();
+
+// Never destroyed, so that it serves until the very end of a process.
+alignas(std::map<std::string,
+                 IndexHandle>) unsigned char g_indexes[sizeof(std::map<std::string, IndexHandle>)];
+auto &g_indexByPath = *new (g_indexes) std::map<std::string, IndexHandle>;
+
+bool IsBefore(const StringsIndex::Section &a, const StringsIndex::Section &b) {
+    return a.hash < b.hash;
+}
+
+std::size_t Hash(std::string_view name) {
+    return std::hash<std::string_view>()(name);
+}
+
+IndexHandle MakeIndex(int fd, const struct stat &state) {
+    std::string strText;
+    if (state.st_size > kMaxFile || !ReadPart(fd, 0, state.st_size, strText)) {
+        return nullptr;
+    }
+    auto pIndex = std::make_shared<StringsIndex>();
+    pIndex->file = state;
+    auto &sections = pIndex->sections;
+    for (auto section = strings_text::NextSection(strText, 0); section;
+         section = strings_text::NextSection(strText, section->end)) {
+        const auto begin = static_cast<off_t>(section->begin);
+        if (!sections.empty()) {
+            sections.back().end = begin;
+        }
+        sections.push_back({Hash(section->name), begin, state.st_size});
+    }
+    std::stable_sort(sections.begin(), sections.end(), IsBefore);
+    return pIndex;
+}
+
+}  // namespace
+
+std::vector<StringsIndex::Section> StringsIndex::Find(std::string_view name) const {
+    const auto range =
+        std::equal_range(sections.begin(), sections.end(), Section{Hash(name), 0, 0}, IsBefore);
+    return {range.first, range.second};
+}
+
+IndexHandle IndexOf(const char *szPath, int fd, const struct stat &state) {
+    {
+        const std::lock_guard<std::mutex> lock(g_mutex);
+        const auto kept = g_indexByPath.find(szPath);
+        if (kept != g_indexByPath.end() && IsUnchanged(kept->second->file, state)) {
+            return kept->second;
+        }
+    }
+    // Before the file is read: what changes from here on has to show.
+    const bool blSettled = IsSettled(state);
+    IndexHandle pIndex = MakeIndex(fd, state);
+    if (pIndex != nullptr && blSettled) {
+        const std::lock_guard<std::mutex> lock(g_mutex);
+        if (g_indexByPath.size() >= kMaxIndexes) {
+            g_indexByPath.clear();
+        }
+        g_indexByPath[szPath] = pIndex;
+    }
+    return pIndex;
+}
+
+bool ReadPart(int fd, off_t begin, off_t end, std::string &strText) {
+    strText.resize(static_cast<std::size_t>(end - begin));
+    for (std::size_t at = 0; at < strText.size();) {
+        const ssize_t cb =
+            pread(fd, &strText[at], strText.size() - at, begin + static_cast<off_t>(at));
+        if (cb < 0 && errno == EINTR) {
+            continue;
+        }
+        if (cb <= 0) {
+            return false;
+        }
+        at += static_cast<std::size_t>(cb);
+    }
+    return true;
+}
+
+}  // namespace host
