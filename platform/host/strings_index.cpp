@@ -21,8 +21,8 @@ using IndexHandle = std::shared_ptr<const StringsIndex>;
 // More than an interface has languages. Past it all are made anew.
 constexpr std::size_t kMaxIndexes = 64;
 
-// Larger files are refused: nobody translates so much.
-constexpr off_t kMaxFile = off_t{64} * 1024 * 1024;
+constexpr off_t kBlock = off_t{64} * 1024;
+constexpr off_t kLongestLine = off_t{16} * 1024 * 1024;
 
 std::mutex g_mutex;
 const int g_forkHandlers = HoldAroundForks<g_mutex>();
@@ -40,21 +40,38 @@ std::size_t Hash(std::string_view name) {
     return std::hash<std::string_view>()(name);
 }
 
-IndexHandle MakeIndex(int fd, const struct stat &state) {
-    std::string strText;
-    if (state.st_size > kMaxFile || !ReadPart(fd, 0, state.st_size, strText)) {
-        return nullptr;
-    }
-    auto pIndex = std::make_shared<StringsIndex>();
-    pIndex->file = state;
-    auto &sections = pIndex->sections;
-    for (auto section = strings_text::NextSection(strText, 0); section;
-         section = strings_text::NextSection(strText, section->end)) {
-        const auto begin = static_cast<off_t>(section->begin);
+void AddSections(std::string_view lines, off_t place,
+                 std::vector<StringsIndex::Section> &sections) {
+    for (auto section = strings_text::NextSection(lines, 0); section;
+         section = strings_text::NextSection(lines, section->end)) {
+        const off_t begin = place + static_cast<off_t>(section->begin);
         if (!sections.empty()) {
             sections.back().end = begin;
         }
-        sections.push_back({Hash(section->name), begin, state.st_size});
+        sections.push_back({Hash(section->name), begin, 0});
+    }
+}
+
+// Reads the file in blocks of whole lines, which stay in the processor's cache.
+IndexHandle MakeIndex(int fd, const struct stat &state) {
+    auto pIndex = std::make_shared<StringsIndex>();
+    pIndex->file = state;
+    auto &sections = pIndex->sections;
+    std::string strBlock;
+    off_t cbMost = kBlock;
+    for (off_t at = 0; at < state.st_size;) {
+        const off_t end = std::min(at + cbMost, state.st_size);
+        if (cbMost > kLongestLine || !ReadPart(fd, at, end, strBlock)) {
+            return nullptr;
+        }
+        const std::size_t cb =
+            end == state.st_size ? strBlock.size() : strBlock.rfind('\n') + 1;  // npos + 1 is 0
+        cbMost = cb == 0 ? 2 * cbMost : kBlock;
+        AddSections(std::string_view(strBlock).substr(0, cb), at, sections);
+        at += static_cast<off_t>(cb);
+    }
+    if (!sections.empty()) {
+        sections.back().end = state.st_size;
     }
     std::stable_sort(sections.begin(), sections.end(), IsBefore);
     return pIndex;
