@@ -40,9 +40,16 @@ TEST(Service, AllProgramsOfTheTypeRunInTheOrderOfTheirNames) {
     EXPECT_EQ(Runs(), "");
 
     AddService("15-fails", "3");
+    AddService("17-open", "0", 0757);
     EXPECT_LT(YLIBServiceTypeReload(YLIB_SERVICE_TYPE_USERS), 0);
-    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_EXEC));
+    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_EXEC_STATUS));
     EXPECT_EQ(Runs(), "10-first reload\n15-fails reload\n20-second reload\n");
+
+    // Whoever can write to a folder can put any program there.
+    chmod("/usr/zelo/etc/service.d", 0777);
+    EXPECT_LT(YLIBServiceTypeReload(YLIB_SERVICE_TYPE_USERS), 0);
+    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_UNSAFE_FILE));
+    EXPECT_EQ(Runs(), "");
 }
 
 }  // namespace
