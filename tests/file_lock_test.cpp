@@ -191,4 +191,28 @@ TEST(FileLock, TrapsAreRefused) {
     EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_INVALID_ARGUMENT));
 }
 
+// Whoever comes first in a folder that everybody can write to must not stop root's programs.
+TEST(FileLock, RootTakesItsNameBack) {
+    for (const char *szKind : {"file", "link"}) {
+        SCOPED_TRACE(szKind);
+        fs::remove(kLock);
+        if (!files::PutStrangers(szKind, kLock)) {
+            GTEST_SKIP() << "there are no files of another user's";
+        }
+        EXPECT_TRUE(IsFree());
+        struct stat status = {};
+        EXPECT_EQ(lstat(kLock, &status), 0);
+        EXPECT_TRUE(S_ISREG(status.st_mode) && status.st_uid == 0);
+    }
+    // Whatever locks its maker holds on it.
+    fs::remove(kLock);
+    ASSERT_TRUE(files::PutStrangers("file", kLock));
+    const int fd = open(kLock, O_RDWR | O_CLOEXEC);
+    struct flock lock = {};
+    lock.l_type = F_WRLCK;
+    EXPECT_EQ(fcntl(fd, F_OFD_SETLK, &lock), 0);
+    EXPECT_TRUE(IsFree());
+    close(fd);
+}
+
 }  // namespace

@@ -314,6 +314,17 @@ TEST_F(KeyValueFile, InASharedFolderTrapsAreLeftAlone) {
     EXPECT_FALSE(fs::exists("/tmp/lured"));
 }
 
+TEST_F(KeyValueFile, AnotherUsersFileIsNotBelievedAndMakesRoom) {
+    if (!files::PutStrangers("file", kFile)) {
+        GTEST_SKIP() << "there are no files of another user's";
+    }
+    WriteFile(kFile, "k=secret\n");
+    EXPECT_LT(YLIBCFileCheckKeyValue(kFile, "k", "secret", 0), 0);
+    EXPECT_EQ(SetValue(kFile, "k", "v"), 0);
+    EXPECT_EQ(FileText(kFile), "k=\"v\"\n");
+    EXPECT_EQ(Status(kFile).st_uid, 0U);
+}
+
 TEST_F(KeyValueFile, ElsewhereLinksAreFollowedAndStay) {
     fs::remove_all("/etc/a");
     fs::create_directories("/etc/a/b");

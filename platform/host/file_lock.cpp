@@ -20,6 +20,7 @@
 #include <vector>
 
 #include "file_state.h"
+#include "foreign_file.h"
 #include "last_error.h"
 #include "trusted_file.h"
 #include "waiting.h"
@@ -58,11 +59,13 @@ const int g_forkHandlers =
 // A lock file, opened anew for each lock. What is not handed out as a handle is closed.
 class LockFile {
   public:
-    explicit LockFile(const char *szPath) {
+    LockFile(const char *szPath, bool blCreate) {
         const std::lock_guard<std::mutex> guard(g_mutex);
         g_open.reserve(g_open.size() + 1);
         m_fd =
-            open(szPath, O_RDWR | O_CREAT | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC, 0600);
+            open(szPath,
+                 O_RDWR | (blCreate ? O_CREAT : 0) | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC,
+                 0600);
         if (m_fd >= 0) {
             g_open.push_back(m_fd);
         }
@@ -163,7 +166,11 @@ int FailToOpen(const char *szPath) {
 int Lock(const char *szPath, int timeout_s, int &handle) {
     const Clock::time_point end = Clock::now() + std::chrono::seconds(timeout_s);
     for (;;) {
-        LockFile file(szPath);
+        const bool blCreate = host::MayCreateLockFile(szPath);
+        LockFile file(szPath, blCreate);
+        if (file.Get() < 0 && errno == ENOENT && !blCreate && Clock::now() < end) {
+            continue;
+        }
         if (file.Get() < 0) {
             return FailToOpen(szPath);
         }

@@ -9,6 +9,7 @@
 #include <cerrno>
 #include <climits>
 
+#include "foreign_file.h"
 #include "last_error.h"
 
 namespace host {
@@ -98,6 +99,7 @@ bool ReadShared(const std::string &strFolder, bool &blShared) {
 Find FindFile(const char *szPath, FoundFile &found) {
     SetPath(found, szPath);
     for (int links = 0; links <= kMaxLinks; ++links) {
+        RemoveForeignFile(found.Path());
         found.file = FileDescriptor(
             open(found.Path().c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
         found.blThere = found.file.IsOpen();
