@@ -5,6 +5,7 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <cstdlib>
 #include <cstring>
 #include <fstream>
 
@@ -40,6 +41,12 @@ TEST(SerialNumber, TheCustomOneComesFirst) {
         EXPECT_EQ(client_description::ReadSerialNumber(strSerial), row.blRead);
         EXPECT_EQ(strSerial, row.szSerial);
     }
+    // What cannot be read is not an appliance without one.
+    ASSERT_EQ(std::system("ln -sfn /etc /etc/custom_serial_number"), 0);
+    char sz[8] = "before";
+    EXPECT_LT(YLIBGetCustomSerialNumber(sz, sizeof(sz)), 0);
+    EXPECT_STREQ(sz, "before");
+    unlink("/etc/custom_serial_number");
 }
 
 TEST(HostName, IsCutToItsBuffer) {
