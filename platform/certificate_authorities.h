@@ -1,10 +1,10 @@
 // Certificate authorities: whom the appliance trusts besides the system's own authorities.
 //
 // Every TLS connection of the Web API requests (web_api_request.h) is verified against the system's
-// authorities and these when it is made. Once one of these came, went or changed, no connection
-// that was made before is used for another request. A change of the system's counts for the
-// connections that are made after it. A program that opens a connection of its own, in order to
-// find out why a request fails, adds them by the same rules here.
+// authorities and these as they are when it is made. A change counts for every connection that is
+// made after it; one that was made before is used for three minutes at the most. A program that
+// opens a connection of its own, in order to find out why a request fails, adds them by the same
+// rules here.
 
 #ifndef ZELO_PLATFORM_CERTIFICATE_AUTHORITIES_H
 #define ZELO_PLATFORM_CERTIFICATE_AUTHORITIES_H

@@ -117,39 +117,6 @@ bool AddApplianceCa(X509_STORE *pStore) {
     return blAll;
 }
 
-CaState CaState::Now() {
-    CaState state;
-    // The folder first: what comes while it is read makes another state later.
-    state.Add(kFolder);
-    std::error_code error;
-    fs::directory_iterator entries(kFolder, error);
-    for (; !error && entries != fs::directory_iterator(); entries.increment(error)) {
-        if (IsPemName(entries->path())) {
-            state.Add(entries->path().string());
-        }
-    }
-    return state;
-}
-
-bool CaState::Holds() const {
-    return std::all_of(m_entries.begin(), m_entries.end(),
-                       [](const auto &entry) { return Look(entry.first) == entry.second; });
-}
-
-bool CaState::Version::operator==(const Version &other) const {
-    return device == other.device && inode == other.inode && size == other.size &&
-           changed.tv_sec == other.changed.tv_sec && changed.tv_nsec == other.changed.tv_nsec;
-}
-
-// What is not there looks the same each time.
-CaState::Version CaState::Look(const std::string &strPath) {
-    struct stat status = {};
-    if (stat(strPath.c_str(), &status) != 0) {
-        return {};
-    }
-    return {status.st_dev, status.st_ino, status.st_size, status.st_ctim};
-}
-
 }  // namespace host
 
 int ZELOCertAddAuthorities(struct x509_store_st *pStore, char *szPlace, int cbPlace) {

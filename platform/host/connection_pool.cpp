@@ -10,25 +10,24 @@
 #include <cstdlib>
 #include <mutex>
 #include <new>
-#include <string>
-#include <string_view>
 #include <utility>
 #include <vector>
 
+#include "appliance_ca.h"
+#include "never_destroyed.h"
+
 namespace host {
 namespace {
-
-// Of the ciphers of TLS 1.3: takes less time than the one that OpenSSL puts first.
-constexpr std::string_view kFirstCipher = "TLS_AES_128_GCM_SHA256";
 
 // More idle handles than this are not kept.
 constexpr std::size_t kMaxIdle = 8;
 // A connection that is idle for longer is not used again: servers close theirs after 5 s or more,
 // and a call must not meet that moment.
 constexpr long kMaxIdle_s = 3;
+// An authority that is removed is not trusted for longer than this.
+constexpr long kMaxLife_s = 180;
 
-// All handles of the process, idle and in use. Never destroyed: other threads may still be in an
-// exchange while the process ends.
+// All handles of the process, idle and in use.
 struct Pool {
     std::mutex mutex;
     std::vector<std::unique_ptr<Connection>> idle;
@@ -36,23 +35,23 @@ struct Pool {
     std::vector<Connection *> abandoned;
 };
 
-Pool &ThePool() {
-    static auto *const pPool = new Pool;
-    return *pPool;
-}
+NeverDestroyed<Pool> g_pool;
+
+// What libcurl needs once, before a thread can fork in the middle of it.
+const CURLcode g_globalInit = curl_global_init(CURL_GLOBAL_DEFAULT);
 
 void LockBeforeFork() {
-    ThePool().mutex.lock();
+    g_pool->mutex.lock();
 }
 
 void UnlockInParent() {
-    ThePool().mutex.unlock();
+    g_pool->mutex.unlock();
 }
 
 // The child closes its copies of the sockets and forgets the handles without cleaning them up: an
 // orderly end of a TLS connection would end the parent's.
 void AbandonInChild() {
-    Pool &pool = ThePool();
+    Pool &pool = *g_pool;
     for (auto &pConnection : pool.idle) {
         pool.abandoned.push_back(pConnection.release());
     }
@@ -78,7 +77,7 @@ curl_socket_t OpenSocket(void *pContext, curlsocktype /*purpose*/, curl_sockaddr
         return CURL_SOCKET_BAD;
     }
     try {
-        const std::lock_guard<std::mutex> lock(ThePool().mutex);
+        const std::lock_guard<std::mutex> lock(g_pool->mutex);
         static_cast<Connection *>(pContext)->sockets.insert(fd);
         return fd;
     } catch (const std::bad_alloc &) {
@@ -88,28 +87,9 @@ curl_socket_t OpenSocket(void *pContext, curlsocktype /*purpose*/, curl_sockaddr
 }
 
 int CloseSocket(void *pContext, curl_socket_t fd) {
-    const std::lock_guard<std::mutex> lock(ThePool().mutex);
+    const std::lock_guard<std::mutex> lock(g_pool->mutex);
     static_cast<Connection *>(pContext)->sockets.erase(fd);
     return close(fd);
-}
-
-// Puts the cipher first where it is allowed; what the system's configuration leaves out stays out.
-void PreferCipher(SSL_CTX *pTls) {
-    std::string strFirst;
-    std::string strOthers;
-    const STACK_OF(SSL_CIPHER) *pCiphers = SSL_CTX_get_ciphers(pTls);
-    for (int i = 0; i < sk_SSL_CIPHER_num(pCiphers); ++i) {
-        const SSL_CIPHER *pCipher = sk_SSL_CIPHER_value(pCiphers, i);
-        const std::string_view name = SSL_CIPHER_get_name(pCipher);
-        if (name == kFirstCipher) {
-            strFirst = name;
-        } else if (SSL_CIPHER_get_version(pCipher) == std::string_view("TLSv1.3")) {
-            strOthers.append(":").append(name);
-        }
-    }
-    if (!strFirst.empty()) {
-        static_cast<void>(SSL_CTX_set_ciphersuites(pTls, (strFirst + strOthers).c_str()));
-    }
 }
 
 Connection *ConnectionOf(const SSL *pTls) {
@@ -134,7 +114,6 @@ CURLcode SetUpTls(CURL * /*pEasy*/, void *pSslContext, void *pConnection) {
         SSL_CTX_set_app_data(pTls, pConnection);
         SSL_CTX_set_info_callback(pTls, NoteAlert);
         SSL_CTX_set_client_cert_cb(pTls, NoteCertificateRequest);
-        PreferCipher(pTls);
         X509_STORE *pStore = SSL_CTX_get_cert_store(pTls);
         return AddApplianceCa(pStore) ? CURLE_OK : CURLE_SSL_CACERT_BADFILE;
     } catch (const std::bad_alloc &) {
@@ -159,6 +138,9 @@ void SetOptions(Connection &connection) {
     curl_easy_reset(pEasy);
     curl_easy_setopt(pEasy, CURLOPT_ERRORBUFFER, connection.reason.data());
     curl_easy_setopt(pEasy, CURLOPT_MAXAGE_CONN, kMaxIdle_s);
+    curl_easy_setopt(pEasy, CURLOPT_MAXLIFETIME_CONN, kMaxLife_s);
+    // Each connection is verified against the authorities that there are as it begins.
+    curl_easy_setopt(pEasy, CURLOPT_CA_CACHE_TIMEOUT, 0L);
     curl_easy_setopt(pEasy, CURLOPT_OPENSOCKETFUNCTION, OpenSocket);
     curl_easy_setopt(pEasy, CURLOPT_OPENSOCKETDATA, &connection);
     curl_easy_setopt(pEasy, CURLOPT_CLOSESOCKETFUNCTION, CloseSocket);
@@ -180,10 +162,9 @@ bool IsQuiet(const Connection &connection) {
     });
 }
 
-// Connections that have ended, or that were verified against another set of authorities, are not
-// used again.
+// Connections that have ended are not used again.
 std::unique_ptr<Connection> TakeIdle() {
-    Pool &pool = ThePool();
+    Pool &pool = *g_pool;
     std::unique_ptr<Connection> pConnection;
     while (true) {
         {
@@ -195,7 +176,7 @@ std::unique_ptr<Connection> TakeIdle() {
             pConnection = std::move(pool.idle.back());
             pool.idle.pop_back();
         }
-        if (pConnection->caState.Holds() && IsQuiet(*pConnection)) {
+        if (IsQuiet(*pConnection)) {
             return pConnection;
         }
         // Outside the lock: closing a connection calls back into the pool.
@@ -206,29 +187,27 @@ std::unique_ptr<Connection> TakeIdle() {
 }  // namespace
 
 Borrowed::Borrowed() {
-    static const CURLcode globalInit = curl_global_init(CURL_GLOBAL_DEFAULT);
-    if (globalInit != CURLE_OK) {
+    if (g_globalInit != CURLE_OK) {
         return;
     }
     m_pConnection = TakeIdle();
     if (m_pConnection == nullptr) {
         m_pConnection = std::make_unique<Connection>();
         m_pConnection->pEasy.reset(curl_easy_init());
-        m_pConnection->caState = CaState::Now();
         m_pConnection->blNamesProxy = NamesProxy();
     }
     if (m_pConnection->pEasy != nullptr) {
         SetOptions(*m_pConnection);
     }
-    const std::lock_guard<std::mutex> lock(ThePool().mutex);
-    ThePool().inUse.insert(m_pConnection.get());
+    const std::lock_guard<std::mutex> lock(g_pool->mutex);
+    g_pool->inUse.insert(m_pConnection.get());
 }
 
 Borrowed::~Borrowed() {
     if (m_pConnection == nullptr) {
         return;
     }
-    Pool &pool = ThePool();
+    Pool &pool = *g_pool;
     const std::lock_guard<std::mutex> lock(pool.mutex);
     pool.inUse.erase(m_pConnection.get());
     if (pool.idle.size() < pool.idle.capacity() && m_pConnection->pEasy != nullptr) {

@@ -9,8 +9,6 @@
 #include <memory>
 #include <set>
 
-#include "appliance_ca.h"
-
 namespace host {
 
 struct CleanupEasy {
@@ -20,7 +18,6 @@ struct CleanupEasy {
 // process can close its copies without a word on the wire.
 struct Connection {
     std::set<curl_socket_t> sockets;
-    CaState caState;
     bool blNamesProxy = false;  // whether the environment did when the handle was made
     std::array<char, CURL_ERROR_SIZE> reason = {};  // libcurl's, of what failed
     // What TLS said in the latest exchange.

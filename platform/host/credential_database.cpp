@@ -4,6 +4,7 @@
 
 #include <array>
 
+#include "never_destroyed.h"
 #include "set_aside.h"
 #include "sqlite_database.h"
 
@@ -24,10 +25,11 @@ constexpr const char *kSchema =
 #define CREDENTIAL_COLUMNS \
     "id, application, host, protocol, extra_info, port, owner, create_time, modify_time"
 
+constexpr int kCredentialColumns = 9;
+
 enum StatementKind {
     kReadCredential,
     kReadFirst,
-    kCount,
     kReadAll,
     kFindId,
     kInsertCredential,
@@ -41,8 +43,9 @@ enum StatementKind {
 
 constexpr std::array<const char *, kStatementCount> kStatements = {
     "SELECT " CREDENTIAL_COLUMNS " FROM credential WHERE id = ?1",
-    "SELECT " CREDENTIAL_COLUMNS " FROM credential WHERE application = ?1 ORDER BY id LIMIT 1",
-    "SELECT COUNT(*) FROM credential WHERE application = ?1",
+    "SELECT " CREDENTIAL_COLUMNS
+    ", (SELECT COUNT(*) FROM credential WHERE application = ?1)"
+    " FROM credential WHERE application = ?1 ORDER BY id LIMIT 1",
     "SELECT " CREDENTIAL_COLUMNS " FROM credential ORDER BY id",
     "SELECT MIN(id) FROM credential WHERE application = ?1",
     "INSERT INTO credential (application, host, protocol, extra_info, port, owner, create_time,"
@@ -64,7 +67,7 @@ constexpr sqlite::Store kStore = {"credential store",
                                   kStatements.data(),
                                   kStatements.size()};
 
-sqlite::Database &g_database = *new sqlite::Database(kStore);
+NeverDestroyed<sqlite::Database> g_database(kStore);
 
 void ReadRow(const Run &run, ZELO_CRED &cred) {
     cred.id = run.Number(0);
@@ -78,58 +81,9 @@ void ReadRow(const Run &run, ZELO_CRED &cred) {
     cred.modifyTime_s = run.OptionalNumber(8);
 }
 
-// What was read last in answer to a question, and in which state of the store. The store's mutex
-// guards it. Requests that load their records anew each time then cost a look at the file each.
-template <typename Question, typename Answer>
-struct Kept {
-    sqlite::State state;
-    Question question = {};
-    Answer answer = {};
-};
-
-template <typename Question, typename Answer>
-bool IsKept(const Kept<Question, Answer> &kept, const Question &question, Answer &answer) {
-    const sqlite::Glance glance(g_database);
-    if (!glance.Shows(kept.state) || kept.question != question) {
-        return false;
-    }
-    answer = kept.answer;
-    return true;
-}
-
-// Never destroyed, so that they serve until the very end of a process.
-Kept<std::string, long> &g_keptId = *new Kept<std::string, long>;
-Kept<long, ZELO_CRED> &g_keptCredential = *new Kept<long, ZELO_CRED>;
-Kept<long, ZELO_CRED_SESS> &g_keptSession = *new Kept<long, ZELO_CRED_SESS>;
-
-// How many credentials an application has in one version of the store. The store's mutex guards it.
-struct Count {
-    std::string strApplication;
-    std::uint64_t version = 0;
-    int count = 0;
-};
-
-// Counting walks the application's part of the index, so it is done once for each version of the
-// store.
-Result CountOf(const Run &run, const std::string &strApplication, int &count) {
-    static auto *const pLast = new Count;
-    const std::uint64_t version = run.Version();
-    if (pLast->version != version || pLast->strApplication != strApplication) {
-        Run counting(run, kCount);
-        counting.Bind(1, strApplication);
-        const Result result = counting.Step();
-        if (result != Result::kDone) {
-            return result;
-        }
-        *pLast = {strApplication, version, static_cast<int>(counting.Number(0))};
-    }
-    count = pLast->count;
-    return Result::kDone;
-}
-
 Result RemoveById(StatementKind kind, long id) {
     // A store that does not exist is not created for the sake of a removal.
-    Run run(g_database, kind, false);
+    Run run(*g_database, kind, false);
     run.Bind(1, id);
     return run.Execute();
 }
@@ -137,33 +91,30 @@ Result RemoveById(StatementKind kind, long id) {
 }  // namespace
 
 Result ReadCredential(long id, ZELO_CRED &cred) {
-    if (IsKept(g_keptCredential, id, cred)) {
-        return Result::kDone;
-    }
-    Run run(g_database, kReadCredential, false);
+    Run run(*g_database, kReadCredential, false);
     run.Bind(1, id);
     const Result result = run.Step();
     if (result == Result::kDone) {
         ReadRow(run, cred);
-        g_keptCredential = {run.FileState(), id, cred};
     }
     return result;
 }
 
 Result ReadFirst(const char *szApplication, ZELO_CRED &cred, int &count) {
     const std::string strApplication = szApplication;
-    Run run(g_database, kReadFirst, false);
+    Run run(*g_database, kReadFirst, false);
     run.Bind(1, strApplication);
     const Result result = run.Step();
     if (result != Result::kDone) {
         return result;
     }
     ReadRow(run, cred);
-    return CountOf(run, strApplication, count);
+    count = static_cast<int>(run.Number(kCredentialColumns));
+    return Result::kDone;
 }
 
 Result ReadAll(std::vector<ZELO_CRED> &creds) {
-    Run run(g_database, kReadAll, false);
+    Run run(*g_database, kReadAll, false);
     Result result = Result::kDone;
     while ((result = run.Step()) == Result::kDone) {
         ReadRow(run, creds.emplace_back());
@@ -173,10 +124,7 @@ Result ReadAll(std::vector<ZELO_CRED> &creds) {
 
 Result FindId(const char *szApplication, long &id) {
     const std::string strApplication = szApplication;
-    if (IsKept(g_keptId, strApplication, id)) {
-        return Result::kDone;
-    }
-    Run run(g_database, kFindId, false);
+    Run run(*g_database, kFindId, false);
     run.Bind(1, strApplication);
     const Result result = run.Step();
     if (result != Result::kDone) {
@@ -186,12 +134,11 @@ Result FindId(const char *szApplication, long &id) {
         return Result::kAbsent;
     }
     id = run.Number(0);
-    g_keptId = {run.FileState(), strApplication, id};
     return Result::kDone;
 }
 
 Result WriteCredential(ZELO_CRED &cred) {
-    Run run(g_database, cred.id < 0 ? kInsertCredential : kUpdateCredential, true);
+    Run run(*g_database, cred.id < 0 ? kInsertCredential : kUpdateCredential, true);
     if (cred.id >= 0) {
         run.Bind(1, cred.id);
     }
@@ -220,7 +167,7 @@ Result RemoveCredential(long id) {
 }
 
 int SetAsideIfDamaged(char *szPath, int cbPath) {
-    return g_database.SetAsideIfDamaged(szPath, cbPath);
+    return g_database->SetAsideIfDamaged(szPath, cbPath);
 }
 
 bool ListSetAside(std::vector<std::string> &paths) {
@@ -228,23 +175,19 @@ bool ListSetAside(std::vector<std::string> &paths) {
 }
 
 Result ReadSession(long id, ZELO_CRED_SESS &sess) {
-    if (IsKept(g_keptSession, id, sess)) {
-        return Result::kDone;
-    }
-    Run run(g_database, kReadSession, false);
+    Run run(*g_database, kReadSession, false);
     run.Bind(1, id);
     const Result result = run.Step();
     if (result == Result::kDone) {
         sess.id = run.Number(0);
         sess.accessToken = run.OptionalText(1);
         sess.csrfToken = run.OptionalText(2);
-        g_keptSession = {run.FileState(), id, sess};
     }
     return result;
 }
 
 Result WriteSession(const ZELO_CRED_SESS &sess) {
-    Run run(g_database, kWriteSession, true);
+    Run run(*g_database, kWriteSession, true);
     run.Bind(1, sess.id);
     run.Bind(2, sess.accessToken);
     run.Bind(3, sess.csrfToken);

@@ -22,6 +22,7 @@
 #include "file_state.h"
 #include "foreign_file.h"
 #include "last_error.h"
+#include "never_destroyed.h"
 #include "trusted_file.h"
 #include "waiting.h"
 
@@ -39,17 +40,15 @@ constexpr std::chrono::microseconds kFirstWait{100};
 constexpr std::chrono::microseconds kLastWait{2000};
 
 // The lock files that the process has open; a handle is a descriptor. Opening and forking exclude
-// each other, so that a child process knows what it has to close. Never destroyed: other threads
-// may still hold locks while the process ends.
+// each other, so that a child process knows what it has to close.
 std::mutex g_mutex;
-alignas(std::vector<int>) unsigned char g_openPlace[sizeof(std::vector<int>)];
-std::vector<int> &g_open = *new (g_openPlace) std::vector<int>;
+host::NeverDestroyed<std::vector<int>> g_open;
 
 void CloseInChild() {
-    for (const int fd : g_open) {
+    for (const int fd : *g_open) {
         close(fd);
     }
-    g_open.clear();
+    g_open->clear();
     g_mutex.unlock();
 }
 
@@ -61,13 +60,13 @@ class LockFile {
   public:
     LockFile(const char *szPath, bool blCreate) {
         const std::lock_guard<std::mutex> guard(g_mutex);
-        g_open.reserve(g_open.size() + 1);
+        g_open->reserve(g_open->size() + 1);
         m_fd =
             open(szPath,
                  O_RDWR | (blCreate ? O_CREAT : 0) | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC,
                  0600);
         if (m_fd >= 0) {
-            g_open.push_back(m_fd);
+            g_open->push_back(m_fd);
         }
     }
     LockFile(const LockFile &) = delete;
@@ -80,11 +79,11 @@ class LockFile {
     // Closes the file, and so releases the lock. False when it is no lock file's descriptor.
     static bool Close(int fd) {
         const std::lock_guard<std::mutex> guard(g_mutex);
-        const auto open = std::find(g_open.begin(), g_open.end(), fd);
-        if (open == g_open.end()) {
+        const auto open = std::find(g_open->begin(), g_open->end(), fd);
+        if (open == g_open->end()) {
             return false;
         }
-        g_open.erase(open);
+        g_open->erase(open);
         return close(fd) == 0;
     }
 

@@ -7,8 +7,6 @@
 #include <syslog.h>
 #include <unistd.h>
 
-#include <array>
-#include <atomic>
 #include <cerrno>
 #include <cstring>
 #include <new>
@@ -36,8 +34,6 @@ constexpr const char *kSettings =
 // The chain of all databases. The mutex goes before those of the databases.
 std::mutex g_chainMutex;
 
-// How many connections the process has opened.
-std::atomic<unsigned> g_connections{0};
 Database *g_pFirst = nullptr;
 
 // Waited for: the store's other users, in this process and elsewhere, and its disk.
@@ -57,8 +53,7 @@ bool IsOurs(const struct stat &status) {
 
 // The statements go before the database that they belong to.
 struct Connection {
-    unsigned serial = ++g_connections;  // tells it from every other one of the process
-    struct stat file = {};              // at the latest use
+    struct stat file = {};  // at the latest use
     bool blHasSchema = false;
     bool blFailed = false;  // the next use opens the file anew
     DatabaseHandle pDb;
@@ -305,45 +300,6 @@ int Database::SetAsideIfDamaged(char *szPath, int cbPath) {
     }
 }
 
-// The count stands in the file's header. It is read on the connection's own descriptor: to close
-// another one would drop SQLite's locks. A file that somebody has given a write-ahead log counts
-// nothing: what is written goes into the log first.
-bool Database::ReadChanges(std::uint32_t &changes) const {
-    constexpr int kPlace = 18;
-    constexpr std::size_t kCount = 24 - kPlace;
-    constexpr unsigned char kWithoutLog = 1;
-    std::array<unsigned char, kCount + 4> bytes = {};
-    sqlite3_file *pFile = nullptr;
-    if (sqlite3_file_control(m_pConnection->pDb.get(), "main", SQLITE_FCNTL_FILE_POINTER, &pFile) !=
-            SQLITE_OK ||
-        pFile->pMethods == nullptr ||
-        pFile->pMethods->xRead(pFile, bytes.data(), bytes.size(), kPlace) != SQLITE_OK ||
-        bytes[0] != kWithoutLog) {
-        return false;
-    }
-    changes = 0;
-    for (std::size_t i = kCount; i < bytes.size(); ++i) {
-        changes = changes << 8U | bytes[i];
-    }
-    return true;
-}
-
-// --- Glance -------------------------------------------------------------------------------------
-
-Glance::Glance(Database &database) : m_lock(database.m_mutex, std::try_to_lock) {
-    struct stat folder = {};
-    m_blKnown = m_lock.owns_lock() && database.m_pConnection != nullptr &&
-                stat(database.m_store.szFolder, &folder) == 0 && IsOurs(folder) &&
-                (folder.st_mode & kOthersOfFolder) == 0 &&
-                lstat(database.m_store.szPath, &m_now.file) == 0 &&
-                IsSameFile(m_now.file, database.m_pConnection->file) &&
-                database.ReadChanges(m_now.changes);
-}
-
-bool Glance::Shows(const State &state) const {
-    return m_blKnown && m_now.changes == state.changes && IsUnchanged(m_now.file, state.file);
-}
-
 // --- Run ----------------------------------------------------------------------------------------
 
 Run::Run(Database &database, std::size_t statement, bool blWrite)
@@ -352,10 +308,6 @@ Run::Run(Database &database, std::size_t statement, bool blWrite)
     if (m_result == Result::kDone) {
         Prepare(statement);
     }
-}
-
-Run::Run(const Run &outer, std::size_t statement) : m_database(outer.m_database), m_waiting({}) {
-    Prepare(statement);
 }
 
 void Run::Prepare(std::size_t statement) {
@@ -431,20 +383,6 @@ std::optional<std::string> Run::OptionalText(int column) const {
     }
     return std::string(reinterpret_cast<const char *>(pText),
                        static_cast<std::size_t>(sqlite3_column_bytes(m_pStatement, column)));
-}
-
-std::uint64_t Run::Version() const {
-    unsigned version = 0;
-    sqlite3_file_control(m_pDb, "main", SQLITE_FCNTL_DATA_VERSION, &version);
-    return std::uint64_t{m_database.m_pConnection->serial} << 32U | version;
-}
-
-State Run::FileState() const {
-    State state;
-    if (m_database.ReadChanges(state.changes)) {
-        state.file = m_database.m_pConnection->file;
-    }
-    return state;
 }
 
 long Run::LastId() const {

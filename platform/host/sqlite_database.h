@@ -16,7 +16,6 @@
 #include <sys/types.h>
 
 #include <cstddef>
-#include <cstdint>
 #include <memory>
 #include <mutex>
 #include <optional>
@@ -43,13 +42,6 @@ struct Store {
     std::size_t cStatements;
 };
 
-// The state of a store's file. What was read in a state holds for as long as the file is in it:
-// each process's change counts the changes up, and another file in its place has another status.
-struct State {
-    struct stat file = {};
-    std::uint32_t changes = 0;
-};
-
 struct Connection;
 
 // The process's access to one store. Made once, while the library is loaded, and never destroyed,
@@ -68,7 +60,6 @@ class Database {
     int SetAsideIfDamaged(char *szPath, int cbPath);
 
   private:
-    friend class Glance;
     friend class Run;
 
     static void CloseAllBeforeFork();
@@ -83,7 +74,6 @@ class Database {
     Result CheckFormat();
     Result MoveIfDamaged(std::string &strPath);
     Result CreateSchema();
-    bool ReadChanges(std::uint32_t &changes) const;
     Result Fail(int sqliteError, const char *szWhat, int line);
     Result FailErrno(int line);
 
@@ -93,30 +83,12 @@ class Database {
     Database *m_pNext = nullptr;  // all databases are in one chain, for the fork handlers
 };
 
-// A look at the store's file that takes no lock of the store, and the mutex for as long as it
-// lives, unless that is taken. It waits for nobody.
-class Glance {
-  public:
-    explicit Glance(Database &database);
-
-    // Whether the file is in the state. False where that cannot be told at once.
-    bool Shows(const State &state) const;
-
-  private:
-    std::unique_lock<std::mutex> m_lock;
-    bool m_blKnown = false;
-    State m_now;
-};
-
 // One run of a prepared statement: takes the mutex and the connection, gives both back when it goes
 // out of scope. A failure on the way is kept: later steps do nothing and return it. With blWrite
 // the store is created when it is not there; without, it then counts as empty.
 class Run {
   public:
     Run(Database &database, std::size_t statement, bool blWrite);
-    // A further statement while the outer run is on a row, and thereby on the same version of the
-    // store.
-    Run(const Run &outer, std::size_t statement);
     ~Run();
     Run(const Run &) = delete;
     Run &operator=(const Run &) = delete;
@@ -143,14 +115,6 @@ class Run {
     std::optional<long> OptionalNumber(int column) const;
     std::optional<std::string> OptionalText(int column) const;
 
-    // The version of the store that the row belongs to: any process's change, and another file in
-    // the store's place, make another one.
-    std::uint64_t Version() const;
-
-    // The state of the file that the row belongs to; one that no file is in where it cannot be
-    // told.
-    State FileState() const;
-
     long LastId() const;
     int Changes() const;
 
@@ -159,8 +123,8 @@ class Run {
     void Check(int sqliteError, int line);
 
     Database &m_database;
-    Waiting m_waiting;                    // nothing in a further run
-    std::unique_lock<std::mutex> m_lock;  // holds nothing in a further run
+    Waiting m_waiting;
+    std::lock_guard<std::mutex> m_lock;
     sqlite3 *m_pDb = nullptr;
     sqlite3_stmt *m_pStatement = nullptr;
     Result m_result = Result::kDone;

@@ -7,10 +7,10 @@
 #include <functional>
 #include <map>
 #include <mutex>
-#include <new>
 
 #include "file_state.h"
 #include "held_mutex.h"
+#include "never_destroyed.h"
 #include "strings_text.h"
 
 namespace host {
@@ -27,10 +27,7 @@ constexpr off_t kLongestLine = off_t{16} * 1024 * 1024;
 std::mutex g_mutex;
 const int g_forkHandlers = HoldAroundForks<g_mutex>();
 
-// Never destroyed, so that it serves until the very end of a process.
-alignas(std::map<std::string,
-                 IndexHandle>) unsigned char g_indexes[sizeof(std::map<std::string, IndexHandle>)];
-auto &g_indexByPath = *new (g_indexes) std::map<std::string, IndexHandle>;
+NeverDestroyed<std::map<std::string, IndexHandle>> g_indexByPath;
 
 bool IsBefore(const StringsIndex::Section &a, const StringsIndex::Section &b) {
     return a.hash < b.hash;
@@ -88,8 +85,8 @@ std::vector<StringsIndex::Section> StringsIndex::Find(std::string_view name) con
 IndexHandle IndexOf(const char *szPath, int fd, const struct stat &state) {
     {
         const std::lock_guard<std::mutex> lock(g_mutex);
-        const auto kept = g_indexByPath.find(szPath);
-        if (kept != g_indexByPath.end() && IsUnchanged(kept->second->file, state)) {
+        const auto kept = g_indexByPath->find(szPath);
+        if (kept != g_indexByPath->end() && IsUnchanged(kept->second->file, state)) {
             return kept->second;
         }
     }
@@ -98,10 +95,10 @@ IndexHandle IndexOf(const char *szPath, int fd, const struct stat &state) {
     IndexHandle pIndex = MakeIndex(fd, state);
     if (pIndex != nullptr && blSettled) {
         const std::lock_guard<std::mutex> lock(g_mutex);
-        if (g_indexByPath.size() >= kMaxIndexes) {
-            g_indexByPath.clear();
+        if (g_indexByPath->size() >= kMaxIndexes) {
+            g_indexByPath->clear();
         }
-        g_indexByPath[szPath] = pIndex;
+        (*g_indexByPath)[szPath] = pIndex;
     }
     return pIndex;
 }

@@ -2,7 +2,6 @@
 
 #include "../web_api_request.h"
 
-#include <pthread.h>
 #include <syslog.h>
 
 #include <algorithm>
@@ -12,9 +11,11 @@
 #include <utility>
 
 #include "credential_record.h"
+#include "held_mutex.h"
 #include "http_exchange.h"
 #include "json_text.h"
 #include "last_error.h"
+#include "never_destroyed.h"
 
 namespace ZELO {
 namespace {
@@ -58,45 +59,28 @@ bool ReadServer(const ZELO_CRED *pCred, Server &server) {
     return !server.strHost.empty();
 }
 
-// The URLs that this process has learnt, by server and API. A fork waits for its mutex, so that the
-// child finds it free.
-class UrlCache {
-  public:
-    UrlCache() {
-        pthread_atfork([] { Urls().m_mutex.lock(); }, [] { Urls().m_mutex.unlock(); },
-                       [] { Urls().m_mutex.unlock(); });
-    }
+// The URLs that this process has learnt, by server and API.
+std::mutex g_urlMutex;
+const int g_forkHandlers = host::HoldAroundForks<g_urlMutex>();
+host::NeverDestroyed<std::map<std::string, std::string>> g_urls;
 
-    // Never destroyed, so that it serves until the very end of a process.
-    static UrlCache &Urls() {
-        static auto *const pUrls = new UrlCache;
-        return *pUrls;
-    }
+std::string FindUrl(const std::string &strKey) {
+    const std::lock_guard<std::mutex> lock(g_urlMutex);
+    const auto at = g_urls->find(strKey);
+    return at == g_urls->end() ? std::string() : at->second;
+}
 
-    std::string Find(const std::string &strKey) {
-        const std::lock_guard<std::mutex> lock(m_mutex);
-        const auto at = m_urls.find(strKey);
-        return at == m_urls.end() ? std::string() : at->second;
+void LearnUrl(const std::string &strKey, const std::string &strUrl) {
+    const std::lock_guard<std::mutex> lock(g_urlMutex);
+    if (g_urls->size() >= kMaxUrls) {
+        g_urls->clear();
     }
-    void Learn(const std::string &strKey, const std::string &strUrl) {
-        const std::lock_guard<std::mutex> lock(m_mutex);
-        if (m_urls.size() >= kMaxUrls) {
-            m_urls.clear();
-        }
-        m_urls[strKey] = strUrl;
-    }
-    void Forget(const std::string &strKey) {
-        const std::lock_guard<std::mutex> lock(m_mutex);
-        m_urls.erase(strKey);
-    }
+    (*g_urls)[strKey] = strUrl;
+}
 
-  private:
-    std::mutex m_mutex;
-    std::map<std::string, std::string> m_urls;
-};
-
-UrlCache &Urls() {
-    return UrlCache::Urls();
+void ForgetUrl(const std::string &strKey) {
+    const std::lock_guard<std::mutex> lock(g_urlMutex);
+    g_urls->erase(strKey);
 }
 
 // Runs the body; short memory becomes the failure value.
@@ -215,7 +199,7 @@ std::string Discover(const Server &server, const std::string &api) {
     if (szPath == nullptr || !IsPath(szPath)) {
         return NoPath(request.strUrl, "names no path that can be used", __LINE__);
     }
-    Urls().Learn(server.Key(api), server.Url(szPath));
+    LearnUrl(server.Key(api), server.Url(szPath));
     return szPath;
 }
 
@@ -251,7 +235,7 @@ struct CredRequest::Impl {
             return false;
         }
         strUrlKey = server.Key(api);
-        strUrl = Urls().Find(strUrlKey);
+        strUrl = FindUrl(strUrlKey);
         if (strUrl.empty()) {
             const std::string strPath = Discover(server, api);
             if (strPath.empty()) {
@@ -310,7 +294,7 @@ struct CredRequest::Impl {
         host::HttpReply reply;
         const int result = Ask(request, reply);
         if (reply.status == kStatusNotFound) {
-            Urls().Forget(strUrlKey);
+            ForgetUrl(strUrlKey);
         }
         if (result == CRED_REQ_ERR_NONE) {
             strResponse.swap(reply.strBody);

@@ -7,6 +7,7 @@
 #include <string>
 
 #include "last_error.h"
+#include "never_destroyed.h"
 #include "sqlite_database.h"
 
 namespace {
@@ -37,7 +38,7 @@ constexpr host::sqlite::Store kStore = {"web session store",
                                         kStatements.data(),
                                         kStatements.size()};
 
-host::sqlite::Database &g_database = *new host::sqlite::Database(kStore);
+host::NeverDestroyed<host::sqlite::Database> g_database(kStore);
 
 // The answer of an operation: 1 when it ended as wanted, 0 otherwise.
 template <typename Body>
@@ -60,7 +61,7 @@ int RunOnSession(const ZELO_CGI_CONTEXT *pContext, int index, const char *szName
     }
     return Answer([&] {
         const std::string strName = szName;
-        Run run(g_database, kind, kind == kAdd);
+        Run run(*g_database, kind, kind == kAdd);
         run.Bind(1, index);
         run.Bind(2, strName);
         return kind == kFind ? run.Step() : run.Execute();
@@ -74,7 +75,7 @@ int ZeloCgiInit(const char *szRequest, ZELO_CGI_CONTEXT *pContext) {
         HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
         return 0;
     }
-    pContext->blReady = Answer([] { return Run(g_database, kLook, false).Execute(); });
+    pContext->blReady = Answer([] { return Run(*g_database, kLook, false).Execute(); });
     return pContext->blReady;
 }
 
@@ -91,7 +92,7 @@ int ZeloCgiRemoveSessionByIndex(ZELO_CGI_CONTEXT *pContext, int index, const cha
 }
 
 int ZeloCgiStoreSetAside(char *szPath, int cbPath) {
-    return g_database.SetAsideIfDamaged(szPath, cbPath);
+    return g_database->SetAsideIfDamaged(szPath, cbPath);
 }
 
 void ZeloCgiFree(ZELO_CGI_CONTEXT *pContext) {
