@@ -2,6 +2,7 @@
 
 #include <fcntl.h>
 #include <sys/file.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -30,11 +31,12 @@ bool LeadsTo(const char *szPath, const struct stat &opened) {
            named.st_dev == opened.st_dev;
 }
 
-}  // namespace
-
+// Whether it is a regular file of the caller's own with no other name.
 bool IsOwnFile(const struct stat &status) {
     return S_ISREG(status.st_mode) && status.st_nlink == 1 && status.st_uid == geteuid();
 }
+
+}  // namespace
 
 LockedFile::LockedFile(const char *szPath, std::optional<mode_t> mode,
                        std::chrono::milliseconds wait) {

@@ -3,13 +3,10 @@
 #ifndef ZELO_LOCKED_FILE_H
 #define ZELO_LOCKED_FILE_H
 
-#include <sys/stat.h>
+#include <sys/types.h>
 
 #include <chrono>
 #include <optional>
-
-// Whether it is a regular file of the caller's own with no other name.
-bool IsOwnFile(const struct stat &status);
 
 // The open file under the kernel's lock, which it loses with the process that holds it: what a
 // killed process leaves behind keeps nobody waiting. Threads of one process exclude each other too.
