@@ -25,7 +25,7 @@ ExitCode Create(Report &report) {
 ExitCode Delete(Report &report) {
     Report::Stage("deleting the service account");
     Report::Remedy("run 'qrmctl account delete' again, or 'qrmctl leave'");
-    if (!ZELOQRMClientDeleteServerUser() || !IsAccountGone()) {
+    if (!ZELOQRMClientDeleteServerUser()) {
         return report.Fail(ErrorId::kAccountNotDeleted,
                            "the service account could not be deleted, or the account files cannot "
                            "be read; -v shows the reason");

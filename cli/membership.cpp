@@ -198,11 +198,6 @@ bool CreateServiceAccount() {
     return SeedGenerator() && ZELOQRMClientCreateServerUser();
 }
 
-bool IsAccountGone() {
-    MovingHandle<ZELO_USER, ZELOUserFree> user;
-    return ZELOUserGet(kServiceAccount, user.Address()) < 0 && YLIBCErrGet() == YLIBC_ERR_NOT_FOUND;
-}
-
 bool SetJoinFlag(const char *szValue) {
     return YLIBCINFOSetKeyValue(kJoinFlag, szValue) >= 0;
 }
@@ -220,9 +215,9 @@ bool LeaveWholly(const LeaveRequest &request) {
             return false;
         }
     }
-    // To the library's look-ups, what cannot be read and what is not there are the same.
+    // To the library's other look-ups, what cannot be read and what is not there are the same.
     return ZELOQRMClientStatus() == 0 && RemoveRemains(request.blRejoin) && AreCredentialsGone() &&
-           AreSessionsGone() && IsAccountGone() && IsFlagGone(request.blRejoin);
+           AreSessionsGone() && IsFlagGone(request.blRejoin);
 }
 
 }  // namespace qrmctl

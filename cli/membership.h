@@ -37,9 +37,6 @@ bool AddClientSessions();
 // Seeds the generator that the account's password comes from, and creates the account.
 bool CreateServiceAccount();
 
-// Whether the account is not there for certain. Accounts that cannot be read may hold it.
-bool IsAccountGone();
-
 bool SetJoinFlag(const char *szValue);
 
 // What the time counts for while a turn is waited for.

@@ -28,7 +28,8 @@ constexpr std::chrono::seconds kTouchWait{1};
 // Whether nobody else can have put it there. What the platform does not tell of it is in order.
 bool IsMarkerOurs(const struct stat &status) {
     const mode_t type = status.st_mode & S_IFMT;
-    return (type == 0 || type == S_IFREG) && (status.st_uid == 0 || status.st_uid == geteuid());
+    return (type == 0 || type == S_IFREG) && status.st_nlink <= 1 &&
+           (status.st_uid == 0 || status.st_uid == geteuid());
 }
 
 // A folder in the marker's place goes; one that others keep something in is moved aside.
@@ -61,21 +62,20 @@ bool connect_failed_marker::IsRecent() {
 // processes, which remove the marker under its lock.
 void connect_failed_marker::Touch() {
     RemoveFolder();
-    const LockedFile marker(kMarker, kMode, kTouchWait);
-    if (marker.IsHeld() && IsFolderSafe()) {
+    std::optional<LockedFile> marker(std::in_place, kMarker, kMode, kTouchWait);
+    if (!marker->IsHeld() && unlink(kMarker) == 0) {
+        marker.emplace(kMarker, kMode, kTouchWait);  // what held it so long is no touch
+    }
+    if (marker->IsHeld() && IsFolderSafe()) {
         static_cast<void>(YLIBCExec(kTouch, kMarker, nullptr, nullptr, nullptr));
-    } else if (marker.IsHeld()) {
-        static_cast<void>(futimens(marker.Get(), nullptr));
+    } else if (marker->IsHeld()) {
+        static_cast<void>(futimens(marker->Get(), nullptr));
     }
 }
 
 // Waits for another process's touch of the same file: a name that is free too soon may become a
 // link.
 void connect_failed_marker::Remove() {
-    std::optional<LockedFile> marker;
-    struct stat status = {};
-    if (lstat(kMarker, &status) == 0 && IsOwnFile(status)) {
-        marker.emplace(kMarker, std::nullopt, kTouchWait);
-    }
+    const LockedFile marker(kMarker, std::nullopt, kTouchWait);
     unlink(kMarker);
 }

@@ -3,7 +3,6 @@
 #include <fcntl.h>
 #include <json/reader.h>
 #include <json/writer.h>
-#include <openssl/asn1.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -13,6 +12,7 @@
 #include <string_view>
 
 #include "descriptor.h"
+#include "printable.h"
 
 namespace json_text {
 namespace {
@@ -83,24 +83,13 @@ bool HasTooManyValues(const std::string &strText) {
     return false;
 }
 
-// The bytes of the character at the place; 0 when they are none.
-int CharacterLength(std::string_view text, std::size_t at) {
-    constexpr std::size_t kLongest = 4;
-    const std::string_view bytes = text.substr(at, kLongest);
-    unsigned long character = 0;
-    const int cb = UTF8_getc(reinterpret_cast<const unsigned char *>(bytes.data()),
-                             static_cast<int>(bytes.size()), &character);
-    return std::max(cb, 0);
-}
-
 bool IsUtf8(std::string_view text) {
-    std::size_t at = 0;
-    while (at < text.size()) {
-        const int cb = (text[at] & 0x80) == 0 ? 1 : CharacterLength(text, at);
+    unsigned long code = 0;
+    for (std::size_t at = 0, cb = 0; at < text.size(); at += cb) {
+        cb = (text[at] & 0x80) == 0 ? 1 : printable::CharacterAt(text, at, code);
         if (cb == 0) {
             return false;
         }
-        at += static_cast<std::size_t>(cb);
     }
     return true;
 }
@@ -108,10 +97,10 @@ bool IsUtf8(std::string_view text) {
 std::string AsUtf8(std::string_view text) {
     constexpr std::string_view kReplacement = "\xEF\xBF\xBD";
     std::string strText;
-    while (!text.empty()) {
-        const int cb = CharacterLength(text, 0);
-        strText += cb == 0 ? kReplacement : text.substr(0, static_cast<std::size_t>(cb));
-        text.remove_prefix(static_cast<std::size_t>(std::max(cb, 1)));
+    unsigned long code = 0;
+    for (std::size_t at = 0, cb = 0; at < text.size(); at += std::max<std::size_t>(cb, 1)) {
+        cb = printable::CharacterAt(text, at, code);
+        strText += cb == 0 ? kReplacement : text.substr(at, cb);
     }
     return strText;
 }

@@ -2,6 +2,7 @@
 
 #include <fcntl.h>
 #include <sys/file.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -30,11 +31,12 @@ bool LeadsTo(const char *szPath, const struct stat &opened) {
            named.st_dev == opened.st_dev;
 }
 
-}  // namespace
-
+// Whether it is a regular file of the caller's own with no other name.
 bool IsOwnFile(const struct stat &status) {
     return S_ISREG(status.st_mode) && status.st_nlink == 1 && status.st_uid == geteuid();
 }
+
+}  // namespace
 
 LockedFile::LockedFile(const char *szPath, std::optional<mode_t> mode,
                        std::chrono::milliseconds wait) {
@@ -42,34 +44,35 @@ LockedFile::LockedFile(const char *szPath, std::optional<mode_t> mode,
     Try result = Try::kAgain;
     do {
         result = Open(szPath, mode, end);
-        if (result != Try::kHeld) {
-            Close();
-        }
     } while (result == Try::kAgain && Clock::now() < end);
+    if (result != Try::kHeld) {
+        m_file = Descriptor();
+    }
 }
 
 LockedFile::~LockedFile() {
-    Close();
+    // A child process that was forked meanwhile has a copy of the descriptor.
+    flock(m_file.Get(), LOCK_UN);
 }
 
 LockedFile::Try LockedFile::Open(const char *szPath, std::optional<mode_t> mode,
                                  Clock::time_point end) {
     constexpr int kFlags = O_RDWR | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC;
-    m_fd = open(szPath, kFlags);
-    if (m_fd < 0 && errno == ENOENT && mode) {
+    m_file = Descriptor(open(szPath, kFlags));
+    if (Get() < 0 && errno == ENOENT && mode) {
         // With O_CREAT alone, the kernel may refuse what somebody else has put there.
-        m_fd = open(szPath, kFlags | O_CREAT | O_EXCL, *mode);
-        if (m_fd < 0 && errno == EEXIST) {
+        m_file = Descriptor(open(szPath, kFlags | O_CREAT | O_EXCL, *mode));
+        if (Get() < 0 && errno == EEXIST) {
             return Try::kAgain;
         }
     }
-    if (m_fd < 0) {
+    if (Get() < 0) {
         // A link or a socket.
         const bool blInTheWay = errno == ELOOP || errno == ENXIO;
         return blInTheWay && unlink(szPath) == 0 ? Try::kAgain : Try::kFailed;
     }
     struct stat status = {};
-    if (!Lock(m_fd, end) || fstat(m_fd, &status) != 0) {
+    if (!Lock(Get(), end) || fstat(Get(), &status) != 0) {
         return Try::kFailed;
     }
     if (!LeadsTo(szPath, status)) {
@@ -77,13 +80,4 @@ LockedFile::Try LockedFile::Open(const char *szPath, std::optional<mode_t> mode,
     }
     // Somebody else's process, if one took a turn by this file, has ended it.
     return IsOwnFile(status) ? Try::kHeld : unlink(szPath) == 0 ? Try::kAgain : Try::kFailed;
-}
-
-void LockedFile::Close() {
-    if (m_fd >= 0) {
-        // A child process that was forked meanwhile has a copy of the descriptor.
-        flock(m_fd, LOCK_UN);
-        close(m_fd);
-        m_fd = -1;
-    }
 }

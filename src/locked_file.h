@@ -3,13 +3,12 @@
 #ifndef ZELO_LOCKED_FILE_H
 #define ZELO_LOCKED_FILE_H
 
-#include <sys/stat.h>
+#include <sys/types.h>
 
 #include <chrono>
 #include <optional>
 
-// Whether it is a regular file of the caller's own with no other name.
-bool IsOwnFile(const struct stat &status);
+#include "descriptor.h"
 
 // The open file under the kernel's lock, which it loses with the process that holds it: what a
 // killed process leaves behind keeps nobody waiting. Threads of one process exclude each other too.
@@ -24,19 +23,18 @@ class LockedFile {
     LockedFile(const LockedFile &) = delete;
     LockedFile &operator=(const LockedFile &) = delete;
 
-    bool IsHeld() const { return m_fd >= 0; }
+    bool IsHeld() const { return m_file.Get() >= 0; }
 
     // For reading and writing; negative when it is not held.
-    int Get() const { return m_fd; }
+    int Get() const { return m_file.Get(); }
 
   private:
     using Clock = std::chrono::steady_clock;
     enum class Try { kHeld, kAgain, kFailed };
 
     Try Open(const char *szPath, std::optional<mode_t> mode, Clock::time_point end);
-    void Close();
 
-    int m_fd = -1;
+    Descriptor m_file;
 };
 
 #endif

@@ -48,8 +48,8 @@ void Write(const char *szStem, int line, const char *szFormat, ...) {
 
     // A line feed at the end of the fixed text stays one.
     std::string_view text = message.sz();
-    const std::string_view format = szFormat;
-    const bool blEnded = cbWhole < kMaxMessage && !format.empty() && format.back() == '\n';
+    const bool blEnded =
+        !text.empty() && text.back() == '\n' && std::string_view(szFormat).back() == '\n';
     text.remove_suffix(blEnded ? 1 : 0);
     FixedText<kMaxMessage> safe;
     if (CopySafe(text, safe) && cbWhole < kMaxMessage) {

@@ -21,20 +21,20 @@ bool IsUnseen(unsigned long code) {
 }
 
 Character At(std::string_view text, std::size_t at) {
-    constexpr std::size_t kLongest = 4;
-    const auto byte = static_cast<unsigned char>(text[at]);
-    if (byte < 0x80) {
-        return {1, byte, !IsUnseen(byte)};
-    }
-    const std::string_view bytes = text.substr(at, kLongest);
-    unsigned long code = 0;
-    const int cb = UTF8_getc(reinterpret_cast<const unsigned char *>(bytes.data()),
-                             static_cast<int>(bytes.size()), &code);
-    return cb > 0 ? Character{static_cast<std::size_t>(cb), code, !IsUnseen(code)}
-                  : Character{1, byte, false};
+    unsigned long code = static_cast<unsigned char>(text[at]);
+    const std::size_t cb = CharacterAt(text, at, code);
+    return {cb == 0 ? 1 : cb, code, cb > 0 && !IsUnseen(code)};
 }
 
 }  // namespace
+
+std::size_t CharacterAt(std::string_view text, std::size_t at, unsigned long &code) {
+    constexpr std::size_t kLongest = 4;
+    const std::string_view bytes = text.substr(at, kLongest);
+    const int cb = UTF8_getc(reinterpret_cast<const unsigned char *>(bytes.data()),
+                             static_cast<int>(bytes.size()), &code);
+    return cb > 0 ? static_cast<std::size_t>(cb) : 0;
+}
 
 Shown ShowAt(std::string_view text, std::size_t at) {
     const Character character = At(text, at);

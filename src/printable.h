@@ -13,6 +13,10 @@
 
 namespace printable {
 
+// How many bytes the character of UTF-8 has that begins at the place, with its code; 0, with the
+// code left alone, when none does.
+std::size_t CharacterAt(std::string_view text, std::size_t at, unsigned long &code);
+
 // What is shown of a character: itself, or up to three bytes as \xNN.
 struct Shown {
     FixedText<3 * 4 + 1> text;

@@ -3,6 +3,7 @@
 
 #include <fcntl.h>
 #include <openssl/evp.h>
+#include <sys/file.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -11,6 +12,7 @@
 #include <random>
 
 #include "children.h"
+#include "descriptor.h"
 #include "file_lock.h"
 #include "joined.h"
 #include "json_text.h"
@@ -214,6 +216,8 @@ TEST_F(SendWebapi, UsersAreToldAgainAfterTwoHoursAndAtOnceAfterAReply) {
 
 TEST_F(SendWebapi, WhatOthersPutInTheMarkersPlaceNeitherSilencesNorMisleadsIt) {
     constexpr const char *kTarget = "/tmp/target";
+    const std::time_t then = std::time(nullptr) - 60;
+    Descriptor locked;
     const std::function<bool()> rows[] = {
         [] { return symlink(kTarget, kMarker) == 0; },
         [] { return symlink("/tmp/absent", kMarker) == 0; },
@@ -222,7 +226,12 @@ TEST_F(SendWebapi, WhatOthersPutInTheMarkersPlaceNeitherSilencesNorMisleadsIt) {
         [] { return std::filesystem::create_directory(kMarker); },
         [] { return std::filesystem::create_directories(std::string(kMarker) + "/full"); },
         [] { return files::PutStrangers("link", kMarker); },
-        [] { return files::PutStrangers("file", kMarker); }};
+        [] { return files::PutStrangers("file", kMarker); },
+        [&] {
+            const bool blPut = files::PutStrangers("file", kMarker);
+            locked = Descriptor(open(kMarker, O_RDONLY | O_CLOEXEC));
+            return blPut && flock(locked.Get(), LOCK_EX) == 0;
+        }};
     for (const auto &put : rows) {
         // It stands there when the marker is looked at, or comes right afterwards.
         for (const char *szLook : {"", "YLIBCFileStat"}) {
@@ -231,7 +240,7 @@ TEST_F(SendWebapi, WhatOthersPutInTheMarkersPlaceNeitherSilencesNorMisleadsIt) {
             ZELOQRMClientDeleteServerCredential();
             std::filesystem::remove(kTarget);
             WriteFile(kTarget, "");
-            const timespec times[] = {{1000, 0}, {1000, 0}};
+            const timespec times[] = {{then, 0}, {then, 0}};
             utimensat(AT_FDCWD, kTarget, times, 0);
             if (!put()) {
                 continue;  // there is no other user here
@@ -242,7 +251,7 @@ TEST_F(SendWebapi, WhatOthersPutInTheMarkersPlaceNeitherSilencesNorMisleadsIt) {
             EXPECT_EQ(lstat(kMarker, &status), 0);
             EXPECT_TRUE(S_ISREG(status.st_mode) && status.st_uid == geteuid());
             EXPECT_EQ(stat(kTarget, &status), 0);
-            EXPECT_EQ(status.st_mtime, 1000);
+            EXPECT_EQ(status.st_mtime, then);
             EXPECT_FALSE(std::filesystem::exists("/tmp/absent"));
         }
     }
