@@ -13,10 +13,12 @@
 #include <cstdio>
 #include <cstring>
 #include <ctime>
+#include <mutex>
 #include <string>
 #include <utility>
 
 #include "file_descriptor.h"
+#include "held_mutex.h"
 #include "json_text.h"
 #include "last_error.h"
 #include "waiting.h"
@@ -106,10 +108,17 @@ class HeldJournal {
     struct stat m_status = {};
 };
 
+// The C library takes a lock for each conversion, which a child process may find taken.
+std::mutex g_conversion;
+const int g_forkHandlers = host::HoldAroundForks<g_conversion>();
+
 std::string Now() {
     const time_t now = time(nullptr);
     tm utc = {};
-    gmtime_r(&now, &utc);
+    {
+        const std::lock_guard<std::mutex> lock(g_conversion);
+        gmtime_r(&now, &utc);
+    }
     char sz[32] = {};
     std::strftime(sz, sizeof(sz), "%Y-%m-%dT%H:%M:%SZ", &utc);
     return sz;
