@@ -149,8 +149,7 @@ bool SetWay(const Connection &connection, bool blRelay) {
     CURL *const pEasy = connection.pEasy.get();
     std::string strValue;
     if (blRelay) {
-        if (LookUpKey(kConfigFile, "farlink_relay", strValue) != LookUp::kFound ||
-            strValue.empty()) {
+        if (!LookUpSetting("farlink_relay", strValue) || strValue.empty()) {
             return false;
         }
         curl_easy_setopt(pEasy, CURLOPT_PROXY, ("http://" + strValue).c_str());
@@ -158,10 +157,9 @@ bool SetWay(const Connection &connection, bool blRelay) {
         curl_easy_setopt(pEasy, CURLOPT_HTTPPROXYTUNNEL, 1L);
         return true;
     }
-    const bool blEnvironment =
-        connection.blNamesProxy &&
-        LookUpKey(kConfigFile, "use_proxy_environment", strValue) == LookUp::kFound &&
-        strValue == "yes";
+    const bool blEnvironment = connection.blNamesProxy &&
+                               LookUpSetting("use_proxy_environment", strValue) &&
+                               strValue == "yes";
     curl_easy_setopt(pEasy, CURLOPT_PROXY, blEnvironment ? nullptr : "");
     curl_easy_setopt(pEasy, CURLOPT_NOPROXY, nullptr);
     curl_easy_setopt(pEasy, CURLOPT_HTTPPROXYTUNNEL, 0L);
@@ -237,7 +235,7 @@ unsigned int LastErrorOf(int error) {
 
 void Warn(const HttpRequest &request, const std::string &strReason, int line) {
     // The query names nothing that helps, and it came from a caller.
-    const std::string strUrl = request.strUrl.substr(0, request.strUrl.find('?'));
+    const std::string strUrl = printable::Line(request.strUrl.substr(0, request.strUrl.find('?')));
     syslog(LOG_WARNING, "%s:%d %s%s: %s", kFile, line, strUrl.c_str(),
            request.blRelay ? " through the relay" : "", printable::Line(strReason).c_str());
 }
