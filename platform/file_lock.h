@@ -12,7 +12,10 @@
 //
 // Lock files may stand in a folder that everybody can write to. Wherever it stands, a lock file
 // that is a link, no regular file, a second name of a file, or somebody else's (root's excepted) is
-// refused. A failure sets the last error (last_error.h): YLIBC_ERR_BUSY when the time was up,
+// refused. Other users do not keep root from its lock in such a folder: what one of them has put at
+// the path is removed first.
+//
+// A failure sets the last error (last_error.h): YLIBC_ERR_BUSY when the time was up,
 // YLIBC_ERR_UNSAFE_FILE when the lock file was refused, YLIBC_ERR_FILE when it could not be opened
 // or created.
 

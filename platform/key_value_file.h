@@ -10,17 +10,17 @@
 // such as those without a key or with a zero byte. When a key stands in a file more than once, the
 // first line with it holds.
 //
-// No operation answers from a former state of the file, but for a folder above it that was replaced
-// within the last millisecond; any thread may call them at any time. A file is only ever replaced
-// as a whole: a reader sees the old file or the new one, also when the writer dies half-way. Two
-// writers at once are the callers' to keep apart (file_lock.h): each writes whole files, so the
-// later one may undo the earlier one's change.
+// No operation answers from a former state of the file; any thread may call them at any time. A
+// file is only ever replaced as a whole: a reader sees the old file or the new one, also when the
+// writer dies half-way. Two writers at once are the callers' to keep apart (file_lock.h): each
+// writes whole files, so the later one may undo the earlier one's change.
 //
 // A file may stand in a folder that everybody can write to, such as "/tmp": what is no regular file
 // there, or belongs to somebody else (root excepted), or is a link or a second name of another file
-// is refused (YLIBC_ERR_UNSAFE_FILE), and a change does not wait for the disk. In any other folder
-// links are followed, a change through a link replaces the file that it leads to, and a change is
-// durable when the operation returns.
+// is refused (YLIBC_ERR_UNSAFE_FILE), and a change does not wait for the disk. Other users do not
+// keep root from its file there: what one of them has put at the path is removed, by a look-up too,
+// and counts as not there. In any other folder links are followed, a change through a link replaces
+// the file that it leads to, and a change is durable when the operation returns.
 //
 // A failure sets the last error (last_error.h): YLIBC_ERR_NOT_FOUND where a file that has to be
 // there is not, YLIBC_ERR_FILE where it cannot be read or written, which goes for a folder in its

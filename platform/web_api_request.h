@@ -22,9 +22,8 @@
 //     long as it moves; a full disk ends it, or the observer.
 //   - No operation throws, except that one which returns a std::string may throw std::bad_alloc.
 //   - Connections stay open between requests of one process and are used again within about 3 s,
-//   unless
-//     the server has closed them. A child process after fork makes its own. Requests may be used in
-//     several threads at once, each request by one thread at a time.
+//     unless the server has closed them. A child process after fork makes its own. Requests may be
+//     used in several threads at once, each request by one thread at a time.
 //   - A failure sets the last error (last_error.h).
 
 #ifndef ZELO_PLATFORM_WEB_API_REQUEST_H

@@ -5,6 +5,7 @@
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <sys/stat.h>
+#include <sys/syscall.h>
 
 #include <chrono>
 #include <filesystem>
@@ -55,8 +56,16 @@ TEST(FileLock, IsHeldFromTakingToRelease) {
     EXPECT_EQ(files::FileMode(kLock), 0600U);
     EXPECT_FALSE(IsFree());
     EXPECT_TRUE(children::InOne([] { return !IsFree(); }));
+    // A process that is being started has a copy of the open file, and no fork handler knows of it.
+    const children::Signal end;
+    const auto pid = static_cast<pid_t>(syscall(SYS_clone, SIGCHLD, 0UL, 0UL, 0UL, 0UL));
+    if (pid == 0) {
+        end.Await();
+        syscall(SYS_exit_group, 0);
+    }
     EXPECT_EQ(YLIBCFileUnlockByFile(handle), 0);
     EXPECT_TRUE(IsFree());
+    EXPECT_TRUE(end.Give() && children::Ended(pid));
     for (int none : {handle, -1, STDERR_FILENO, 123456}) {
         EXPECT_LT(YLIBCFileUnlockByFile(none), 0);
         EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_INVALID_ARGUMENT));
@@ -213,6 +222,17 @@ TEST(FileLock, RootTakesItsNameBack) {
     EXPECT_EQ(fcntl(fd, F_OFD_SETLK, &lock), 0);
     EXPECT_TRUE(IsFree());
     close(fd);
+}
+
+TEST(FileLock, RootNeedsNoOtherFolderForALock) {
+    constexpr const char *kNames = "/etc/.zelo-shared-names.lock";
+    fs::remove(kNames);
+    fs::remove(kLock);
+    fs::create_directory(kNames);
+    YLIBCErrSetEx(0x1234, "before", 7);
+    EXPECT_TRUE(IsFree());
+    EXPECT_EQ(YLIBCErrGet(), 0x1234U) << "a success is no error";
+    fs::remove(kNames);
 }
 
 }  // namespace

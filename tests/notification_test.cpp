@@ -144,7 +144,8 @@ TEST_F(Notification, HooksRunInTheirOrderWhateverOneOfThemDoes) {
     EXPECT_EQ(FileLines(kHookOutput).size(), 2 * expected.size());
 
     chmod(kHooks, 0777);
-    Send("Tag");
+    EXPECT_LT(Send("Tag"), 0);
+    EXPECT_STREQ(YLIBCErrorGetFile(), "notification_journal");
     EXPECT_EQ(FileLines(kHookOutput).size(), 2 * expected.size())
         << "anybody could have put a hook there";
 }

@@ -276,7 +276,7 @@ std::string UserFiles::StoredPassword(const std::string &strName) const {
 bool CountRemaining(const PasswdFile &passwd, int &remaining) {
     int max = kDefaultMaxUsers;
     std::string strMax;
-    if (LookUpKey(kConfigFile, kMaxUsersKey, strMax) == LookUp::kFound) {
+    if (LookUpSetting(kMaxUsersKey, strMax)) {
         const char *const pEnd = strMax.data() + strMax.size();
         const auto parsed = std::from_chars(strMax.data(), pEnd, max);
         if (parsed.ec != std::errc() || parsed.ptr != pEnd) {

@@ -12,6 +12,7 @@
 #include <utility>
 
 #include "file_replacement.h"
+#include "held_mutex.h"
 #include "last_error.h"
 #include "waiting.h"
 
@@ -172,14 +173,16 @@ template class AccountFile<GroupShadowFormat>;
 
 namespace {
 
-// The C library's lock excludes processes; the threads of one process are kept apart here.
-std::mutex s_threads;
+// The C library's lock excludes processes; the threads of one process are kept apart here. A child
+// process could not take the C library's when another thread held it at the fork.
+std::mutex g_threads;
+const int g_forkHandlers = HoldAroundForks<g_threads>();
 
 }  // namespace
 
 AccountLock::AccountLock() {
     const Waiting waiting({"waiting for the lock '/etc/.pwd.lock'"});
-    s_threads.lock();
+    g_threads.lock();
     // lckpwdf limits its wait with the process's alarm, and would leave the caller without its own.
     struct itimerval callers = {};
     const struct itimerval none = {};
@@ -196,7 +199,7 @@ AccountLock::~AccountLock() {
     if (m_blHeld) {
         ulckpwdf();
     }
-    s_threads.unlock();
+    g_threads.unlock();
 }
 
 }  // namespace host

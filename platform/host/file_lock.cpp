@@ -55,6 +55,15 @@ void CloseInChild() {
 const int g_forkHandlers =
     pthread_atfork([] { g_mutex.lock(); }, [] { g_mutex.unlock(); }, CloseInChild);
 
+bool Set(int fd, off_t byte, short type) {
+    struct flock lock = {};
+    lock.l_type = type;
+    lock.l_whence = SEEK_SET;
+    lock.l_start = byte;
+    lock.l_len = 1;
+    return fcntl(fd, F_OFD_SETLK, &lock) == 0;
+}
+
 // A lock file, opened anew for each lock. What is not handed out as a handle is closed.
 class LockFile {
   public:
@@ -76,7 +85,8 @@ class LockFile {
     int Get() const { return m_fd; }
     int HandOut() { return std::exchange(m_fd, -1); }
 
-    // Closes the file, and so releases the lock. False when it is no lock file's descriptor.
+    // Releases the locks and closes the file. False when it is no lock file's descriptor. Closing
+    // alone would not let go while a process that is being started still has a copy.
     static bool Close(int fd) {
         const std::lock_guard<std::mutex> guard(g_mutex);
         const auto open = std::find(g_open->begin(), g_open->end(), fd);
@@ -84,6 +94,8 @@ class LockFile {
             return false;
         }
         g_open->erase(open);
+        static_cast<void>(Set(fd, kHead, F_UNLCK));
+        static_cast<void>(Set(fd, kLock, F_UNLCK));
         return close(fd) == 0;
     }
 
@@ -92,15 +104,6 @@ class LockFile {
 };
 
 enum class Try { kHeld, kHeldElsewhere, kRemoved, kUnsafe, kFailed };
-
-bool Set(int fd, off_t byte, short type) {
-    struct flock lock = {};
-    lock.l_type = type;
-    lock.l_whence = SEEK_SET;
-    lock.l_start = byte;
-    lock.l_len = 1;
-    return fcntl(fd, F_OFD_SETLK, &lock) == 0;
-}
 
 Try Await(int fd, off_t byte, Clock::time_point end) {
     std::chrono::microseconds wait = kFirstWait;
@@ -141,8 +144,11 @@ Try TakeLock(int fd, const char *szPath, Clock::time_point end) {
     if (fstat(fd, &status) != 0) {
         return Try::kFailed;
     }
+    if (status.st_nlink == 0) {
+        return Try::kRemoved;
+    }
     // What is refused is not waited for.
-    if (status.st_nlink > 0 && !host::IsOwnFile(status)) {
+    if (!host::IsOwnFile(status)) {
         return Try::kUnsafe;
     }
     const host::Waiting waiting({"waiting for the lock '", szPath, "'"});

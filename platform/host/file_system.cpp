@@ -31,15 +31,16 @@ bool SetOwnerAndMode(int fd, const Owner &owner, mode_t mode) {
     return fchmod(fd, mode) == 0;
 }
 
-// Whether it is a link that somebody else has put into a folder that everybody can write to: it may
-// lead into a folder of the caller's.
-bool IsForeignLink(int parent, const char *szName) {
+// Whether it is a link that may be followed. One that somebody else has put into a folder that
+// everybody can write to may lead into a folder of the caller's. What is no link now may be one of
+// theirs in the next moment.
+bool IsTrustedLink(int parent, const char *szName) {
     struct stat folder = {};
     struct stat entry = {};
     return fstatat(parent, szName, &entry, AT_SYMLINK_NOFOLLOW) == 0 && S_ISLNK(entry.st_mode) &&
-           (fstat(parent, &folder) != 0 ||
-            ((folder.st_mode & S_IWOTH) != 0 && entry.st_uid != geteuid() &&
-             entry.st_uid != folder.st_uid));
+           fstat(parent, &folder) == 0 &&
+           ((folder.st_mode & S_IWOTH) == 0 || entry.st_uid == geteuid() ||
+            entry.st_uid == folder.st_uid);
 }
 
 // Opens a directory in the parent, creating it when there is nothing of that name.
@@ -51,8 +52,9 @@ host::FileDescriptor OpenDirectory(int parent, const char *szName, const Owner &
     if (entry.IsOpen()) {
         return entry;
     }
-    if (errno == ENOTDIR && !IsForeignLink(parent, szName)) {
-        return host::FileDescriptor(openat(parent, szName, kLook));
+    if (errno == ENOTDIR) {
+        return host::FileDescriptor(IsTrustedLink(parent, szName) ? openat(parent, szName, kLook)
+                                                                  : -1);
     }
     if (errno != ENOENT) {
         return entry;

@@ -8,21 +8,28 @@
 #include <cerrno>
 #include <cstdint>
 #include <cstdio>
+#include <cstring>
 
 #include "../file_lock.h"
 #include "file_descriptor.h"
+#include "last_error.h"
 
 namespace host {
 namespace {
 
-// In a folder of root's, so that taking this lock never leads here again.
+// In a folder of root's, so that nobody else can hold it.
 constexpr const char *kNamesLock = "/etc/.zelo-shared-names.lock";
 
 // Held while root removes or creates a lock file in a shared folder: a process that has found
 // another user's file must not remove the one that root has made there since.
 class NamesLock {
   public:
-    NamesLock() { YLIBCFileLockByFile(kNamesLock, 0, &m_handle); }
+    NamesLock() {
+        const LastError before;
+        YLIBCFileLockByFile(kNamesLock, 0, &m_handle);
+        m_blHeldElsewhere = !IsHeld() && YLIBCErrGet() == YLIBC_ERR_BUSY;
+        before.Restore();
+    }
     NamesLock(const NamesLock &) = delete;
     NamesLock &operator=(const NamesLock &) = delete;
     ~NamesLock() {
@@ -32,9 +39,11 @@ class NamesLock {
     }
 
     bool IsHeld() const { return m_handle >= 0; }
+    bool IsHeldElsewhere() const { return m_blHeldElsewhere; }
 
   private:
     int m_handle = -1;
+    bool m_blHeldElsewhere = false;
 };
 
 bool IsRootInSharedFolder(const std::string &strPath) {
@@ -87,16 +96,21 @@ void RemoveForeignFile(const std::string &strPath) {
 }
 
 bool MayCreateLockFile(const char *szPath) {
-    if (!IsRootInSharedFolder(szPath)) {
+    // Taking the lock of the names does not lead to taking it, whoever may write to its folder.
+    if (std::strcmp(szPath, kNamesLock) == 0 || !IsRootInSharedFolder(szPath)) {
         return true;
     }
     RemoveForeignFile(szPath);
-    if (access(szPath, F_OK) != 0 && errno == ENOENT) {
-        const NamesLock lock;
-        const FileDescriptor file(
-            lock.IsHeld() ? open(szPath, O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0600) : -1);
+    if (access(szPath, F_OK) == 0 || errno != ENOENT) {
+        return false;
     }
-    return false;
+    const NamesLock lock;
+    if (!lock.IsHeld()) {
+        // Where nobody can hold it, nobody removes what is created meanwhile.
+        return !lock.IsHeldElsewhere();
+    }
+    const FileDescriptor file(open(szPath, O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0600));
+    return !file.IsOpen() && errno != EEXIST;
 }
 
 }  // namespace host

@@ -12,12 +12,14 @@
 namespace host {
 
 // As root, in a folder that everybody can write to: removes what another user has put at the path,
-// whatever it is and whatever locks are held on it. Does nothing otherwise.
+// whatever it is and whatever locks are held on it. Does nothing otherwise. The last error stays as
+// it was.
 void RemoveForeignFile(const std::string &strPath);
 
 // To be called before a lock file is opened. As root, in a folder that everybody can write to,
 // makes sure that a file of root's stands at the path (mode 0600), and returns false: opening it
-// must not create it. Returns true everywhere else.
+// must not create it. Returns true everywhere else, and where it could not make that file, so that
+// opening it does, or says why not. The last error stays as it was.
 bool MayCreateLockFile(const char *szPath);
 
 }  // namespace host

@@ -9,6 +9,7 @@
 #include <cstring>
 #include <limits>
 #include <memory>
+#include <new>
 #include <string_view>
 
 #include "connection_pool.h"
@@ -125,9 +126,16 @@ int ShowProgress(void *pContext, curl_off_t cbExpected, curl_off_t /*cbReceived*
 
 // --- Options ------------------------------------------------------------------------------------
 
+// Without memory for a text libcurl would do without it: with another proxy, or none.
+void SetText(CURL *pEasy, CURLoption option, const char *szText) {
+    if (curl_easy_setopt(pEasy, option, szText) != CURLE_OK) {
+        throw std::bad_alloc();
+    }
+}
+
 void SetTransport(CURL *pEasy) {
     curl_easy_setopt(pEasy, CURLOPT_NOSIGNAL, 1L);
-    curl_easy_setopt(pEasy, CURLOPT_PROTOCOLS_STR, "http,https");
+    SetText(pEasy, CURLOPT_PROTOCOLS_STR, "http,https");
     curl_easy_setopt(pEasy, CURLOPT_FOLLOWLOCATION, 0L);
     curl_easy_setopt(pEasy, CURLOPT_HTTP_VERSION, static_cast<long>(CURL_HTTP_VERSION_1_1));
     curl_easy_setopt(pEasy, CURLOPT_CONNECTTIMEOUT, kConnectTimeout_s);
@@ -149,20 +157,18 @@ bool SetWay(const Connection &connection, bool blRelay) {
     CURL *const pEasy = connection.pEasy.get();
     std::string strValue;
     if (blRelay) {
-        if (LookUpKey(kConfigFile, "farlink_relay", strValue) != LookUp::kFound ||
-            strValue.empty()) {
+        if (!LookUpSetting("farlink_relay", strValue) || strValue.empty()) {
             return false;
         }
-        curl_easy_setopt(pEasy, CURLOPT_PROXY, ("http://" + strValue).c_str());
-        curl_easy_setopt(pEasy, CURLOPT_NOPROXY, "");
+        SetText(pEasy, CURLOPT_PROXY, ("http://" + strValue).c_str());
+        SetText(pEasy, CURLOPT_NOPROXY, "");
         curl_easy_setopt(pEasy, CURLOPT_HTTPPROXYTUNNEL, 1L);
         return true;
     }
-    const bool blEnvironment =
-        connection.blNamesProxy &&
-        LookUpKey(kConfigFile, "use_proxy_environment", strValue) == LookUp::kFound &&
-        strValue == "yes";
-    curl_easy_setopt(pEasy, CURLOPT_PROXY, blEnvironment ? nullptr : "");
+    const bool blEnvironment = connection.blNamesProxy &&
+                               LookUpSetting("use_proxy_environment", strValue) &&
+                               strValue == "yes";
+    SetText(pEasy, CURLOPT_PROXY, blEnvironment ? nullptr : "");
     curl_easy_setopt(pEasy, CURLOPT_NOPROXY, nullptr);
     curl_easy_setopt(pEasy, CURLOPT_HTTPPROXYTUNNEL, 0L);
     return true;
@@ -193,7 +199,7 @@ bool BuildHeaders(const HttpRequest &request, HeaderList &headers) {
 }
 
 void SetRequest(CURL *pEasy, const HttpRequest &request, const curl_slist *pHeaders) {
-    curl_easy_setopt(pEasy, CURLOPT_URL, request.strUrl.c_str());
+    SetText(pEasy, CURLOPT_URL, request.strUrl.c_str());
     curl_easy_setopt(pEasy, CURLOPT_HTTPHEADER, pHeaders);
     const long wholeTimeout_s = request.pStream == nullptr ? kWholeTimeout_s : 0;
     // What libcurl refuses would leave no limit at all.
@@ -237,7 +243,7 @@ unsigned int LastErrorOf(int error) {
 
 void Warn(const HttpRequest &request, const std::string &strReason, int line) {
     // The query names nothing that helps, and it came from a caller.
-    const std::string strUrl = request.strUrl.substr(0, request.strUrl.find('?'));
+    const std::string strUrl = printable::Line(request.strUrl.substr(0, request.strUrl.find('?')));
     syslog(LOG_WARNING, "%s:%d %s%s: %s", kFile, line, strUrl.c_str(),
            request.blRelay ? " through the relay" : "", printable::Line(strReason).c_str());
 }
@@ -284,7 +290,8 @@ int Judge(Transfer &transfer, CURLcode result, long status, std::string &strReas
         if (result != CURLE_OK) {
             const char *szReason = transfer.connection.reason.data();
             strReason = szReason[0] != '\0' ? szReason : curl_easy_strerror(result);
-            return ZELO::CRED_REQ_ERR_NETWORK;
+            return result == CURLE_OUT_OF_MEMORY ? ZELO::CRED_REQ_ERR_MEMORY
+                                                 : ZELO::CRED_REQ_ERR_NETWORK;
         }
         if (!IsWhole(transfer)) {
             strReason = "the reply is cut";

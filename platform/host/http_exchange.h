@@ -44,7 +44,7 @@ struct HttpReply {
 // (with a stream: one of 2xx, and written whole). Otherwise returns another value of
 // CRED_REQ_ERROR, sets the last error and writes one log line with the URL and the reason; reply
 // then holds the status, and what came of the body into memory, as far as there was one. That the
-// caller's copy is current is worth no log line.
+// caller's copy is current is worth no log line. Throws std::bad_alloc.
 int Perform(const HttpRequest &request, HttpReply &reply);
 
 // Builds an URL; the host may be a name, an IPv4 or an IPv6 address, the query empty or

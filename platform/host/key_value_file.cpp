@@ -254,6 +254,13 @@ host::LookUp host::LookUpKey(const char *szPath, const char *szKey, std::string 
     return LookUp::kFound;
 }
 
+bool host::LookUpSetting(const char *szKey, std::string &strValue) {
+    const LastError before;
+    const bool blFound = LookUpKey(kConfigFile, szKey, strValue) == LookUp::kFound;
+    before.Restore();
+    return blFound;
+}
+
 int YLIBCFileGetKeyValue(const char *szPath, const char *szKey, char *szValue, int cbValue,
                          int /*flags*/) {
     if (szValue == nullptr || cbValue <= 0) {

@@ -3,7 +3,6 @@
 #ifndef ZELO_HOST_KEY_VALUE_LOOKUP_H
 #define ZELO_HOST_KEY_VALUE_LOOKUP_H
 
-#include <optional>
 #include <string>
 
 namespace host {
@@ -16,6 +15,10 @@ enum class LookUp { kFound, kAbsent, kUnreadable };
 // Looks the key up in the file; strValue is set, whole, when it is found. Only a file that cannot
 // be read sets the last error: a setting that is absent has its default.
 LookUp LookUpKey(const char *szPath, const char *szKey, std::string &strValue);
+
+// Looks up a setting of the host platform's that has a default. False where that serves: a file
+// that cannot be read is no failure of the caller's operation, and the last error stays as it was.
+bool LookUpSetting(const char *szKey, std::string &strValue);
 
 }  // namespace host
 

@@ -13,6 +13,18 @@ inline int Fail(unsigned int code, const char *szFile, int line) {
     return -1;
 }
 
+// The last error as it is now, for putting it back: what an operation looks at besides may fail
+// without the operation's failing.
+class LastError {
+  public:
+    void Restore() const { YLIBCErrSetEx(m_code, m_szFile, m_line); }
+
+  private:
+    unsigned int m_code = YLIBCErrGet();
+    const char *m_szFile = YLIBCErrorGetFile();
+    int m_line = YLIBCErrorGetLine();
+};
+
 }  // namespace host
 
 // Each source names itself with: constexpr const char *kFile = "…";

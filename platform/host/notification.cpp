@@ -21,25 +21,12 @@ constexpr const char *kSection = "notification";
 constexpr const char *kEnglish = "enu";
 constexpr int kMaxText = 4096;
 
-// A success leaves the last error as it was, also when a text had to be looked for in two places.
-class LastError {
-  public:
-    void Restore() const { YLIBCErrSetEx(m_code, m_szFile, m_line); }
-
-  private:
-    unsigned int m_code = YLIBCErrGet();
-    const char *m_szFile = YLIBCErrorGetFile();
-    int m_line = YLIBCErrorGetLine();
-};
-
 // A language names a folder, so it is a code and nothing else.
 std::string Language() {
     std::string strLanguage;
-    const bool blCode =
-        host::LookUpKey(host::kConfigFile, "language", strLanguage) == host::LookUp::kFound &&
-        strLanguage.size() == 3 && std::all_of(strLanguage.begin(), strLanguage.end(), [](char c) {
-            return c >= 'a' && c <= 'z';
-        });
+    const bool blCode = host::LookUpSetting("language", strLanguage) && strLanguage.size() == 3 &&
+                        std::all_of(strLanguage.begin(), strLanguage.end(),
+                                    [](char c) { return c >= 'a' && c <= 'z'; });
     return blCode ? strLanguage : kEnglish;
 }
 
@@ -102,14 +89,14 @@ int ZELOSysNotifySendNotifiction(const char *szTag, YLIBSZHASH **ppHash) {
         return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
     }
     try {
-        const LastError before;
+        // Texts may be looked for in two places, and what becomes of the hooks does not count.
+        const host::LastError before;
         const host::Notification notification =
             Compose(szTag, ppHash == nullptr ? nullptr : *ppHash);
         const int result = host::AppendToJournal(notification);
+        const host::LastError ofJournal;
         host::RunHooks(notification);
-        if (result == 0) {
-            before.Restore();
-        }
+        (result == 0 ? before : ofJournal).Restore();
         return result;
     } catch (const std::exception &) {
         return HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);

@@ -2,13 +2,17 @@
 
 #include "notification_hooks.h"
 
+#include <syslog.h>
+
 #include <chrono>
 #include <cstring>
+#include <new>
 
 #include "program_folder.h"
 
 namespace {
 
+constexpr const char *kFile = "notification_hooks";
 constexpr const char *kFolder = "/usr/zelo/etc/notify.d";
 constexpr std::chrono::seconds kLimit(10);
 
@@ -41,8 +45,13 @@ std::vector<std::string> Environment(const host::Notification &notification) {
 }  // namespace
 
 void host::RunHooks(const Notification &notification) {
-    ProgramEnd first;
-    static_cast<void>(RunProgramFolder(
-        kFolder, {"notification hook", notification.strTag, Environment(notification), kLimit},
-        first));
+    try {
+        ProgramEnd first;
+        static_cast<void>(RunProgramFolder(
+            kFolder, {"notification hook", notification.strTag, Environment(notification), kLimit},
+            first));
+    } catch (const std::bad_alloc &) {
+        syslog(LOG_ERR, "%s:%d out of memory: not all notification hooks were run", kFile,
+               __LINE__);
+    }
 }

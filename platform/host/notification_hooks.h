@@ -13,8 +13,8 @@ namespace host {
 //     ZELO_NOTIFY_TAG, ZELO_NOTIFY_TITLE, ZELO_NOTIFY_TEXT
 //     ZELO_NOTIFY_VAR_QRM_SERVER: the value of "%QRM_SERVER%", and so on for each variable.
 // A hook is a regular file that may be executed and that nobody but root, or the user that this
-// process runs as, can change. A hook that fails, or that is not run because somebody else could
-// change it, is worth one log line and does not keep the others from running.
+// process runs as, can change. A hook that fails, or a file that is none, is worth one log line and
+// does not keep the others from running. Throws nothing.
 void RunHooks(const Notification &notification);
 
 }  // namespace host

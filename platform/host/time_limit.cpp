@@ -5,26 +5,10 @@
 #include <system_error>
 
 #include "key_value_lookup.h"
-#include "last_error.h"
-
-namespace {
-
-// A key that is not there is no failure of the caller's operation.
-bool FindSetting(const char *szKey, std::string &strValue) {
-    const unsigned int code = YLIBCErrGet();
-    const char *const szErrorFile = YLIBCErrorGetFile();
-    const int line = YLIBCErrorGetLine();
-    const bool blFound =
-        host::LookUpKey(host::kConfigFile, szKey, strValue) == host::LookUp::kFound;
-    YLIBCErrSetEx(code, szErrorFile, line);
-    return blFound;
-}
-
-}  // namespace
 
 std::chrono::seconds host::TimeLimit(const char *szKey, std::chrono::seconds standard) {
     std::string strLimit;
-    if (!FindSetting(szKey, strLimit)) {
+    if (!LookUpSetting(szKey, strLimit)) {
         return standard;
     }
     int limit_s = 0;
