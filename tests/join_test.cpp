@@ -209,29 +209,28 @@ TEST_F(Join, DescribesTheApplianceByItsFactsOverOneConnection) {
         R"("nvo_version":"NVO 6.2-123 Update 4","http_port":5000,"https_port":5001})",
         usual));
     usual["access_token"] = kToken;
-    // szVersion: "" keeps the usual one
-    // szJoinInfo: members added to the caller's
-    // szExpected: what differs from the usual description; "" when join fails
-    const std::tuple<const char *, const char *, const char *, const char *, const char *> rows[] =
-        {
-            {"the usual ones", "", "", "{}", "{}"},
-            {"no small fix", "majorversion=7\nminorversion=0\nbuildnumber=9x", "", "{}",
-             R"({"nvo_version":"NVO 7.0-9x","build_number":9})"},
-            {"small fix 0", "majorversion=7\nminorversion=0\nbuildnumber=9\nsmallfixnumber=0", "",
-             "{}", R"({"nvo_version":"NVO 7.0-9","build_number":9})"},
-            {"small fix 00", "majorversion=7\nminorversion=0\nbuildnumber=9\nsmallfixnumber=00", "",
-             "{}", R"({"nvo_version":"NVO 7.0-9 Update 00","build_number":9})"},
-            {"no build", "majorversion=7\nminorversion=0", "", "{}", ""},
-            {"no minor version", "majorversion=7\nbuildnumber=9", "", "{}", ""},
-            {"ports that are no numbers", "", "admin_port=80x\nsecure_admin_port=x\nrunHTTPS=yes",
-             "{}", R"({"http_port":80,"https_port":0})"},
-            {"https not served", "", "admin_port=80\nrunHTTPS=no", "{}",
-             R"({"http_port":80,"https_port":0})"},
-            {"https served without a port", "", "admin_port=80\nrunHTTPS=yes", "{}", ""},
-            {"the caller's values go as they are", "", "#",
-             R"({"http_port":"1","https_port":[2],"host":null,"id":"I","sn":"S2"})",
-             R"({"http_port":"1","https_port":[2],"host":null,"id":"I","sn":"S2"})"},
-        };
+    // The version file and the configuration ("" keeps the usual one), the members added to the
+    // caller's, and what differs from the usual description ("" when join fails).
+    using Row = std::tuple<const char *, const char *, const char *, const char *, const char *>;
+    const Row rows[] = {
+        {"the usual ones", "", "", "{}", "{}"},
+        {"no small fix", "majorversion=7\nminorversion=0\nbuildnumber=9x", "", "{}",
+         R"({"nvo_version":"NVO 7.0-9x","build_number":9})"},
+        {"small fix 0", "majorversion=7\nminorversion=0\nbuildnumber=9\nsmallfixnumber=0", "", "{}",
+         R"({"nvo_version":"NVO 7.0-9","build_number":9})"},
+        {"small fix 00", "majorversion=7\nminorversion=0\nbuildnumber=9\nsmallfixnumber=00", "",
+         "{}", R"({"nvo_version":"NVO 7.0-9 Update 00","build_number":9})"},
+        {"no build", "majorversion=7\nminorversion=0", "", "{}", ""},
+        {"no minor version", "majorversion=7\nbuildnumber=9", "", "{}", ""},
+        {"ports that are no numbers", "", "admin_port=80x\nsecure_admin_port=x\nrunHTTPS=yes", "{}",
+         R"({"http_port":80,"https_port":0})"},
+        {"https not served", "", "admin_port=80\nrunHTTPS=no", "{}",
+         R"({"http_port":80,"https_port":0})"},
+        {"https served without a port", "", "admin_port=80\nrunHTTPS=yes", "{}", ""},
+        {"the caller's values go as they are", "", "#",
+         R"({"http_port":"1","https_port":[2],"host":null,"id":"I","sn":"S2"})",
+         R"({"http_port":"1","https_port":[2],"host":null,"id":"I","sn":"S2"})"},
+    };
     for (const auto &[szFact, szVersion, szConfig, szJoinInfo, szExpected] : rows) {
         SCOPED_TRACE(szFact);
         SetUp();
@@ -274,7 +273,7 @@ TEST_F(Join, DescribesTheApplianceByItsFactsOverOneConnection) {
 
 TEST_F(Join, RefusedRepliesAreLoggedWithoutTheToken) {
     const std::string strDeep = std::string(2000, '[') + std::string(2000, ']');
-    // szLogged: nullptr: accepted
+    // What is logged; null where the reply is accepted.
     const std::pair<std::string, const char *> rows[] = {
         {R"({"success":true})", nullptr},
         {R"({"success":1})", nullptr},

@@ -184,7 +184,7 @@ TEST_F(KeyValueFile, WhatTheFormatCannotHoldIsRefused) {
 
 TEST_F(KeyValueFile, AChangeLeavesAllOtherLinesAndTheModeAsTheyWere) {
     const std::string strOdd = "# k=1\r\n\n junk \0 = \xff\nk\0=z\n b = 2 \r\n"s;
-    // szValue: null: the key is removed
+    // A null value removes the key.
     const std::tuple<std::string, const char *, std::string> rows[] = {
         {"", "v", "k=\"v\"\n"},
         {"a=1", "v", "a=1\nk=\"v\"\n"},

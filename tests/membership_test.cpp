@@ -590,7 +590,7 @@ TEST_F(Membership, SettingsOfAnyKindKeepTheirOtherMembers) {
     const std::string strOnly = '{' + strInstance + '{' + switches(true) + "}}\n";
     const std::string strBig = "\"big\":\"" + std::string(5'000'000, 'x') + '"';
     const std::string strList = "{\"z\":[0" + Repeated(",0", 200'000) + "]}";
-    // strBefore: "-": there is none
+    // "-" stands for no file.
     const std::tuple<std::string, bool, std::string> rows[] = {
         {"-", false, strOnly},
         {"", false, strOnly},

@@ -69,7 +69,7 @@ TEST_F(PluginSdk, RunsProgramsInTheOrderOfTheirNamesWithTheArguments) {
 }
 
 TEST_F(PluginSdk, AllProgramsRunAndTheFirstFailureIsTheResult) {
-    // szSettings: time enough for the other two
+    // The settings leave time enough for the other two.
     const std::tuple<const char *, int, unsigned int, const char *> rows[] = {
         {"exit 3", -3, YLIBC_ERR_EXEC_STATUS, ""},
         {"kill -KILL $$", -137, YLIBC_ERR_EXEC_STATUS, ""},

@@ -224,7 +224,7 @@ TEST_F(Deadline, EndsThoughNobodyReadsItsOutputAndNeverContradictsIt) {
     constexpr std::size_t kPage = 4096;
     const std::string strLong(2 * kPage, 'k');
     ASSERT_EQ(run_program::Run({QRMCTL, "info", "set", "key", "value"}).status, 0);
-    // blJson: whether the deadline is the JSON object
+    // At last, whether the JSON object tells of the deadline.
     const std::tuple<char, std::size_t, std::string, bool> rows[] = {
         {'2', 0, "none", true}, {'2', kPage, strLong, true}, {'1', 0, "key", false}};
     for (const auto &[fd, cbFree, strKey, blJson] : rows) {

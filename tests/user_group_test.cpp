@@ -157,7 +157,7 @@ TEST_F(UserGroup, OnlyMembersAreAdministrators) {
 }
 
 TEST_F(UserGroup, OnlyTheDifferenceToWhatWasReadIsWritten) {
-    // now: what others have made of {a, b, c} since it was read
+    // First, what others have made of {a, b, c} since it was read.
     const std::tuple<Names, Names, Names> rows[] = {
         {{"a", "b", "c"}, {"c", "x", "a"}, {"c", "x", "a"}},
         {{"a", "b", "c", "new"}, {"a", "b", "c", "x"}, {"a", "b", "c", "new", "x"}},
