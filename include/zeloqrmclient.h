@@ -221,8 +221,8 @@ ZELOQRM_API int ZELOQRMClientSendWebapi(Json::Value &resp, const std::string &ap
 //
 // path: the destination. Its directory is created as needed (mode 0755); a path without one stands
 // in the current directory. A slash or a backslash ends the directory. Links are followed, except
-// for those in a directory that everybody can write to which belong neither to the caller nor to the
-// directory's owner: one on the way is a failure, and the file that it leads to stays as it is.
+// for those in a directory that everybody can write to which belong neither to the caller nor to
+// the directory's owner: one on the way is a failure, and the file that it leads to stays as it is.
 // api, ver, method: the method.
 // params: its parameters, an object or null. When there is a file at the path, its MD5 digest is
 // added as "md5", 32 digits, and stays there afterwards: a null becomes an object.
@@ -423,8 +423,8 @@ ZELOQRM_API bool ZELOQRMClientCreateServerUser(void);
 // "/usr/zelo/etc/QRM/" with all that is in it.
 //
 // Returns true on success, and at once when there is no such account (the directory is then left
-// alone); false with a log line otherwise, also when the accounts cannot be read. The lock is waited
-// for, 30 s at most.
+// alone); false with a log line otherwise, also when the accounts cannot be read. The lock is
+// waited for, 30 s at most.
 //
 // Files: the platform's account files; "/tmp/userlock"; "/usr/zelo/etc/QRM/".
 ZELOQRM_API bool ZELOQRMClientDeleteServerUser(void);
@@ -441,9 +441,9 @@ ZELOQRM_API bool ZELOQRMClientDeleteServerUser(void);
 //
 // Returns true when the file has been replaced; false with a log line, and the file as it was,
 // otherwise. A reader sees the old file or the new one. Calls for one user take turns, for 10 s at
-// most, in which they hold the file "usersettings.tmp" beside the settings: no call undoes another's
-// change. That file stays only where it cannot take the settings' place, and keeps no later call
-// waiting.
+// most, in which they hold the file "usersettings.tmp" beside the settings: no call undoes
+// another's change. That file stays only where it cannot take the settings' place, and keeps no
+// later call waiting.
 ZELOQRM_API bool ZELOQRMUserWelcomPage(const char *szUser, bool blShow);
 
 // ------------------------------------------------------------------------------------------------

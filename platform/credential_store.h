@@ -104,8 +104,8 @@ ZELO_PLATFORM_API int ZELOCredListGet(ZELO_CRED **ppList, ZELO_CRED_KEEP pfnKeep
 ZELO_PLATFORM_API void ZELOCredListFree(ZELO_CRED **ppList);
 
 // The id of the record with this application, of several the lowest: the one that ZELOCredListGet
-// lists first. Negative when there is none (YLIBC_ERR_NOT_FOUND, and no other last error says so) or
-// the store cannot be read.
+// lists first. Negative when there is none (YLIBC_ERR_NOT_FOUND, and no other last error says so)
+// or the store cannot be read.
 ZELO_PLATFORM_API long ZELOCredIDGetByApplication(const char *szApplication);
 
 // Removes the record with this id, durably. One that is not there counts as removed.

@@ -2,30 +2,19 @@
 
 #include <gtest/gtest.h>
 #include <sched.h>
-#include <sys/wait.h>
-#include <unistd.h>
 
-#include <cstring>
-#include <filesystem>
-#include <fstream>
-
+#include "children.h"
+#include "files.h"
 #include "host_name.h"
 #include "qrm_client_description.h"
 #include "serial_number.h"
 
 namespace {
 
-void Write(const char *szPath, const std::string &strText) {
-    std::ofstream(szPath) << strText;
-}
+using namespace files;
 
 TEST(SerialNumber, TheCustomOneComesFirst) {
-    const struct {
-        const char *szCustom;
-        const char *szFlash;
-        bool blRead;
-        const char *szSerial;
-    } rows[] = {
+    const std::tuple<const char *, const char *, bool, const char *> rows[] = {
         {"", "FLASH", true, "FLASH"},
         {"CUSTOM", "FLASH", true, "CUSTOM"},
         {"CUSTOM", "", true, "CUSTOM"},
@@ -34,20 +23,20 @@ TEST(SerialNumber, TheCustomOneComesFirst) {
         {"", "0123456789012345678901234567890123456789", true,
          "01234567890123456789012345678901234"},
     };
-    for (const auto &row : rows) {
-        Write("/etc/custom_serial_number", row.szCustom);
-        Write("/etc.defaults/serial_number", std::string(row.szFlash) + "\n");
+    for (const auto &[szCustom, szFlash, blRead, szSerial] : rows) {
+        WriteFile("/etc/custom_serial_number", szCustom);
+        WriteFile("/etc.defaults/serial_number", std::string(szFlash) + "\n");
         std::string strSerial = "before";
-        EXPECT_EQ(client_description::ReadSerialNumber(strSerial), row.blRead);
-        EXPECT_EQ(strSerial, row.szSerial);
+        EXPECT_EQ(client_description::ReadSerialNumber(strSerial), blRead);
+        EXPECT_EQ(strSerial, szSerial);
     }
     // What cannot be read is not the empty number.
     char sz[] = "before";
-    std::filesystem::remove("/etc/custom_serial_number");
-    std::filesystem::create_directory("/etc/custom_serial_number");
+    fs::remove("/etc/custom_serial_number");
+    fs::create_directory("/etc/custom_serial_number");
     EXPECT_LT(YLIBGetCustomSerialNumber(sz, sizeof(sz)), 0);
     EXPECT_STREQ(sz, "before");
-    std::filesystem::remove("/etc/custom_serial_number");
+    fs::remove("/etc/custom_serial_number");
 }
 
 TEST(HostName, IsCutToItsBuffer) {

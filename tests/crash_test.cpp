@@ -1,8 +1,6 @@
 // qrmctl join and leave, killed before every platform call in turn: whatever is left behind, one
 // leave clears it away.
 
-#include <cstdlib>
-#include <filesystem>
 #include <iostream>
 
 #include "commands.h"
@@ -12,6 +10,7 @@
 
 namespace {
 
+using namespace files;
 using Arguments = std::vector<std::string>;
 
 constexpr int kKilled = -SIGKILL;
@@ -75,11 +74,10 @@ class Crash : public joined::Joined {
         strAll += ZELOQRMClientStatus() == 0 ? "" : " status";
         for (const char *szPath : {membership::kPreference, "/var/services/homes/ZelonixQRM",
                                    "/var/run/zelocache.pid"}) {
-            strAll += std::filesystem::exists(szPath) ? ' ' + std::string(szPath) : "";
+            strAll += fs::exists(szPath) ? ' ' + std::string(szPath) : "";
         }
         for (long id = 0; id < 10; ++id) {
-            const std::unique_ptr<ZELO_CRED_SESS, void (*)(ZELO_CRED_SESS *)> pSess(
-                ZELOCredSessAlloc(), ZELOCredSessFree);
+            const stored::Session pSess(ZELOCredSessAlloc(), ZELOCredSessFree);
             strAll += ZELOCredSessLoad(id, pSess.get()) < 0 ? "" : " session";
         }
         return strAll;
@@ -89,17 +87,11 @@ class Crash : public joined::Joined {
 };
 
 TEST_F(Crash, OneLeaveClearsAwayAJoinThatWasKilledAnywhere) {
-    const Arguments join = {"join",
-                            "--server",
-                            "localhost",
-                            "--http-port",
-                            "0",
-                            "--https-port",
-                            std::to_string(s_pServer->HttpsPort()),
-                            "--token-file",
-                            kTokenFile};
+    const std::string strPort = std::to_string(s_pServer->HttpsPort());
+    const Arguments join = {"join",         "--server", "localhost",    "--http-port", "0",
+                            "--https-port", strPort,    "--token-file", kTokenFile};
     // With a store of its own each time, the ids of what is left over stay within those looked at.
-    const int calls = KillAtEveryCall(join, [] { std::filesystem::remove_all(stored::kFolder); });
+    const int calls = KillAtEveryCall(join, [] { fs::remove_all(stored::kFolder); });
     EXPECT_EQ(membership::Remains(), membership::kJoined);
     EXPECT_EQ(ZELOQRMClientStatus(), 1);
     EXPECT_GT(calls, 100);
@@ -127,13 +119,13 @@ TEST_F(Crash, OneLeaveClearsAwayWhatTheStatusDoesNotLookAt) {
     EXPECT_EQ(Run({"leave"}), 0);
     EXPECT_EQ(Left(), "");
 
-    const std::string strConfig = joined::FileText(membership::kConfig);
-    std::filesystem::remove(membership::kConfig);
+    const std::string strConfig = FileText(kConfig);
+    fs::remove(kConfig);
     stored::AddCredential("ZELO.QRM", "h");
     EXPECT_EQ(ZELOQRMClientStatus(), 0) << "nothing disagrees with a flag that cannot be read";
     EXPECT_EQ(Run({"leave"}), 0);
     EXPECT_EQ(Left(), "");
-    std::ofstream(membership::kConfig) << strConfig;
+    std::ofstream(kConfig) << strConfig;
 }
 
 }  // namespace

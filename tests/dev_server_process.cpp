@@ -38,28 +38,23 @@ void DevServerProcess::Serve(int fd) const {
     }
 }
 
-bool DevServerProcess::Start(std::string &strReason) {
+void DevServerProcess::Start() {
     int fds[2] = {-1, -1};
-    if (pipe2(fds, O_CLOEXEC) != 0 || (m_pid = fork()) < 0) {
-        strReason = "no process for the development server";
-        return false;
-    }
+    ASSERT_TRUE(pipe2(fds, O_CLOEXEC) == 0 && (m_pid = fork()) >= 0);
     if (m_pid == 0) {
         close(fds[0]);
         Serve(fds[1]);
     }
     close(fds[1]);
     bool blStarted = false;
-    std::string strText;
     char sz[4096];
     ssize_t cb = read(fds[0], &blStarted, sizeof(blStarted));
     cb = read(fds[0], &m_ports, sizeof(m_ports));
     while ((cb = read(fds[0], sz, sizeof(sz))) > 0) {
-        strText.append(sz, static_cast<std::size_t>(cb));
+        m_strCaPem.append(sz, static_cast<std::size_t>(cb));
     }
     close(fds[0]);
-    (blStarted ? m_strCaPem : strReason) = strText;
-    return blStarted;
+    ASSERT_TRUE(blStarted) << m_strCaPem;
 }
 
 Json::Value DevServerProcess::Ask(const std::string &strMethod, const std::string &strPath,
@@ -93,18 +88,15 @@ void DevServerProcess::AnswerNext(const std::string &strApi,
     for (const auto &[strName, strValue] : answer.headers) {
         next["headers"][strName] = strValue;
     }
-    if (answer.status) {
-        next["status"] = *answer.status;
-    }
-    if (answer.body) {
-        next["body"] = *answer.body;
-    }
-    if (answer.error_code) {
-        next["error_code"] = *answer.error_code;
-    }
-    if (answer.cut_after) {
-        next["cut_after"] = static_cast<Json::UInt64>(*answer.cut_after);
-    }
+    const auto set = [&next](const char *szName, const auto &value) {
+        if (value) {
+            next[szName] = *value;
+        }
+    };
+    set("status", answer.status);
+    set("body", answer.body);
+    set("error_code", answer.error_code);
+    set("cut_after", answer.cut_after);
     Json::StreamWriterBuilder builder;
     builder["emitUTF8"] = true;  // a body may be no text at all
     Ask("POST", "/dev/next", Json::writeString(builder, next));

@@ -21,7 +21,7 @@ class DevServerProcess {
     DevServerProcess(const DevServerProcess &) = delete;
     DevServerProcess &operator=(const DevServerProcess &) = delete;
 
-    bool Start(std::string &strReason);
+    void Start();
     int HttpPort() const { return m_ports.http; }
     int HttpsPort() const { return m_ports.https; }
     const std::string &CaPem() const { return m_strCaPem; }

@@ -4,43 +4,30 @@
 
 #include <gtest/gtest.h>
 
-#include <filesystem>
-#include <fstream>
-
-#include "last_error.h"
+#include "failures.h"
+#include "files.h"
 
 namespace {
 
-namespace fs = std::filesystem;
-
-mode_t Mode(const std::string &strPath) {
-    struct stat status = {};
-    return lstat(strPath.c_str(), &status) == 0 ? status.st_mode & 07777U : 0;
-}
+using namespace files;
 
 TEST(FileSystem, StatusIsTheLinksOwnWhenAskedFor) {
     std::ofstream("/tmp/file") << "12345";
     fs::create_symlink("/tmp/file", "/tmp/link");
     fs::create_symlink("/tmp/none", "/tmp/dangling");
-    const struct {
-        const char *szPath;
-        int blNoFollow;
-        int result;
-        mode_t type;
-    } rows[] = {
+    const std::tuple<const char *, int, int, mode_t> rows[] = {
         {"/tmp/file", 0, 0, S_IFREG},  {"/tmp/file", 1, 0, S_IFREG},
         {"/tmp/link", 0, 0, S_IFREG},  {"/tmp/link", 1, 0, S_IFLNK},
         {"/tmp/dangling", 0, -1, 0},   {"/tmp/dangling", 1, 0, S_IFLNK},
         {"/tmp/file/below", 1, -1, 0},
     };
-    for (const auto &row : rows) {
+    for (const auto &[szPath, blNoFollow, result, type] : rows) {
         struct stat status = {};
-        EXPECT_EQ(YLIBCFileStat(row.szPath, row.blNoFollow, &status), row.result) << row.szPath;
-        EXPECT_EQ(status.st_mode & S_IFMT, row.type);
+        EXPECT_EQ(YLIBCFileStat(szPath, blNoFollow, &status), result) << szPath;
+        EXPECT_EQ(status.st_mode & S_IFMT, type);
     }
     EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_NOT_FOUND));
-    EXPECT_LT(YLIBCFileStat(nullptr, 0, nullptr), 0);
-    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_INVALID_ARGUMENT));
+    EXPECT_EQ(FailureOf(YLIBCFileStat(nullptr, 0, nullptr)), YLIBC_ERR_INVALID_ARGUMENT);
 }
 
 TEST(FileSystem, DirectoriesComeWithTheirParentsAndLeaveOthersAlone) {
@@ -60,7 +47,7 @@ TEST(FileSystem, DirectoriesComeWithTheirParentsAndLeaveOthersAlone) {
         {"/tmp/there/other", 02751}, {"/tmp/there/relative", 0711},
     };
     for (const auto &row : rows) {
-        EXPECT_EQ(Mode(row.first), row.second) << row.first;
+        EXPECT_EQ(FileMode(row.first), row.second) << row.first;
     }
 }
 
@@ -68,13 +55,11 @@ TEST(FileSystem, WhatIsNoDirectoryStaysInTheWay) {
     std::ofstream("/tmp/way") << "file";
     fs::create_symlink("/tmp/nowhere", "/tmp/lost");
     for (const char *szPath : {"/tmp/way", "/tmp/way/below", "/tmp/lost", "/tmp/lost/below"}) {
-        EXPECT_LT(ZELOFSMkdirP(szPath, 0, 0, 0, 0, 0755), 0) << szPath;
-        EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_FILE));
+        EXPECT_EQ(FailureOf(ZELOFSMkdirP(szPath, 0, 0, 0, 0, 0755)), YLIBC_ERR_FILE) << szPath;
     }
     EXPECT_FALSE(fs::exists("/tmp/nowhere"));
     EXPECT_LT(ZELOFSMkdirP("", 0, 0, 0, 0, 0755), 0);
-    EXPECT_LT(ZELOFSMkdirP(nullptr, 0, 0, 0, 0, 0755), 0);
-    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_INVALID_ARGUMENT));
+    EXPECT_EQ(FailureOf(ZELOFSMkdirP(nullptr, 0, 0, 0, 0, 0755)), YLIBC_ERR_INVALID_ARGUMENT);
 }
 
 }  // namespace

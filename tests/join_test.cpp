@@ -12,13 +12,12 @@
 
 namespace {
 
-using files::WriteFile;
+using namespace files;
 using joined::Messages;
 using torture::Expected;
 
 constexpr const char *kFile = "qrm_send_createclient";
 constexpr const char *kApi = "ZELO.QRM.RPC";
-constexpr const char *kConfig = "/etc/zeloinfo.conf";
 constexpr const char *kDefaults = "/etc.defaults/zeloinfo.conf";
 constexpr const char *kVersion = "/etc.defaults/VERSION";
 constexpr const char *kToken = "se/cr\"et-0123456789";
@@ -72,11 +71,7 @@ TEST_F(Join, TheFirstAnsweringConnectionWins) {
     };
     const std::string strHttps = "https " + std::to_string(https);
     const std::string strHttp = "http " + std::to_string(http);
-    const struct {
-        const char *szFact;
-        std::vector<Json::Value> candidates;
-        std::string strWinner;
-    } rows[] = {
+    const std::tuple<const char *, std::vector<Json::Value>, std::string> rows[] = {
         {"secure before plain", {Candidate(http, https)}, strHttps},
         {"plain when the secure port is 0", {Candidate(http, 0)}, strHttp},
         {"plain when the secure attempt fails", {Candidate(http, http)}, strHttp},
@@ -93,21 +88,23 @@ TEST_F(Join, TheFirstAnsweringConnectionWins) {
          ""},
         {"the good one behind bad ones", {with("host", 5), Candidate(0, https)}, strHttps},
     };
-    for (const auto &row : rows) {
-        SCOPED_TRACE(row.szFact);
+    for (const auto &[szFact, candidates, strWinner] : rows) {
+        SCOPED_TRACE(szFact);
         Json::Value list(Json::arrayValue);
-        for (const Json::Value &candidate : row.candidates) {
+        for (const Json::Value &candidate : candidates) {
             list.append(candidate);
         }
         Json::Value out;
         out["own"] = 1;
-        const seam::Outcome outcome = seam::Observe(
-            [&] { EXPECT_EQ(ZELOQRMClientTestConnect(list, kApi, out), !row.strWinner.empty()); });
+        bool blFound = false;
+        const seam::Outcome outcome =
+            seam::Observe([&] { blFound = ZELOQRMClientTestConnect(list, kApi, out); });
+        EXPECT_EQ(blFound, !strWinner.empty());
         EXPECT_TRUE(outcome.logs.empty());
         EXPECT_EQ(outcome.recordsLeft, 0);
-        EXPECT_EQ(out.size(), row.strWinner.empty() ? 1U : 4U);
-        if (!row.strWinner.empty()) {
-            EXPECT_EQ(out["protocol"].asString() + ' ' + out["port"].asString(), row.strWinner);
+        EXPECT_EQ(out.size(), blFound ? 4U : 1U);
+        if (blFound) {
+            EXPECT_EQ(out["protocol"].asString() + ' ' + out["port"].asString(), strWinner);
             EXPECT_EQ(out["host"], "localhost");
         }
     }
@@ -124,29 +121,23 @@ TEST_F(Join, TheFirstAnsweringConnectionWins) {
     EXPECT_FALSE(ZELOQRMClientTestConnect(list, "", out));
     EXPECT_FALSE(ZELOQRMClientTestConnect(list, "ZELO.Unknown", out));
     EXPECT_TRUE(out.isNull());
-    // Any result of a setter but 0 ends the attempt; two of them end both.
-    seam::Observe({"ZELOCredItemSetHost", 1, true, 1},
-                  [&] { EXPECT_TRUE(ZELOQRMClientTestConnect(list, kApi, out)); });
-    EXPECT_EQ(out["protocol"], "http");
-}
-
-TEST_F(Join, ConnectionTestSurvivesEveryFailingCall) {
-    const Expected fallback{"http", "", ""};
-    torture::Run({"test connection",
-                  kFile,
-                  stored::Clear,
-                  [&] {
-                      Json::Value list(Json::arrayValue);
-                      list.append(Candidate(s_pServer->HttpPort(), s_pServer->HttpsPort()));
-                      Json::Value out;
-                      return ZELOQRMClientTestConnect(list, kApi, out) ? out["protocol"].asString()
-                                                                       : "false";
-                  },
-                  [] { return stored::Describe(); },
-                  {"https", "", ""},
-                  {{"ZELOCredAlloc IsPort IsPort", {"false", "", ""}},
-                   {"ZELOCredItemSetProtocol ZELOCredItemSetHost ZELOCredItemSetPort GetWebAPIPath",
-                    fallback}}});
+    // Any result of a setter but 0 ends the attempt.
+    const std::pair<const char *, bool> faults[] = {{"ZELOCredItemSetHost", true},
+                                                    {"ZELOCredItemSetProtocol", false},
+                                                    {"ZELOCredItemSetHost", false},
+                                                    {"ZELOCredItemSetPort", false},
+                                                    {"GetWebAPIPath", false}};
+    for (const auto &[szOperation, blForced] : faults) {
+        const seam::Outcome outcome = seam::Observe({szOperation, 1, blForced, 1}, [&] {
+            EXPECT_TRUE(ZELOQRMClientTestConnect(list, kApi, out));
+        });
+        EXPECT_EQ(out["protocol"], "http");
+        EXPECT_TRUE(outcome.logs.empty() && outcome.recordsLeft == 0);
+    }
+    for (const char *szOperation : {"ZELOCredAlloc", "IsPort"}) {
+        seam::Observe({szOperation},
+                      [&] { EXPECT_FALSE(ZELOQRMClientTestConnect(list, kApi, out)); });
+    }
 }
 
 TEST_F(Join, ShortMemoryLeavesTheWholeConnectionOrNothing) {
@@ -218,13 +209,10 @@ TEST_F(Join, DescribesTheApplianceByItsFactsOverOneConnection) {
         R"("nvo_version":"NVO 6.2-123 Update 4","http_port":5000,"https_port":5001})",
         usual));
     usual["access_token"] = kToken;
-    const struct {
-        const char *szFact;
-        const char *szVersion;  // "" keeps the usual one
-        const char *szConfig;
-        const char *szJoinInfo;  // members added to the caller's
-        const char *szExpected;  // what differs from the usual description; "" when join fails
-    } rows[] = {
+    // The version file and the configuration ("" keeps the usual one), the members added to the
+    // caller's, and what differs from the usual description ("" when join fails).
+    using Row = std::tuple<const char *, const char *, const char *, const char *, const char *>;
+    const Row rows[] = {
         {"the usual ones", "", "", "{}", "{}"},
         {"no small fix", "majorversion=7\nminorversion=0\nbuildnumber=9x", "", "{}",
          R"({"nvo_version":"NVO 7.0-9x","build_number":9})"},
@@ -243,23 +231,23 @@ TEST_F(Join, DescribesTheApplianceByItsFactsOverOneConnection) {
          R"({"http_port":"1","https_port":[2],"host":null,"id":"I","sn":"S2"})",
          R"({"http_port":"1","https_port":[2],"host":null,"id":"I","sn":"S2"})"},
     };
-    for (const auto &row : rows) {
-        SCOPED_TRACE(row.szFact);
+    for (const auto &[szFact, szVersion, szConfig, szJoinInfo, szExpected] : rows) {
+        SCOPED_TRACE(szFact);
         SetUp();
-        if (row.szVersion[0] != '\0') {
-            WriteFile(kVersion, row.szVersion);
+        if (szVersion[0] != '\0') {
+            WriteFile(kVersion, szVersion);
         }
-        if (row.szConfig[0] != '\0') {
-            WriteFile(kConfig, row.szConfig);
+        if (szConfig[0] != '\0') {
+            WriteFile(kConfig, szConfig);
         }
         Json::Value info = JoinInfo();
         Json::Value added;
-        ASSERT_TRUE(json_text::FromString(row.szJoinInfo, added));
+        ASSERT_TRUE(json_text::FromString(szJoinInfo, added));
         for (const std::string &strName : added.getMemberNames()) {
             info[strName] = added[strName];
         }
         Json::Value differing;
-        const bool blJoins = json_text::FromString(row.szExpected, differing);
+        const bool blJoins = json_text::FromString(szExpected, differing);
         Json::Value expected = usual;
         for (const std::string &strName : differing.getMemberNames()) {
             expected[strName] = differing[strName];
@@ -285,10 +273,8 @@ TEST_F(Join, DescribesTheApplianceByItsFactsOverOneConnection) {
 
 TEST_F(Join, RefusedRepliesAreLoggedWithoutTheToken) {
     const std::string strDeep = std::string(2000, '[') + std::string(2000, ']');
-    const struct {
-        std::string strBody;
-        const char *szLogged;  // nullptr: accepted
-    } rows[] = {
+    // What is logged; null where the reply is accepted.
+    const std::pair<std::string, const char *> rows[] = {
         {R"({"success":true})", nullptr},
         {R"({"success":1})", nullptr},
         {R"({"success":false,"error":{"code":105}})", R"({"success":false,"error":{"code":105}})"},
@@ -309,16 +295,16 @@ TEST_F(Join, RefusedRepliesAreLoggedWithoutTheToken) {
          "\\xC2\\x9B"
          "2J \\x9B \xC3\x9B\\x9B\\xE2\\x80\\xAE"},
     };
-    for (const auto &row : rows) {
+    for (const auto &[strBody, szLogged] : rows) {
         stored::Clear();
-        Answer(kApi, "join", row.strBody);
+        Answer(kApi, "join", strBody);
         int result = 1;
         const seam::Outcome outcome =
             seam::Observe([&] { result = ZELOQRMClientSendCreateClient(JoinInfo()); });
-        EXPECT_EQ(result, row.szLogged == nullptr ? 0 : -1) << row.strBody;
-        EXPECT_EQ(Messages(outcome), row.szLogged == nullptr
+        EXPECT_EQ(result, szLogged == nullptr ? 0 : -1) << strBody;
+        EXPECT_EQ(Messages(outcome), szLogged == nullptr
                                          ? std::string()
-                                         : std::string("send create client fail: ") + row.szLogged);
+                                         : std::string("send create client fail: ") + szLogged);
         EXPECT_EQ(stored::Describe(), Stored());
         EXPECT_EQ(outcome.recordsLeft, 0);
     }
@@ -326,17 +312,11 @@ TEST_F(Join, RefusedRepliesAreLoggedWithoutTheToken) {
 
 // Each of these would take minutes, or most of the memory, if it were taken as it comes.
 TEST_F(Join, RepliesMadeToBeExpensiveAreCheapAndCutInTheLog) {
-    const auto repeat = [](const std::string &strPiece, std::size_t cb) {
-        std::string strText;
-        while (strText.size() < cb) {
-            strText += strPiece;
-        }
-        return strText;
-    };
     for (const std::string &strBody :
-         {"{\"success\":0" + repeat("/**/", 4U << 20U) + "}", "[0" + repeat(",0", 15U << 20U) + "]",
-          repeat(kToken, 15U << 20U), "/*\"*/[0" + repeat(",0", 15U << 20U) + "]",
-          "//\"\n[0" + repeat(",0", 15U << 20U) + "]", std::string(100000, 'x')}) {
+         {"{\"success\":0" + Repeated("/**/", 4U << 20U) + "}",
+          "[0" + Repeated(",0", 15U << 20U) + "]", Repeated(kToken, 15U << 20U),
+          "/*\"*/[0" + Repeated(",0", 15U << 20U) + "]",
+          "//\"\n[0" + Repeated(",0", 15U << 20U) + "]", std::string(100000, 'x')}) {
         Answer(kApi, "join", strBody);
         const auto start = std::chrono::steady_clock::now();
         const seam::Outcome outcome =
@@ -378,9 +358,7 @@ TEST_F(Join, OtherConnectionsComeFirstAndTheExplicitOneLast) {
     info["server_conn"].append(Candidate(s_pServer->HttpPort(), 0));
     EXPECT_EQ(ZELOQRMClientSendCreateClient(info), 0);
     EXPECT_EQ(stored::Describe(), Stored());
-    ZELO_CRED *pList = nullptr;
-    EXPECT_EQ(ZELOCredListGet(&pList, ZELOCredKeepByApplication, "ZELO.QRM"), 2);
-    ZELOCredListFree(&pList);
+    EXPECT_EQ(stored::Count(), 2);
 
     info = JoinInfo();
     info["server_http_port"] = "80";

@@ -5,8 +5,6 @@
 
 #include <gtest/gtest.h>
 
-#include <filesystem>
-#include <fstream>
 #include <string>
 
 #include "dev_server_process.h"
@@ -17,16 +15,12 @@
 namespace joined {
 
 constexpr const char *kToken = "secret-0123456789";
-constexpr const char *kMarker = "/tmp/qrmclientconnectfailed";
-constexpr const char *kInfoFile = "/tmp/qrm_client.info";
-constexpr const char *kJournal = "/var/log/notifications.jsonl";
-constexpr const char *kCaFile = "/usr/zelo/etc/ssl/ca.d/server.pem";
 
-using files::FileText;
+using namespace files;
 using seam::Messages;
 
 inline int CountLines(const std::string &strPath) {
-    return static_cast<int>(files::FileLines(strPath).size());
+    return static_cast<int>(FileLines(strPath).size());
 }
 
 class Joined : public testing::Test {
@@ -36,9 +30,8 @@ class Joined : public testing::Test {
         devserver::Options options;
         options.token = szToken;
         s_pServer = new DevServerProcess(options);
-        std::string strReason;
-        ASSERT_TRUE(s_pServer->Start(strReason)) << strReason;
-        std::filesystem::create_directories(std::filesystem::path(kCaFile).parent_path());
+        s_pServer->Start();
+        fs::create_directories(fs::path(kCaFile).parent_path());
         std::ofstream(kCaFile) << s_pServer->CaPem();
     }
     static void TearDownTestSuite() {
@@ -53,9 +46,9 @@ class Joined : public testing::Test {
 
     // A credential with the id 1, nothing else; for the server of the test unless there is a port.
     static void Reset(const char *szProtocol = "https", int port = 0) {
-        std::filesystem::remove_all(stored::kFolder);
+        fs::remove_all(stored::kFolder);
         for (const char *szPath : {kMarker, kInfoFile, kJournal}) {
-            std::filesystem::remove(szPath);
+            fs::remove(szPath);
         }
         const bool blHttps = std::string(szProtocol) == "https";
         if (port == 0) {
@@ -83,7 +76,7 @@ class Joined : public testing::Test {
                (quote == std::string::npos
                     ? std::string()
                     : strInfo.substr(quote + 1, strInfo.rfind('"') - quote - 1)) +
-               " marker=" + (std::filesystem::exists(kMarker) ? "yes" : "no") +
+               " marker=" + (fs::exists(kMarker) ? "yes" : "no") +
                " notified=" + std::to_string(CountLines(kJournal));
     }
 

@@ -4,35 +4,30 @@
 
 #include <fcntl.h>
 #include <gtest/gtest.h>
-#include <sys/stat.h>
 #include <sys/syscall.h>
 
 #include <atomic>
 #include <chrono>
-#include <filesystem>
 #include <set>
 
 #include "children.h"
+#include "failures.h"
 #include "files.h"
-#include "last_error.h"
 
 namespace {
 std::atomic<int> g_syncs = 0;
 }  // namespace
 
 // The platform's calls come here first.
-extern "C" __attribute__((visibility("default"))) int fsync(int fd) {
+extern "C" int fsync(int fd) {
     ++g_syncs;
     return static_cast<int>(syscall(SYS_fsync, fd));
 }
 
 namespace {
 
-namespace fs = std::filesystem;
+using namespace files;
 using Set = std::set<std::string>;
-using files::FileLines;
-using files::FileText;
-using files::WriteFile;
 using std::string_literals::operator""s;
 
 constexpr const char *kFolder = "/tmp/shared";
@@ -56,12 +51,6 @@ Set Names(const char *szFolder) {
         names.insert(entry.path().filename());
     }
     return names;
-}
-
-struct stat Status(const char *szPath) {
-    struct stat status = {};
-    lstat(szPath, &status);
-    return status;
 }
 
 std::string Value(const char *szPath, const char *szKey) {
@@ -106,11 +95,7 @@ TEST_F(KeyValueFile, ReadsEveryFormOfALine) {
               "plain=second\n"
               "long="s +
                   strLong + "\nlast=no line feed");
-    const struct {
-        const char *szKey;
-        std::string strValue;
-        int holds;
-    } rows[] = {
+    const std::tuple<const char *, std::string, int> rows[] = {
         {"plain", "value one", 1},
         {"quoted", "value two", 1},
         {"spaced", "three", 1},
@@ -128,9 +113,9 @@ TEST_F(KeyValueFile, ReadsEveryFormOfALine) {
         {"zero", "", 0},
         {"", "", 0},
     };
-    for (const auto &row : rows) {
-        EXPECT_EQ(Value(kFile, row.szKey), row.strValue) << row.szKey;
-        EXPECT_EQ(YLIBCFileCheckKeyValue(kFile, row.szKey, row.strValue.c_str(), 0), row.holds);
+    for (const auto &[szKey, strValue, holds] : rows) {
+        EXPECT_EQ(Value(kFile, szKey), strValue) << szKey;
+        EXPECT_EQ(YLIBCFileCheckKeyValue(kFile, szKey, strValue.c_str(), 0), holds);
     }
 }
 
@@ -145,8 +130,7 @@ TEST_F(KeyValueFile, GivesAllPairsInOrderAndOfAKeyTheFirst) {
         strPairs += YLIBCSzHashKeyAt(pHash, i) + "="s + YLIBCSzHashValueAt(pHash, i) + ";";
     }
     EXPECT_EQ(strPairs, "old=new;own=stays;b=1;a=x \" y;empty=;");
-    EXPECT_LT(YLIBCFileGetPair("/tmp/none", &pHash), 0);
-    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_NOT_FOUND));
+    EXPECT_EQ(FailureOf(YLIBCFileGetPair("/tmp/none", &pHash)), YLIBC_ERR_NOT_FOUND);
     EXPECT_LT(YLIBCFileGetPair(kFile, nullptr), 0);
     YLIBCSzHashFree(pHash);
 }
@@ -157,17 +141,15 @@ TEST_F(KeyValueFile, CutsAndRefuses) {
     EXPECT_EQ(YLIBCFileGetKeyValue(kFile, "key", sz, sizeof(sz), 0), 4);
     EXPECT_STREQ(sz, "0123");
     EXPECT_EQ(YLIBCFileCheckKeyValue(kFile, "key", "0123", 0), 0);
-    EXPECT_LT(YLIBCFileGetKeyValue("/tmp/none", "key", sz, sizeof(sz), 0), 0);
+    EXPECT_EQ(FailureOf(YLIBCFileGetKeyValue("/tmp/none", "key", sz, 5, 0)), YLIBC_ERR_NOT_FOUND);
     EXPECT_STREQ(sz, "");
-    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_NOT_FOUND));
-    EXPECT_LT(YLIBCFileCheckKeyValue("/etc", "key", "x", 0), 0);
-    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_FILE));
+    EXPECT_EQ(FailureOf(YLIBCFileCheckKeyValue("/etc", "key", "x", 0)), YLIBC_ERR_FILE);
     EXPECT_EQ(YLIBCFileCheckKeyValue(kFile, "other", "x", 0), 0);
     EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_NOT_FOUND));
     EXPECT_LT(YLIBCFileGetKeyValue(nullptr, "key", sz, sizeof(sz), 0), 0);
     EXPECT_LT(YLIBCFileGetKeyValue(kFile, "key", sz, 0, 0), 0);
-    EXPECT_LT(YLIBCFileCheckKeyValue(kFile, nullptr, "x", 0), 0);
-    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_INVALID_ARGUMENT));
+    EXPECT_EQ(FailureOf(YLIBCFileCheckKeyValue(kFile, nullptr, "x", 0)),
+              YLIBC_ERR_INVALID_ARGUMENT);
 }
 
 TEST_F(KeyValueFile, ValuesComeBackAsTheyWentIn) {
@@ -193,8 +175,7 @@ TEST_F(KeyValueFile, WhatTheFormatCannotHoldIsRefused) {
     for (const auto &[szKey, szValue] : rows) {
         for (int result : {YLIBCFileSetKeyValue(kFile, szKey, szValue, 0),
                            YLIBCINFOSetKeyValue(szKey, szValue)}) {
-            EXPECT_LT(result, 0);
-            EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_INVALID_ARGUMENT));
+            EXPECT_EQ(FailureOf(result), YLIBC_ERR_INVALID_ARGUMENT);
         }
     }
     EXPECT_EQ(FileText(kFile), "key=value\n");
@@ -203,11 +184,8 @@ TEST_F(KeyValueFile, WhatTheFormatCannotHoldIsRefused) {
 
 TEST_F(KeyValueFile, AChangeLeavesAllOtherLinesAndTheModeAsTheyWere) {
     const std::string strOdd = "# k=1\r\n\n junk \0 = \xff\nk\0=z\n b = 2 \r\n"s;
-    const struct {
-        std::string strBefore;
-        const char *szValue;  // null: the key is removed
-        std::string strAfter;
-    } rows[] = {
+    // A null value removes the key.
+    const std::tuple<std::string, const char *, std::string> rows[] = {
         {"", "v", "k=\"v\"\n"},
         {"a=1", "v", "a=1\nk=\"v\"\n"},
         {strOdd, "v", strOdd + "k=\"v\"\n"},
@@ -217,14 +195,14 @@ TEST_F(KeyValueFile, AChangeLeavesAllOtherLinesAndTheModeAsTheyWere) {
         {"k=1\n", nullptr, ""},
     };
     const mode_t umaskBefore = umask(077);
-    for (const auto &row : rows) {
+    for (const auto &[strBefore, szValue, strAfter] : rows) {
         for (mode_t mode : {0644U, 0600U, 0666U, 0640U}) {
-            WriteFile(kFile, row.strBefore);
+            WriteFile(kFile, strBefore);
             chmod(kFile, mode);
-            EXPECT_EQ(row.szValue == nullptr ? YLIBCFileRemoveKey(kFile, "k")
-                                             : SetValue(kFile, "k", row.szValue),
-                      0);
-            EXPECT_EQ(FileText(kFile), row.strAfter);
+            EXPECT_EQ(
+                szValue == nullptr ? YLIBCFileRemoveKey(kFile, "k") : SetValue(kFile, "k", szValue),
+                0);
+            EXPECT_EQ(FileText(kFile), strAfter);
             EXPECT_EQ(Status(kFile).st_mode & 07777U, mode);
         }
     }
@@ -298,8 +276,7 @@ TEST_F(KeyValueFile, InASharedFolderTrapsAreLeftAlone) {
         for (const char *szPath : {kFile, "/etc/to-shared.conf"}) {
             for (int result : {YLIBCFileCheckKeyValue(szPath, "k", "secret", 0),
                                SetValue(szPath, "k", "v"), YLIBCFileRemoveKey(szPath, "k")}) {
-                EXPECT_LT(result, 0);
-                EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_UNSAFE_FILE));
+                EXPECT_EQ(FailureOf(result), YLIBC_ERR_UNSAFE_FILE);
             }
         }
         EXPECT_EQ(Names(kFolder), Set{"a.conf"});
@@ -315,7 +292,7 @@ TEST_F(KeyValueFile, InASharedFolderTrapsAreLeftAlone) {
 }
 
 TEST_F(KeyValueFile, AnotherUsersFileIsNotBelievedAndMakesRoom) {
-    if (!files::PutStrangers("file", kFile)) {
+    if (!PutStrangers("file", kFile)) {
         GTEST_SKIP() << "there are no files of another user's";
     }
     WriteFile(kFile, "k=secret\n");

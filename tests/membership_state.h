@@ -15,7 +15,6 @@
 
 namespace membership {
 
-constexpr const char *kConfig = "/etc/zeloinfo.conf";
 constexpr const char *kUser = "ZelonixQRM";
 constexpr const char *kFolder = "/usr/zelo/etc/QRM";
 constexpr const char *kPreference = "/usr/zelo/etc/preference/ZelonixQRM";
@@ -35,7 +34,7 @@ inline bool ForSession(int (*pfn)(ZELO_CGI_CONTEXT *, int, const char *), const 
 
 inline std::string Value(const char *szKey) {
     char sz[256] = {};
-    YLIBCFileGetKeyValue(kConfig, szKey, sz, sizeof(sz), 0);
+    YLIBCFileGetKeyValue(files::kConfig, szKey, sz, sizeof(sz), 0);
     return sz;
 }
 
@@ -66,9 +65,7 @@ inline std::string Remains() {
 constexpr const char *kJoined =
     "daemon ZELO.QRM ZELO.NotificationCenter ZELO.QRM.Client ZELO.QRM.Client.Machine account "
     "member folder 'yes'";
-constexpr const char *kWhole =
-    "daemon ZELO.QRM ZELO.NotificationCenter ZELO.QRM.Client ZELO.QRM.Client.Machine account "
-    "member folder 'yes' rights";
+const std::string kWhole = std::string(kJoined) + " rights";
 
 inline void Clear(const accounts::Files &files) {
     std::filesystem::remove_all(stored::kFolder);

@@ -4,35 +4,29 @@
 
 #include <gtest/gtest.h>
 #include <json/reader.h>
-#include <sys/stat.h>
 #include <syslog.h>
 
 #include <cstdarg>
 #include <cstdio>
-#include <filesystem>
-#include <fstream>
-#include <map>
 #include <set>
 #include <vector>
 
 #include "children.h"
+#include "failures.h"
 #include "files.h"
-#include "last_error.h"
 #include "strings_file.h"
 
 namespace {
 
-namespace fs = std::filesystem;
-using files::FileLines;
+using namespace files;
 
-constexpr const char *kJournal = "/var/log/notifications.jsonl";
 constexpr const char *kFormerJournal = "/var/log/notifications.jsonl.1";
 constexpr const char *kHooks = "/usr/zelo/etc/notify.d";
 constexpr const char *kHookOutput = "/var/log/hooks";
 
 using Variables = std::vector<std::pair<std::string, std::string>>;
 
-std::vector<std::string> g_logLines;
+std::string g_strLog;
 
 int Send(const char *szTag, const Variables &variables = {}) {
     YLIBSZHASH *pHash = YLIBCSzHashAlloc(512);
@@ -51,7 +45,7 @@ Json::Value Parse(const std::string &strLine) {
 }
 
 void Hook(const std::string &strName, const std::string &strScript, mode_t mode = 0755) {
-    files::WriteProgram(std::string(kHooks) + "/" + strName, strScript, mode);
+    WriteProgram(std::string(kHooks) + "/" + strName, strScript, mode);
 }
 
 class Notification : public testing::Test {
@@ -63,17 +57,12 @@ class Notification : public testing::Test {
         fs::remove_all(kHookOutput);
         fs::create_directory(kHooks);
         chmod(kHooks, 0755);
-        g_logLines.clear();
+        g_strLog.clear();
     }
 };
 
 TEST_F(Notification, TheJournalHoldsTheTextsInTheLanguage) {
-    const struct {
-        const char *szLanguage;
-        const char *szTag;
-        const char *szTitle;
-        const char *szTextStart;
-    } rows[] = {
+    const std::tuple<const char *, const char *, const char *, const char *> rows[] = {
         {"", "QRMClientConnectFailed", "QRM server cannot be reached", "This appliance could not"},
         {"ger", "QRMClientDetachSuccess", "Nicht mehr vom QRM-Server verwaltet", "Dieses Gerät"},
         {"jpn", "QRMClientConnectFailed", "QRM サーバーに接続できません", "このデバイスは"},
@@ -83,19 +72,19 @@ TEST_F(Notification, TheJournalHoldsTheTextsInTheLanguage) {
     };
     const std::string strServer = "%OTHER%\n\"x\"\\\x01 é";
     std::size_t count = 0;
-    for (const auto &row : rows) {
-        std::ofstream("/etc/zeloinfo.conf") << "language=\"" << row.szLanguage << "\"\n";
+    for (const auto &[szLanguage, szTag, szTitle, szTextStart] : rows) {
+        std::ofstream("/etc/zeloinfo.conf") << "language=\"" << szLanguage << "\"\n";
         YLIBCErrSetEx(0x1234, "before", 7);
-        ASSERT_EQ(Send(row.szTag, {{"%QRM_SERVER%", strServer}, {"%OTHER%", "wrong"}}), 0);
+        ASSERT_EQ(Send(szTag, {{"%QRM_SERVER%", strServer}, {"%OTHER%", "wrong"}}), 0);
         EXPECT_EQ(YLIBCErrGet(), 0x1234U) << "a success is no error";
         const auto lines = FileLines(kJournal);
         ASSERT_EQ(lines.size(), ++count);
         const Json::Value entry = Parse(lines.back());
-        EXPECT_EQ(entry["tag"], row.szTag);
-        EXPECT_EQ(entry["title"], row.szTitle);
+        EXPECT_EQ(entry["tag"], szTag);
+        EXPECT_EQ(entry["title"], szTitle);
         const std::string strText = entry["text"].asString();
-        EXPECT_EQ(strText.rfind(row.szTextStart, 0), 0U) << strText;
-        EXPECT_EQ(strText.find(strServer) != std::string::npos, *row.szTextStart != '\0');
+        EXPECT_EQ(strText.rfind(szTextStart, 0), 0U) << strText;
+        EXPECT_EQ(strText.find(strServer) != std::string::npos, *szTextStart != '\0');
         EXPECT_EQ(entry["variables"]["%QRM_SERVER%"], strServer);
         EXPECT_EQ(entry["variables"].size(), 2U);
         EXPECT_EQ(entry["time"].asString().size(), std::string("2000-01-01T00:00:00Z").size());
@@ -123,23 +112,18 @@ TEST_F(Notification, HooksRunInTheirOrderWhateverOneOfThemDoes) {
                                                "20-c Tag Tag/a b;c", "30-d Tag Tag/a b;c",
                                                "40-e Tag Tag/a b;c", "Z Tag Tag/a b;c"};
     EXPECT_EQ(FileLines(kHookOutput), expected);
-    std::string strLog;
-    for (const std::string &strLine : g_logLines) {
-        strLog += strLine + "\n";
-    }
-    EXPECT_EQ(g_logLines.size(), 6U) << strLog;
+    EXPECT_EQ(std::count(g_strLog.begin(), g_strLog.end(), '\n'), 6) << g_strLog;
     for (const char *szPart :
          {"15-fails' failed for 'Tag': exit status 3", "16-dies' failed", "17-open' is not run",
           R"(18-li\nnk' is not run)", "README' is not run"}) {
-        EXPECT_NE(strLog.find(szPart), std::string::npos) << szPart << " in " << strLog;
+        EXPECT_TRUE(Holds(g_strLog, szPart)) << szPart << " in " << g_strLog;
     }
 
     // A journal that cannot be written is a failure, but hooks are told all the same.
     fs::remove(kJournal);
     std::ofstream("/var/log/elsewhere").flush();
     fs::create_symlink("elsewhere", kJournal);
-    EXPECT_LT(Send("Tag"), 0);
-    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_UNSAFE_FILE));
+    EXPECT_EQ(FailureOf(Send("Tag")), YLIBC_ERR_UNSAFE_FILE);
     EXPECT_EQ(fs::file_size("/var/log/elsewhere"), 0U);
     EXPECT_EQ(FileLines(kHookOutput).size(), 2 * expected.size());
 
@@ -212,19 +196,17 @@ TEST(InterfaceTexts, EveryLanguageHasEveryTextWithTheSameMarkers) {
 static void KeepLogLine(const char *szFormat, va_list args) {
     char sz[1024];
     std::vsnprintf(sz, sizeof(sz), szFormat, args);
-    g_logLines.emplace_back(sz);
+    g_strLog.append(sz) += '\n';
 }
 
 // The host platform's log lines end here; a fortified build calls the second one.
-extern "C" __attribute__((visibility("default"))) void syslog(int /*level*/, const char *szFormat,
-                                                              ...) {
+extern "C" void syslog(int /*level*/, const char *szFormat, ...) {
     va_list args;
     va_start(args, szFormat);
     KeepLogLine(szFormat, args);
     va_end(args);
 }
-extern "C" __attribute__((visibility("default"))) void __syslog_chk(int /*level*/, int /*flag*/,
-                                                                    const char *szFormat, ...) {
+extern "C" void __syslog_chk(int /*level*/, int /*flag*/, const char *szFormat, ...) {
     va_list args;
     va_start(args, szFormat);
     KeepLogLine(szFormat, args);

@@ -1,31 +1,25 @@
 // What any plug-in SDK has to promise, and what the host's adds: a plug-in is a folder of programs.
 
 #include <gtest/gtest.h>
-#include <sys/stat.h>
 
 #include <chrono>
-#include <filesystem>
-#include <fstream>
-#include <string>
 
+#include "failures.h"
 #include "files.h"
-#include "last_error.h"
 #include "plugin_sdk.h"
 
 namespace {
 
-namespace fs = std::filesystem;
-using files::FileText;
+using namespace files;
 
 constexpr const char *kRoot = "/usr/zelo/etc/plugins";
 constexpr const char *kFolder = "/usr/zelo/etc/plugins/qrm_client/disjoin";
-constexpr const char *kSettings = "/etc/zeloinfo.conf";
 constexpr const char *kRan = "/tmp/ran";
 
 // Every program says first that it has run.
 void AddProgram(const std::string &strName, const std::string &strBody, mode_t mode = 0755) {
-    files::WriteProgram(fs::path(kFolder) / strName,
-                        "echo \"${0##*/}\" >>" + std::string(kRan) + '\n' + strBody, mode);
+    WriteProgram(fs::path(kFolder) / strName,
+                 "echo \"${0##*/}\" >>" + std::string(kRan) + '\n' + strBody, mode);
 }
 
 class PluginSdk : public testing::Test {
@@ -75,29 +69,26 @@ TEST_F(PluginSdk, RunsProgramsInTheOrderOfTheirNamesWithTheArguments) {
 }
 
 TEST_F(PluginSdk, AllProgramsRunAndTheFirstFailureIsTheResult) {
-    const struct {
-        const char *szFirst;
-        int result;
-        unsigned int code;
-        const char *szSettings;  // time enough for the other two
-    } rows[] = {{"exit 3", -3, YLIBC_ERR_EXEC_STATUS, ""},
-                {"kill -KILL $$", -137, YLIBC_ERR_EXEC_STATUS, ""},
-                {"sleep 600 & wait", -124, YLIBC_ERR_EXEC_TIME, "plugin_timeout=\"2\"\n"}};
-    const std::string strSettings = FileText(kSettings);
+    // The settings leave time enough for the other two.
+    const std::tuple<const char *, int, unsigned int, const char *> rows[] = {
+        {"exit 3", -3, YLIBC_ERR_EXEC_STATUS, ""},
+        {"kill -KILL $$", -137, YLIBC_ERR_EXEC_STATUS, ""},
+        {"sleep 600 & wait", -124, YLIBC_ERR_EXEC_TIME, "plugin_timeout=\"2\"\n"}};
+    const std::string strSettings = FileText(kConfig);
     AddProgram("0", "true");
     AddProgram("2", "exit 255");
     ASSERT_GE(Init(), 0);
     const auto begin = std::chrono::steady_clock::now();
-    for (const auto &row : rows) {
+    for (const auto &[szFirst, result, code, szSettings] : rows) {
         fs::remove(kRan);
-        files::WriteFile(kSettings, row.szSettings + strSettings);
-        AddProgram("1", row.szFirst);
-        EXPECT_EQ(Run(), row.result);
-        EXPECT_EQ(YLIBCErrGet(), row.code);
+        WriteFile(kConfig, szSettings + strSettings);
+        AddProgram("1", szFirst);
+        EXPECT_EQ(Run(), result);
+        EXPECT_EQ(YLIBCErrGet(), code);
         EXPECT_EQ(FileText(kRan), "0\n1\n2\n");
     }
     EXPECT_LT(std::chrono::steady_clock::now() - begin, std::chrono::seconds(300));
-    files::WriteFile(kSettings, strSettings);
+    WriteFile(kConfig, strSettings);
 
     std::ofstream(fs::path(kFolder) / "1") << "#!/no/such/interpreter\n";
     EXPECT_EQ(Run(), -126);
@@ -120,8 +111,7 @@ TEST_F(PluginSdk, RunsOnlyWhatNobodyElseCanChange) {
     for (const fs::path &folder : {fs::path(kFolder), fs::path(kFolder).parent_path()}) {
         fs::permissions(folder, fs::perms::others_write, fs::perm_options::add);
         EXPECT_LT(Run(), 0);
-        EXPECT_LT(Init(), 0);
-        EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_UNSAFE_FILE));
+        EXPECT_EQ(FailureOf(Init()), YLIBC_ERR_UNSAFE_FILE);
         EXPECT_EQ(YLIBPluginHasInit(pHandle), 0);
         fs::permissions(folder, fs::perms::others_write, fs::perm_options::remove);
         ASSERT_GE(Init(), 0);
@@ -143,8 +133,8 @@ TEST_F(PluginSdk, RefusesUnusableNames) {
     for (const auto &row : rows) {
         SCOPED_TRACE(testing::PrintToString(row));
         YLIBPLUGIN *pRefused = pHandle;
-        EXPECT_LT(YLIBPluginSDKInit(row[0], row[1], &pRefused), 0);
-        EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_INVALID_ARGUMENT));
+        EXPECT_EQ(FailureOf(YLIBPluginSDKInit(row[0], row[1], &pRefused)),
+                  YLIBC_ERR_INVALID_ARGUMENT);
         EXPECT_EQ(pRefused, nullptr);
     }
     for (const char *szName : {"", "A=B", "A B"}) {

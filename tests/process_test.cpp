@@ -5,31 +5,26 @@
 #include <poll.h>
 #include <sys/syscall.h>
 #include <sys/time.h>
-#include <sys/wait.h>
-#include <unistd.h>
 
 #include <atomic>
 #include <chrono>
-#include <csignal>
 #include <sstream>
 #include <thread>
 
 #include "children.h"
+#include "failures.h"
 #include "files.h"
-#include "last_error.h"
 #include "process.h"
 
 namespace {
+
+using namespace files;
 
 constexpr const char *kOut = "/tmp/out";
 
 void Write(const char *szPath, const std::string &strText, int mode = 0755) {
     std::ofstream(szPath) << strText;
     chmod(szPath, static_cast<mode_t>(mode));
-}
-
-std::string Output() {
-    return files::FileText(kOut);
 }
 
 int Shell(const char *szScript) {
@@ -60,17 +55,15 @@ bool IsBlocked(int signal) {
 // Runs programs in several threads at once; true when each gave its result, and the caller is as it
 // was: with its own signal mask and without a child, be it an ended one.
 bool EveryProgramGivesItsEnd() {
-    const struct {
-        const char *szScript;
-        int result;
-    } rows[] = {{"exit 0", 0},       {"exit 1", 1},       {"exit 3", 3},
-                {"exit 255", 255},   {"kill -9 $$", 137}, {"kill -TERM $$; exit 7", 143},
-                {"sleep 0.05; :", 0}};
+    const std::pair<const char *, int> rows[] = {
+        {"exit 0", 0},       {"exit 1", 1},       {"exit 3", 3},
+        {"exit 255", 255},   {"kill -9 $$", 137}, {"kill -TERM $$; exit 7", 143},
+        {"sleep 0.05; :", 0}};
     const bool blBlocked = IsBlocked(SIGTERM);
     std::atomic<bool> blAll = true;
     const auto runAll = [&] {
-        for (const auto &row : rows) {
-            if (Shell(row.szScript) != row.result) {
+        for (const auto &[szScript, result] : rows) {
+            if (Shell(szScript) != result) {
                 blAll = false;
             }
         }
@@ -93,10 +86,7 @@ class Exec : public testing::Test {
 };
 
 TEST_F(Exec, GivesTheProgramsEndWhateverTheCallerDoes) {
-    const struct {
-        const char *szName;
-        void (*pfnPrepare)();
-    } callers[] = {
+    const std::pair<const char *, void (*)()> callers[] = {
         {"plain", [] {}},
         {"ignores SIGCHLD", [] { Handle(SIGCHLD, SIG_IGN); }},
         {"reaps every child",
@@ -128,18 +118,18 @@ TEST_F(Exec, GivesTheProgramsEndWhateverTheCallerDoes) {
     };
     for (const auto &caller : callers) {
         EXPECT_TRUE(children::InOne([&] {
-            caller.pfnPrepare();
+            caller.second();
             return EveryProgramGivesItsEnd();
-        })) << caller.szName;
+        })) << caller.first;
     }
 }
 
 TEST_F(Exec, PassesArgumentsOnAsTheyAre) {
     Write("/tmp/show", "#!/bin/sh\nfor a; do printf '<%s>' \"$a\"; done >/tmp/out\n");
     EXPECT_EQ(YLIBCExec("/tmp/show", " a b", "it's \"c\"", "", "$(exit) `exit` *;&|\n"), 0);
-    EXPECT_EQ(Output(), "< a b><it's \"c\"><><$(exit) `exit` *;&|\n>");
+    EXPECT_EQ(FileText(kOut), "< a b><it's \"c\"><><$(exit) `exit` *;&|\n>");
     EXPECT_EQ(YLIBCExec("/tmp/show", "a", nullptr, "b", nullptr), 0);
-    EXPECT_EQ(Output(), "<a>");
+    EXPECT_EQ(FileText(kOut), "<a>");
 }
 
 TEST_F(Exec, GivesTheProgramTheNullDeviceAndNoOtherFiles) {
@@ -148,7 +138,7 @@ TEST_F(Exec, GivesTheProgramTheNullDeviceAndNoOtherFiles) {
     EXPECT_EQ(Shell("(ls /proc/$$/fd; readlink /proc/$$/fd/[012]) >/tmp/out; :"), 0);
     close(leaked);
     close(400);
-    EXPECT_EQ(Output(), "0\n1\n2\n/dev/null\n/dev/null\n/dev/null\n");
+    EXPECT_EQ(FileText(kOut), "0\n1\n2\n/dev/null\n/dev/null\n/dev/null\n");
 }
 
 TEST_F(Exec, SaysWhenAProgramCannotBeRun) {
@@ -157,11 +147,12 @@ TEST_F(Exec, SaysWhenAProgramCannotBeRun) {
     Write("/tmp/text", "exit 0\n");
     for (const char *szProgram : {"/tmp/none", "/tmp", "/tmp/plain", "/tmp/interpreter",
                                   "/tmp/text", "/tmp/text/below", "sh", ""}) {
-        EXPECT_LT(YLIBCExec(szProgram, nullptr, nullptr, nullptr, nullptr), 0) << szProgram;
-        EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_EXEC));
+        EXPECT_EQ(FailureOf(YLIBCExec(szProgram, nullptr, nullptr, nullptr, nullptr)),
+                  YLIBC_ERR_EXEC)
+            << szProgram;
     }
-    EXPECT_LT(YLIBCExec(nullptr, nullptr, nullptr, nullptr, nullptr), 0);
-    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_INVALID_ARGUMENT));
+    EXPECT_EQ(FailureOf(YLIBCExec(nullptr, nullptr, nullptr, nullptr, nullptr)),
+              YLIBC_ERR_INVALID_ARGUMENT);
     EXPECT_EQ(Shell("exit 1"), 1);
     EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_INVALID_ARGUMENT));
 }
@@ -169,14 +160,14 @@ TEST_F(Exec, SaysWhenAProgramCannotBeRun) {
 TEST_F(Exec, EndsAHungProgramWithItsProcessGroup) {
     Write("/etc/zeloinfo.conf", "exec_timeout=2\n");
     const auto begin = std::chrono::steady_clock::now();
-    EXPECT_LT(Shell("trap '' TERM; sleep 300 & echo $$ $! >/tmp/out; sleep 300; :"), 0);
-    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_EXEC_TIME));
+    EXPECT_EQ(FailureOf(Shell("trap '' TERM; sleep 300 & echo $$ $! >/tmp/out; sleep 300; :")),
+              YLIBC_ERR_EXEC_TIME);
     const auto duration = std::chrono::steady_clock::now() - begin;
     EXPECT_GE(duration, std::chrono::seconds(2));
     EXPECT_LT(duration, std::chrono::seconds(100));
     int program = 0;
     int child = 0;
-    std::istringstream(Output()) >> program >> child;
+    std::istringstream(FileText(kOut)) >> program >> child;
     EXPECT_TRUE(program > 0 && Ends(program) && child > 0 && Ends(child));
 }
 
@@ -189,7 +180,7 @@ TEST_F(Exec, TakesAnInvalidLimitForTheDefault) {
 
 TEST_F(Exec, LeavesADaemonAlone) {
     EXPECT_EQ(Shell("sleep 300 & echo $! >/tmp/out"), 0);
-    const int daemon = std::atoi(Output().c_str());
+    const int daemon = std::atoi(FileText(kOut).c_str());
     EXPECT_EQ(YLIBCProcAlive(daemon), 1);
     kill(daemon, SIGKILL);
     EXPECT_TRUE(Ends(daemon));
@@ -202,12 +193,10 @@ TEST(ProcAlive, KnowsTheLivingFromTheDead) {
     EXPECT_EQ(kill(zombie, 0), 0);
     EXPECT_EQ(YLIBCProcAlive(zombie), 0);
     waitpid(zombie, nullptr, 0);
-    const struct {
-        int pid;
-        int result;
-    } rows[] = {{getpid(), 1}, {1, 1}, {zombie, 0}, {0, 0}, {-1, 0}, {-getpid(), 0}};
-    for (const auto &row : rows) {
-        EXPECT_EQ(YLIBCProcAlive(row.pid), row.result) << row.pid;
+    const std::pair<int, int> rows[] = {{getpid(), 1}, {1, 1},  {zombie, 0},
+                                        {0, 0},        {-1, 0}, {-getpid(), 0}};
+    for (const auto &[pid, result] : rows) {
+        EXPECT_EQ(YLIBCProcAlive(pid), result) << pid;
     }
     // The id of a thread is no process's.
     std::thread([] { EXPECT_EQ(YLIBCProcAlive(gettid()), 0); }).join();

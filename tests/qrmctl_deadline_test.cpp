@@ -4,8 +4,6 @@
 #include <shadow.h>
 #include <sqlite3.h>
 
-#include <sstream>
-
 #include "file_lock.h"
 #include "joined.h"
 #include "json_text.h"
@@ -14,95 +12,65 @@
 
 namespace {
 
-using joined::FileText;
 using Arguments = std::vector<std::string>;
-namespace fs = std::filesystem;
+using namespace files;
 
 constexpr const char *kDaemonScript = "/usr/zelo/etc/rc.d/S99zelocache.sh";
 constexpr const char *kPlugin = "/usr/zelo/etc/plugins/qrm_client/disjoin/hanging";
 constexpr const char *kHook = "/usr/zelo/etc/notify.d/hanging";
 constexpr const char *kPath = "/tmp/files/file";
 
-// What a command may wait for. Each is held until it is destroyed.
-class Silence {
-  public:
-    explicit Silence(const DevServerProcess &server) {
-        devserver::NextAnswer silent;
-        silent.delay_ms = 600'000;
-        for (const char *szApi :
-             {"ZELO.QRM.RPC", "ZELO.QRM.RPC.File", "ZELO.QRM.RPC.Log", "ZELO.QRM.RPC.ClientInfo"}) {
-            server.AnswerNext(szApi, silent);
-        }
+// What a command may wait for, held until this is gone.
+using Held = std::shared_ptr<void>;
+
+Held Silence(const DevServerProcess &server) {
+    devserver::NextAnswer silent;
+    silent.delay_ms = 600'000;
+    for (const char *szApi :
+         {"ZELO.QRM.RPC", "ZELO.QRM.RPC.File", "ZELO.QRM.RPC.Log", "ZELO.QRM.RPC.ClientInfo"}) {
+        server.AnswerNext(szApi, silent);
     }
-};
+    return {nullptr, [&server](void *) { server.ForgetAnswers(); }};
+}
 
-class HeldLock {
-  public:
-    explicit HeldLock(const char *szPath) {
-        EXPECT_EQ(YLIBCFileLockTimeByFile(szPath, 0, 0, &m_handle), 1);
-    }
-    ~HeldLock() { YLIBCFileUnlockByFile(m_handle); }
-    HeldLock(const HeldLock &) = delete;
-    HeldLock &operator=(const HeldLock &) = delete;
+Held HoldLock(const char *szPath) {
+    int handle = -1;
+    EXPECT_EQ(YLIBCFileLockTimeByFile(szPath, 0, 0, &handle), 1);
+    return {nullptr, [handle](void *) { YLIBCFileUnlockByFile(handle); }};
+}
 
-  private:
-    int m_handle = -1;
-};
+Held HoldStore() {
+    sqlite3 *pDb = nullptr;
+    EXPECT_EQ(sqlite3_open(stored::kDatabase, &pDb), SQLITE_OK);
+    EXPECT_EQ(sqlite3_exec(pDb, "BEGIN EXCLUSIVE", nullptr, nullptr, nullptr), SQLITE_OK);
+    return {pDb, sqlite3_close};
+}
 
-class HeldStore {
-  public:
-    HeldStore() {
-        EXPECT_EQ(sqlite3_open(stored::kDatabase, &m_pDb), SQLITE_OK);
-        EXPECT_EQ(sqlite3_exec(m_pDb, "BEGIN EXCLUSIVE", nullptr, nullptr, nullptr), SQLITE_OK);
-    }
-    ~HeldStore() { sqlite3_close(m_pDb); }
-    HeldStore(const HeldStore &) = delete;
-    HeldStore &operator=(const HeldStore &) = delete;
-
-  private:
-    sqlite3 *m_pDb = nullptr;
-};
-
-struct HeldAccounts {
-    HeldAccounts() { EXPECT_EQ(lckpwdf(), 0); }
-    ~HeldAccounts() { ulckpwdf(); }
-    HeldAccounts(const HeldAccounts &) = delete;
-    HeldAccounts &operator=(const HeldAccounts &) = delete;
-};
+Held HoldAccounts() {
+    EXPECT_EQ(lckpwdf(), 0);
+    return {nullptr, [](void *) { ulckpwdf(); }};
+}
 
 // A program at the path, which does not come back and tells its process id.
-class HangingProgram {
-  public:
-    explicit HangingProgram(const char *szPath)
-        : m_szPath(szPath), m_blThere(fs::exists(szPath)), m_strBefore(FileText(szPath)) {
-        fs::create_directories(fs::path(szPath).parent_path());
-        std::ofstream(szPath) << "#!/bin/sh\necho $$ > /tmp/pid\nexec sleep 600\n";
-        fs::permissions(szPath, fs::perms(0755));
-        std::ofstream("/tmp/pid").flush();
-    }
-    ~HangingProgram() {
-        if (m_blThere) {
-            std::ofstream(m_szPath) << m_strBefore;
-        } else {
-            fs::remove(m_szPath);
-        }
-        int pid = 0;
-        std::istringstream(FileText("/tmp/pid")) >> pid;
-        EXPECT_GT(pid, 0);
-        EXPECT_TRUE(run_program::Until([pid] { return YLIBCProcAlive(pid) == 0; }))
-            << "what was started does not outlive the deadline";
-        fs::remove("/tmp/pid");
-    }
-    // Whether one has been started that has not come to telling its process id.
-    static bool IsAwaited() { return fs::exists("/tmp/pid") && fs::file_size("/tmp/pid") == 0; }
-    HangingProgram(const HangingProgram &) = delete;
-    HangingProgram &operator=(const HangingProgram &) = delete;
+Held HangProgram(const char *szPath) {
+    const std::string strBefore = FileText(szPath);
+    fs::create_directories(fs::path(szPath).parent_path());
+    WriteProgram(szPath, "echo $$ > /tmp/pid\nexec sleep 600");
+    WriteFile("/tmp/pid", "");
+    return {nullptr, [szPath, strBefore](void *) {
+                strBefore.empty() ? void(fs::remove(szPath)) : WriteFile(szPath, strBefore);
+                const int pid = std::atoi(FileText("/tmp/pid").c_str());
+                EXPECT_GT(pid, 0);
+                EXPECT_TRUE(run_program::Until([pid] { return YLIBCProcAlive(pid) == 0; }))
+                    << "what was started does not outlive the deadline";
+                fs::remove("/tmp/pid");
+            }};
+}
 
-  private:
-    const char *m_szPath;
-    bool m_blThere;
-    std::string m_strBefore;
-};
+// Whether one has been started that has not come to telling its process id.
+bool IsProgramAwaited() {
+    return fs::exists("/tmp/pid") && fs::file_size("/tmp/pid") == 0;
+}
 
 // A pipe that is full but for some bytes, and that nobody reads until its text is asked for.
 class FullPipe {
@@ -147,89 +115,62 @@ class Deadline : public joined::Joined {
 };
 
 TEST_F(Deadline, EndsWhateverACommandIsBlockedInAndNamesIt) {
-    using Hold = std::function<std::shared_ptr<void>()>;
-    const Hold silence = [] { return std::make_shared<Silence>(*s_pServer); };
-    const Hold store = [] { return std::make_shared<HeldStore>(); };
-    const auto program = [](const char *szPath) -> Hold {
-        return [szPath] { return std::make_shared<HangingProgram>(szPath); };
-    };
-    const Hold accounts = [] { return std::make_shared<HeldAccounts>(); };
-    const auto lock = [](const char *szPath) -> Hold {
-        return [szPath] { return std::make_shared<HeldLock>(szPath); };
-    };
-    const std::string strServer = "localhost:" + std::to_string(s_pServer->HttpsPort());
+    // How it is held, and what is said of it.
+    using Block = std::pair<std::function<Held()>, std::string>;
     const std::string strPort = std::to_string(s_pServer->HttpsPort());
-    const std::string strStore =
-        std::string("waiting for the credential store '") + stored::kDatabase + '\'';
-    const char *szAccounts = "waiting for the lock '/etc/.pwd.lock'";
+    const Block silence = {[] { return Silence(*s_pServer); }, "localhost:" + strPort};
+    const Block store = {
+        HoldStore, std::string("waiting for the credential store '") + stored::kDatabase + '\''};
+    const Block accounts = {HoldAccounts, "waiting for the lock '/etc/.pwd.lock'"};
+    const auto lock = [](const char *szPath) -> Block {
+        return {[szPath] { return HoldLock(szPath); },
+                std::string("waiting for the lock '") + szPath + '\''};
+    };
+    const auto program = [](const char *szPath, const char *szArguments) -> Block {
+        return {[szPath] { return HangProgram(szPath); },
+                std::string("running '") + szPath + ' ' + szArguments + '\''};
+    };
+    const Block daemon = program(kDaemonScript, "status");
     std::ofstream("/tmp/credential") << R"({"protocol":"https","host":"h","port":1,)"
                                      << R"("application":"ZELO.QRM","access_token":"t"})";
-    const struct {
-        Arguments arguments;
-        Hold hold;
-        std::string strStage;  // what its name holds
-        const char *szRemedy;
-    } rows[] = {
-        {{"test-connection", "--api", "ZELO.QRM.RPC", "/tmp/list"}, silence, strServer, ""},
+    const std::tuple<Arguments, Block, const char *> rows[] = {
+        {{"test-connection", "--api", "ZELO.QRM.RPC", "/tmp/list"}, silence, ""},
         {{"join", "--server", "localhost", "--http-port", "0", "--https-port", strPort,
           "--token-file", "/tmp/token"},
          silence,
-         strServer,
          "nothing was changed"},
-        {{"call", "ZELO.QRM.RPC", "info"}, silence, strServer, ""},
-        {{"update"}, silence, strServer, ""},
-        {{"log", "err", "-", "text"}, silence, strServer, ""},
+        {{"call", "ZELO.QRM.RPC", "info"}, silence, ""},
+        {{"update"}, silence, ""},
+        {{"log", "err", "-", "text"}, silence, ""},
         {{"get-file", kPath, "ZELO.QRM.RPC.File", "get", "--params", R"({"name":"f","size":9})"},
          silence,
-         strServer,
          "is as it was"},
-        {{"status"}, store, strStore, ""},
-        {{"status", "--explain"}, store, strStore, ""},
-        {{"status", "--explain"},
-         program(kDaemonScript),
-         std::string("running '") + kDaemonScript + " status'",
-         ""},
-        {{"doctor"}, silence, strServer, ""},
-        {{"doctor"}, store, "", ""},
-        {{"support", "/tmp/files/archive"}, silence, "qrmctl doctor", ""},
-        {{"support", "/tmp/files/archive"}, program(kDaemonScript), "qrmctl status", ""},
-        {{"account", "create"}, accounts, szAccounts, "qrmctl leave"},
-        {{"account", "delete"}, accounts, szAccounts, "qrmctl leave"},
-        {{"leave"},
-         lock("/tmp/qrmctl.membership.lock"),
-         "waiting for the lock '/tmp/qrmctl.membership.lock'",
-         "qrmctl leave"},
-        {{"leave"}, store, strStore, "qrmctl leave"},
-        {{"leave"}, program(kPlugin), std::string("running '") + kPlugin + " pre'", "qrmctl leave"},
-        {{"plugins", "run", "disjoin", "POST"},
-         program(kPlugin),
-         std::string("running '") + kPlugin + " post'",
-         ""},
-        {{"notify", "QRMClientConnectFailed"},
-         program(kHook),
-         std::string("running '") + kHook + " QRMClientConnectFailed'",
-         ""},
-        {{"info", "set", "key", "value"},
-         lock("/tmp/qrm_client.info.lock"),
-         "waiting for the lock '/tmp/qrm_client.info.lock'",
-         ""},
-        {{"idle", "get"},
-         lock("/tmp/qrm_idle_time.lock"),
-         "waiting for the lock '/tmp/qrm_idle_time.lock'",
-         ""},
-        {{"idle", "set", "5"},
-         lock("/tmp/qrm_idle_time.lock"),
-         "waiting for the lock '/tmp/qrm_idle_time.lock'",
-         "idle get"},
-        {{"credential", "create", "/tmp/credential"}, store, strStore, "credential show"},
-        {{"credential", "update", "/tmp/credential"}, store, strStore, "credential show"},
-        {{"credential", "delete"}, store, strStore, "credential delete"},
-        {{"credential", "show"}, store, strStore, ""}};
+        {{"status"}, store, ""},
+        {{"status", "--explain"}, store, ""},
+        {{"status", "--explain"}, daemon, ""},
+        {{"doctor"}, silence, ""},
+        {{"doctor"}, {store.first, ""}, ""},
+        {{"support", "/tmp/files/archive"}, {silence.first, "qrmctl doctor"}, ""},
+        {{"support", "/tmp/files/archive"}, {daemon.first, "qrmctl status"}, ""},
+        {{"account", "create"}, accounts, "qrmctl leave"},
+        {{"account", "delete"}, accounts, "qrmctl leave"},
+        {{"leave"}, lock("/tmp/qrmctl.membership.lock"), "qrmctl leave"},
+        {{"leave"}, store, "qrmctl leave"},
+        {{"leave"}, program(kPlugin, "pre"), "qrmctl leave"},
+        {{"plugins", "run", "disjoin", "POST"}, program(kPlugin, "post"), ""},
+        {{"notify", "QRMClientConnectFailed"}, program(kHook, "QRMClientConnectFailed"), ""},
+        {{"info", "set", "key", "value"}, lock("/tmp/qrm_client.info.lock"), ""},
+        {{"idle", "get"}, lock("/tmp/qrm_idle_time.lock"), ""},
+        {{"idle", "set", "5"}, lock("/tmp/qrm_idle_time.lock"), "idle get"},
+        {{"credential", "create", "/tmp/credential"}, store, "credential show"},
+        {{"credential", "update", "/tmp/credential"}, store, "credential show"},
+        {{"credential", "delete"}, store, "credential delete"},
+        {{"credential", "show"}, store, ""}};
     ASSERT_EQ(run_program::Run({QRMCTL, "account", "create"}).status, 0);
-    for (const auto &row : rows) {
-        SCOPED_TRACE(testing::PrintToString(row.arguments));
-        const std::shared_ptr<void> held = row.hold();
-        Arguments command = row.arguments;
+    for (const auto &[arguments, block, szRemedy] : rows) {
+        SCOPED_TRACE(testing::PrintToString(arguments));
+        const Held held = block.first();
+        Arguments command = arguments;
         command.insert(command.begin(), QRMCTL);
         run_program::Outcome outcome;
         Json::Value result;
@@ -246,15 +187,14 @@ TEST_F(Deadline, EndsWhateverACommandIsBlockedInAndNamesIt) {
             EXPECT_TRUE(json_text::FromString(outcome.strOut, result)) << outcome.strOut;
             EXPECT_EQ(result["error_id"], "deadline");
             strStage = result["stage"].asString();
-            if (strStage.find(row.strStage) != std::string::npos && !HangingProgram::IsAwaited()) {
+            if (Holds(strStage, block.second) && !IsProgramAwaited()) {
                 break;
             }
         }
-        EXPECT_NE(strStage.find(row.strStage), std::string::npos) << strStage;
+        EXPECT_TRUE(Holds(strStage, block.second)) << strStage;
         EXPECT_EQ(outcome.strErr, "qrmctl: " + result["error"].asString() + '\n');
         EXPECT_NE(outcome.strErr.find('\'' + strStage + '\''), std::string::npos);
-        EXPECT_NE(outcome.strErr.find(row.szRemedy), std::string::npos) << outcome.strErr;
-        s_pServer->ForgetAnswers();
+        EXPECT_NE(outcome.strErr.find(szRemedy), std::string::npos) << outcome.strErr;
     }
     EXPECT_EQ(FileText(kPath), "old");
     EXPECT_EQ(std::distance(fs::directory_iterator("/tmp/files"), fs::directory_iterator()), 1)
@@ -271,7 +211,7 @@ TEST_F(Deadline, IsANumberOfSecondsAboveZeroAndStatusHasOne) {
           Arguments{QRMCTL, "credential", "show", "--deadline", "2e1"}}) {
         EXPECT_EQ(run_program::Run(command).status, 0);
     }
-    const HeldStore store;
+    const Held store = HoldStore();
     const auto begin = std::chrono::steady_clock::now();
     const run_program::Outcome outcome = run_program::Run({QRMCTL, "status"});
     EXPECT_EQ(outcome.status, 5);
@@ -284,38 +224,34 @@ TEST_F(Deadline, EndsThoughNobodyReadsItsOutputAndNeverContradictsIt) {
     constexpr std::size_t kPage = 4096;
     const std::string strLong(2 * kPage, 'k');
     ASSERT_EQ(run_program::Run({QRMCTL, "info", "set", "key", "value"}).status, 0);
-    const struct {
-        char fd;
-        std::size_t cbFree;
-        std::string strKey;
-        bool blJson;  // whether the deadline is the JSON object
-    } rows[] = {{'2', 0, "none", true}, {'2', kPage, strLong, true}, {'1', 0, "key", false}};
-    for (const auto &row : rows) {
-        SCOPED_TRACE(row.strKey.substr(0, 4) + row.fd);
-        const FullPipe full(row.cbFree);
+    // At last, whether the JSON object tells of the deadline.
+    const std::tuple<char, std::size_t, std::string, bool> rows[] = {
+        {'2', 0, "none", true}, {'2', kPage, strLong, true}, {'1', 0, "key", false}};
+    for (const auto &[fd, cbFree, strKey, blJson] : rows) {
+        SCOPED_TRACE(strKey.substr(0, 4) + fd);
+        const FullPipe full(cbFree);
         const std::string strCommand =
-            std::string(R"(exec "$0" "$@" )") + row.fd + ">" + FullPipe::kPipe;
+            std::string(R"(exec "$0" "$@" )") + fd + ">" + FullPipe::kPipe;
         const run_program::Outcome outcome =
-            run_program::Run({"/bin/sh", "-c", strCommand, QRMCTL, "info", "get", row.strKey,
-                              "--json", "--deadline", "0.4"});
+            run_program::Run({"/bin/sh", "-c", strCommand, QRMCTL, "info", "get", strKey, "--json",
+                              "--deadline", "0.4"});
         EXPECT_EQ(outcome.status, 5);
         Json::Value result;
-        EXPECT_EQ(json_text::FromString(outcome.strOut, result), row.blJson) << outcome.strOut;
-        EXPECT_EQ(result["error_id"] == "deadline", row.blJson);
-        EXPECT_EQ(outcome.strErr.find("qrmctl: the deadline") == 0, !row.blJson) << outcome.strErr;
+        EXPECT_EQ(json_text::FromString(outcome.strOut, result), blJson) << outcome.strOut;
+        EXPECT_EQ(result["error_id"] == "deadline", blJson);
+        EXPECT_EQ(outcome.strErr.find("qrmctl: the deadline") == 0, !blJson) << outcome.strErr;
         EXPECT_EQ(full.Text().find("deadline"), std::string::npos);
     }
 }
 
 TEST_F(Deadline, LeavesAloneWhatItDidNotStart) {
-    const HeldStore store;
+    const Held store = HoldStore();
     EXPECT_EQ(run_program::Run(
                   {"/bin/sh", "-c",
                    R"(sleep 600 & echo $! > /tmp/pid; exec "$0" status --deadline 0.4)", QRMCTL})
                   .status,
               5);
-    int pid = 0;
-    std::istringstream(FileText("/tmp/pid")) >> pid;
+    const int pid = std::atoi(FileText("/tmp/pid").c_str());
     ASSERT_GT(pid, 0);
     EXPECT_EQ(YLIBCProcAlive(pid), 1);
     kill(pid, SIGKILL);

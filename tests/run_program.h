@@ -65,8 +65,6 @@ class Program {
         Signal(SIGKILL);
         Wait();
     }
-    Program(const Program &) = delete;
-    Program &operator=(const Program &) = delete;
 
     void Signal(int signal) const {
         if (m_pid > 0) {

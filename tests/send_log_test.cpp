@@ -2,7 +2,6 @@
 // real server.
 
 #include <chrono>
-#include <vector>
 
 #include "joined.h"
 #include "json_text.h"
@@ -14,6 +13,7 @@
 
 namespace {
 
+using namespace files;
 using joined::Messages;
 using seam::MessagesOf;
 using torture::Expected;
@@ -33,14 +33,6 @@ void WriteTexts(const std::string &strText) {
     for (const std::string &strLanguage : kLanguages) {
         std::ofstream(PathOf(strLanguage)) << strText;
     }
-}
-
-std::string Repeated(const std::string &strText, std::size_t cbMost) {
-    std::string strAll;
-    while (strAll.size() + strText.size() <= cbMost) {
-        strAll += strText;
-    }
-    return strAll;
 }
 
 struct TextList {
@@ -154,10 +146,7 @@ TEST(References, AreReplacedByTextsOrByTheirKeys) {
     const std::string strX(505, 'x');
     const std::string strS(511, 's');
     const std::string strK(511, 'k');
-    const struct {
-        std::string strParam;
-        std::string strText;
-    } rows[] = {
+    const std::pair<std::string, std::string> rows[] = {
         {"", ""},
         {"plain", "plain"},
         {"{s:k}", "VAL"},
@@ -190,7 +179,7 @@ TEST(References, AreReplacedByTextsOrByTheirKeys) {
         {std::string(3500, 'x') + "{s:long}_T(s,k)", std::string(3500, 'x') + "{s:long}VAL"},
     };
     for (const auto &row : rows) {
-        EXPECT_EQ(MessagesOf([&] { EXPECT_EQ(Expand(row.strParam), row.strText); }), "");
+        EXPECT_EQ(MessagesOf([&] { EXPECT_EQ(Expand(row.first), row.second); }), "");
     }
     // What a replacement did counts, not what it answers.
     EXPECT_EQ(MessagesOf({"YLIBCStrReplace", 1, true, 0},
@@ -209,23 +198,19 @@ TEST(References, AreReplacedByTextsOrByTheirKeys) {
 }
 
 TEST(References, CheckedAloneFillTheBuffersAndNoMore) {
-    const struct {
-        const char *szText;
-        int tpl1;
-        int tpl2;
-    } rows[] = {{"{abc:def}", 0, -1}, {"{abcd:e}", -1, -1}, {"{a:bcde}", -1, -1},
-                {"_T(a,b)", -1, 0},   {"_T(a,bc)", -1, -1}, {"x{:}_T(a,b)", 0, 0},
-                {"_T(", -1, -1},      {"", -1, -1},         {nullptr, -1, -1}};
-    for (const auto &row : rows) {
+    const std::tuple<const char *, int, int> rows[] = {
+        {"{abc:def}", 0, -1}, {"{abcd:e}", -1, -1}, {"{a:bcde}", -1, -1},
+        {"_T(a,b)", -1, 0},   {"_T(a,bc)", -1, -1}, {"x{:}_T(a,b)", 0, 0},
+        {"_T(", -1, -1},      {"", -1, -1},         {nullptr, -1, -1}};
+    for (const auto &[szText, tpl1, tpl2] : rows) {
         std::vector<char> section(8, '?');
         std::vector<char> key(8, '?');
         std::vector<char> token(8, '?');
-        EXPECT_EQ(CheckSectionKey_tpl1(row.szText, section.data(), key.data(), 4), row.tpl1);
+        EXPECT_EQ(CheckSectionKey_tpl1(szText, section.data(), key.data(), 4), tpl1);
         EXPECT_EQ(section[4], '?');
         EXPECT_EQ(key[4], '?');
-        EXPECT_EQ(CheckSectionKey_tpl2(row.szText, section.data(), key.data(), token.data(), 8),
-                  row.tpl2);
-        if (row.tpl2 == 0) {
+        EXPECT_EQ(CheckSectionKey_tpl2(szText, section.data(), key.data(), token.data(), 8), tpl2);
+        if (tpl2 == 0) {
             EXPECT_STREQ(token.data(), "_T(a,b)");
         }
     }
@@ -339,61 +324,27 @@ TEST_F(SendLog, TextsThatThePlatformDoesNotEndAreSentToTheirEnd) {
         return Counted({{strX + strX + "a", 19}, {strOther, 1}});
     };
     const auto full = [](std::size_t cb) { return std::string(cb, 'f'); };
-    const struct {
-        const char *szOperation;
-        int nth;
-        std::string strFill;
-        std::string strTexts;
-        std::string strHost = "zelobox";
-    } rows[] = {
+    const std::tuple<const char *, int, std::string, std::string> rows[] = {
         {"YLIBCFileGetSectionValue", 4, "message value", all("message value")},
         {"YLIBCFileGetSectionValue", 4, full(4096), all(full(4095))},
         {"YLIBCFileGetSectionValue", 5, "v", all(strX + "va")},
         {"YLIBCFileGetSectionValue", 5, full(1024), all(strX + full(1023) + "a")},
         {"YLIBCFileGetSectionValue", 6, "v", all(strX + strX + "v")},
-        {"ZELOLnxGetHostname", 1, full(64), Counted({{strX + strX + "a", 20}}), full(64)},
+        {"ZELOLnxGetHostname", 1, full(64), Counted({{strX + strX + "a", 20}})},
     };
-    for (const auto &row : rows) {
+    for (const auto &[szOperation, nth, strFill, strTexts] : rows) {
         s_pServer->ForgetRequests();
-        EXPECT_EQ(
-            MessagesOf({row.szOperation, row.nth, true, 0, 0, row.strFill},
-                       [] {
-                           EXPECT_EQ(
-                               ZELOQRMClientLog(6, "m", "msg", "{s:k}{s:a}", nullptr, nullptr), 0);
-                       }),
-            "");
-        EXPECT_EQ(Sent(), R"({"happen_time":"now","level":"info","username":"[)" + row.strHost +
-                              "]\"} " + row.strTexts);
+        const std::string strHost = nth == 1 ? strFill : "zelobox";
+        const seam::Outcome outcome = seam::Observe({szOperation, nth, true, 0, 0, strFill}, [] {
+            EXPECT_EQ(ZELOQRMClientLog(6, "m", "msg", "{s:k}{s:a}", nullptr, nullptr), 0);
+        });
+        EXPECT_EQ(Messages(outcome), "");
+        EXPECT_EQ(Sent(), R"({"happen_time":"now","level":"info","username":"[)" + strHost +
+                              "]\"} " + strTexts);
     }
 }
 
-// What follows the calls of these tables belongs to the Web API call.
-TEST_F(SendLog, TheListOverloadSurvivesEveryFailingCall) {
-    const std::string strSent =
-        R"({"extra_info":"x","happen_time":"now","level":"warning","username":"[zelobox]"} 20 hi)";
-    const Expected unread{"-1", "conver (null):hi string failed. ", "nothing"};
-    Expected noTime{"0", "", strSent};
-    noTime.strStored.replace(strSent.find("\"now\""), 5, "-1");
-    std::vector<torture::Step> steps = {
-        {"ZELOLnxGetHostname", {"-1", "get hostname failed ", "nothing"}},
-        {"time", noTime},
-        {"YLIBCSzListAlloc", {"-1", NoList() + "\n" + unread.strLog, "nothing"}},
-        {"YLIBCStrTok", unread}};
-    steps.insert(steps.end(), 20, {"YLIBCSzListGet", unread});
-    torture::Run({"list",
-                  kFile,
-                  [] { s_pServer->ForgetRequests(); },
-                  [] {
-                      YLIBSZLIST *const pslNone = nullptr;
-                      return std::to_string(ZELOQRMClientLog(4, nullptr, "hi", pslNone, "x"));
-                  },
-                  Sent,
-                  {"0", "", strSent},
-                  steps,
-                  false,
-                  true});
-}
-
+// It calls the overload for lists. What follows these calls belongs to the Web API call.
 TEST_F(SendLog, TheTextOverloadSurvivesEveryFailingCall) {
     const auto sent = [](const std::string &strTexts, const char *szTime = "\"now\"") {
         return Expected{"0", "",
@@ -455,31 +406,27 @@ TEST_F(SendLog, TheServerGetsWhatTheCallerSays) {
 TEST_F(SendLog, OnlyBooleanTrueConfirmsAnEntry) {
     YLIBSZLIST *const pslNone = nullptr;
     const char *szUnconfirmed = "push log webapi response failed, jsReq={";
-    const struct {
-        const char *szBody;
-        int result;
-        const char *szLog;
-    } rows[] = {
-        {R"({"success":true})", 0, ""},
-        {R"({"success":"true"})", -1, szUnconfirmed},
-        {R"({"success":1})", -1, szUnconfirmed},
-        {R"({"success":false})", -1, szUnconfirmed},
-        {"{}", -1, szUnconfirmed},
-        {"[true]", -1, szUnconfirmed},
-        {"no json", -1, "push log webapi failed, jsReq={"},
+    const std::pair<const char *, std::string> rows[] = {
+        {R"({"success":true})", ""},
+        {R"({"success":"true"})", szUnconfirmed},
+        {R"({"success":1})", szUnconfirmed},
+        {R"({"success":false})", szUnconfirmed},
+        {"{}", szUnconfirmed},
+        {"[true]", szUnconfirmed},
+        {"no json", "push log webapi failed, jsReq={"},
     };
-    for (const auto &row : rows) {
-        SCOPED_TRACE(row.szBody);
-        Answer(kLogApi, "", row.szBody);
-        // The message is too long for a line.
-        const std::string strMessage(3000, 'm');
-        const seam::Outcome outcome = seam::Observe([&] {
-            EXPECT_EQ(ZELOQRMClientLog(3, nullptr, strMessage.c_str(), pslNone, nullptr),
-                      row.result);
-        });
+    // The message is too long for a line.
+    const std::string strMessage(3000, 'm');
+    for (const auto &[szBody, strLog] : rows) {
+        SCOPED_TRACE(szBody);
+        Answer(kLogApi, "", szBody);
+        int result = 1;
+        const seam::Outcome outcome = seam::Observe(
+            [&] { result = ZELOQRMClientLog(3, nullptr, strMessage.c_str(), pslNone, nullptr); });
+        EXPECT_EQ(result, strLog.empty() ? 0 : -1);
         const std::string strLast = outcome.logs.empty() ? "" : outcome.logs.back().strMessage;
-        EXPECT_EQ(strLast.substr(0, strLast.find('{') + 1), row.szLog);
-        EXPECT_EQ(strLast.find(" bytes in all]") != std::string::npos, row.result != 0);
+        EXPECT_EQ(strLast.substr(0, strLast.find('{') + 1), strLog);
+        EXPECT_EQ(Holds(strLast, " bytes in all]"), !strLog.empty());
         EXPECT_EQ(outcome.recordsLeft, 0);
     }
 }
@@ -491,10 +438,8 @@ TEST_F(SendLog, TheServerRefusesWhatIsNoEntry) {
         return json_text::ErrorCode(reply);
     };
     Json::Value entry;
-    entry["happen_time"] = 1;
-    entry["level"] = "err";
-    entry["username"] = "[h]";
-    entry["log"]["enu"] = "text";
+    json_text::FromString(
+        R"({"happen_time":1,"level":"err","username":"[h]","log":{"enu":"text"}})", entry);
     EXPECT_EQ(push(entry), 0);
     const std::pair<const char *, Json::Value> rows[] = {
         {"happen_time", 1.0}, {"happen_time", "1"},

@@ -1,7 +1,5 @@
 // The server credential's five functions: what they read, write, log and leave behind.
 
-#include <gtest/gtest.h>
-
 #include <new>
 
 #include "guard.h"
@@ -12,6 +10,8 @@
 
 namespace {
 
+using json_text::ToLogText;
+using testing::PrintToString;
 using torture::Expected;
 
 constexpr const char *kFile = "qrm_server_credential";
@@ -22,14 +22,6 @@ Json::Value Parse(const std::string &strText) {
     Json::Value value;
     EXPECT_TRUE(json_text::FromString(strText, value)) << strText;
     return value;
-}
-
-std::string Text(const Json::Value &value) {
-    return json_text::ToLogText(value);
-}
-
-std::string Bool(bool bl) {
-    return bl ? "true" : "false";
 }
 
 std::string State() {
@@ -59,7 +51,7 @@ TEST(ServerCredential, CreateSurvivesEveryFailingCall) {
     torture::Run({"create",
                   kFile,
                   stored::Clear,
-                  [] { return Bool(ZELOQRMClientCreateServerCredential(Parse(kCred))); },
+                  [] { return PrintToString(ZELOQRMClientCreateServerCredential(Parse(kCred))); },
                   State,
                   done,
                   {{"ZELOCredAlloc", nothing},
@@ -86,7 +78,7 @@ TEST(ServerCredential, DeleteSurvivesEveryFailingCall) {
              stored::AddSession(stored::AddCredential("ZELO.NotificationCenter", "center"), "t",
                                 "c");
          },
-         [] { return Bool(ZELOQRMClientDeleteServerCredential()); },
+         [] { return PrintToString(ZELOQRMClientDeleteServerCredential()); },
          [] { return State() + " | " + stored::Describe("ZELO.NotificationCenter"); },
          {"true", "", " | "},
          {{"ZELOCredIDGetByApplication", {"true", "", strQrm + strTokens + " | "}},
@@ -107,7 +99,7 @@ TEST(ServerCredential, BothGettersSurviveEveryFailingCall) {
     const auto without = [&](const char *szMember) {
         Json::Value read = all;
         read.removeMember(szMember);
-        return Expected{"true " + Text(read), "", strKept};
+        return Expected{"true " + ToLogText(read), "", strKept};
     };
     const auto run = [&](bool (*pfnGet)(Json::Value &), const std::vector<torture::Step> &more) {
         std::vector<torture::Step> steps = {
@@ -120,14 +112,14 @@ TEST(ServerCredential, BothGettersSurviveEveryFailingCall) {
         const auto get = [pfnGet] {
             Json::Value out = Parse(R"({"own":1})");
             const bool blDone = pfnGet(out);
-            return Bool(blDone) + ' ' + Text(out);
+            return PrintToString(blDone) + ' ' + ToLogText(out);
         };
         torture::Run({"get", kFile, [] {}, get, State, without(""), steps});
     };
     run(ZELOQRMClientGetServerCredential, {});
 
     all["application"] = "ZELO.QRM";
-    const std::string strFailed = "false " + Text(all);
+    const std::string strFailed = "false " + ToLogText(all);
     all["access_token"] = "t";
     all["csrf_token"] = "c";
     const std::string strNoSession = "cannot find qrm server session[" +
@@ -151,7 +143,7 @@ TEST(ServerCredential, UpdateSurvivesEveryFailingCall) {
              Json::Value cred = Parse(
                  R"({"application":"ZELO.QRM","protocol":"http","host":"new","port":8e1,)"
                  R"("sn":"S","access_token":"u","csrf_token":"ignored","extra_info":"ignored"})");
-             return Bool(ZELOQRMClientUpdateServerCredential(cred));
+             return PrintToString(ZELOQRMClientUpdateServerCredential(cred));
          },
          State,
          {"true", "", R"(http://new:80 {"a":1,"sn":"S"} token=u csrf=c)"},
@@ -181,7 +173,7 @@ TEST(ServerCredential, ReadsEachResultInItsOwnSense) {
     for (const char *szGetter : {"ZELOCredItemGetHost", "ZELOCredItemGetPort"}) {
         Json::Value out;
         seam::Observe({szGetter, 1, true, 1}, [&] { ZELOQRMClientGetServerCredential(out); });
-        EXPECT_EQ(out.size(), 2U) << szGetter << ' ' << Text(out);
+        EXPECT_EQ(out.size(), 2U) << szGetter << ' ' << ToLogText(out);
     }
 }
 
@@ -192,11 +184,7 @@ TEST(ServerCredential, BadInputIsRefusedAndStoresNothing) {
         cred[szMember] = value;
         return cred;
     };
-    struct Row {
-        Json::Value cred;
-        const char *szLog;
-    };
-    std::vector<Row> rows = {
+    std::vector<std::pair<Json::Value, const char *>> rows = {
         {Json::Value(), "Bad parameters"},
         {Json::Value("text"), "Bad parameters"},
         {Parse("[1]"), "Bad parameters"},
@@ -213,13 +201,13 @@ TEST(ServerCredential, BadInputIsRefusedAndStoresNothing) {
     };
     for (const char *szMember : {"protocol", "host", "port", "application", "access_token"}) {
         rows.push_back({Parse(kCred), "Bad parameters"});
-        rows.back().cred.removeMember(szMember);
+        rows.back().first.removeMember(szMember);
     }
     for (const auto &row : rows) {
         stored::Clear();
         EXPECT_EQ(
-            seam::MessagesOf([&] { EXPECT_FALSE(ZELOQRMClientCreateServerCredential(row.cred)); }),
-            row.szLog);
+            seam::MessagesOf([&] { EXPECT_FALSE(ZELOQRMClientCreateServerCredential(row.first)); }),
+            row.second);
         EXPECT_EQ(State(), "");
     }
     for (Json::Value cred : {Json::Value("x"), Parse("[]"), Parse("{}"),
@@ -242,11 +230,7 @@ TEST(ServerCredential, BadInputIsRefusedAndStoresNothing) {
 }
 
 TEST(ServerCredential, ExtraInfoKeepsWhatItCannotRead) {
-    const struct {
-        const char *szExtraInfo;
-        const char *szAfterUpdate;
-        const char *szSn;
-    } rows[] = {
+    const std::tuple<const char *, const char *, const char *> rows[] = {
         {nullptr, "?", "null"},
         {"", "", "null"},
         {"null", R"({"sn":"S"})", R"("S")"},
@@ -254,14 +238,14 @@ TEST(ServerCredential, ExtraInfoKeepsWhatItCannotRead) {
         {"no json", "no json", "null"},
         {R"({"other":{"x":1}})", R"({"other":{"x":1},"sn":"S"})", R"("S")"},
     };
-    for (const auto &row : rows) {
-        AddServer(row.szExtraInfo);
+    for (const auto &[szExtraInfo, szAfterUpdate, szSn] : rows) {
+        AddServer(szExtraInfo);
         Json::Value cred = Parse(R"({"application":"ZELO.QRM","sn":"S"})");
         EXPECT_TRUE(ZELOQRMClientUpdateServerCredential(cred));
-        EXPECT_EQ(State(), std::string("https://qrm:443 ") + row.szAfterUpdate + " token=t csrf=c");
+        EXPECT_EQ(State(), std::string("https://qrm:443 ") + szAfterUpdate + " token=t csrf=c");
         Json::Value out;
         EXPECT_TRUE(ZELOQRMClientGetServerCredential(out));
-        EXPECT_EQ(Text(out["sn"]), row.szSn);
+        EXPECT_EQ(ToLogText(out["sn"]), szSn);
     }
 }
 
@@ -280,11 +264,11 @@ TEST(ServerCredential, TokensAreReadAsTheyAreStored) {
     const long id = stored::AddCredential("ZELO.QRM", "qrm");
     Json::Value out;
     EXPECT_FALSE(ZELOQRMClientGetServerCredentialWithToken(out));
-    EXPECT_EQ(Text(out),
+    EXPECT_EQ(ToLogText(out),
               R"({"application":"ZELO.QRM","host":"qrm","port":443,"protocol":"https"})");
     stored::AddSession(id, "", "");
     EXPECT_TRUE(ZELOQRMClientGetServerCredentialWithToken(out));
-    EXPECT_EQ(Text(out["access_token"]), R"("")");
+    EXPECT_EQ(ToLogText(out["access_token"]), R"("")");
     EXPECT_FALSE(out.isMember("csrf_token"));
     stored::AddSession(id, std::string(1500, 'x').c_str());
     EXPECT_TRUE(ZELOQRMClientGetServerCredentialWithToken(out));

@@ -4,25 +4,22 @@
 
 #include <gtest/gtest.h>
 
-#include <filesystem>
-#include <fstream>
-
+#include "failures.h"
 #include "files.h"
-#include "last_error.h"
 
 namespace {
 
-namespace fs = std::filesystem;
+using namespace files;
 
 constexpr const char *kRuns = "/tmp/runs";
 
 void AddService(const std::string &strName, const std::string &strStatus, mode_t mode = 0755) {
-    files::WriteProgram("/usr/zelo/etc/service.d/8/" + strName,
-                        "echo \"$(basename \"$0\") $*\" >>/tmp/runs\nexit " + strStatus, mode);
+    WriteProgram("/usr/zelo/etc/service.d/8/" + strName,
+                 "echo \"$(basename \"$0\") $*\" >>/tmp/runs\nexit " + strStatus, mode);
 }
 
 std::string Runs() {
-    std::string strRuns = files::FileText(kRuns);
+    std::string strRuns = FileText(kRuns);
     fs::remove(kRuns);
     return strRuns;
 }
@@ -41,14 +38,12 @@ TEST(Service, AllProgramsOfTheTypeRunInTheOrderOfTheirNames) {
 
     AddService("15-fails", "3");
     AddService("17-open", "0", 0757);
-    EXPECT_LT(YLIBServiceTypeReload(YLIB_SERVICE_TYPE_USERS), 0);
-    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_EXEC_STATUS));
+    EXPECT_EQ(FailureOf(YLIBServiceTypeReload(YLIB_SERVICE_TYPE_USERS)), YLIBC_ERR_EXEC_STATUS);
     EXPECT_EQ(Runs(), "10-first reload\n15-fails reload\n20-second reload\n");
 
     // Whoever can write to a folder can put any program there.
     chmod("/usr/zelo/etc/service.d", 0777);
-    EXPECT_LT(YLIBServiceTypeReload(YLIB_SERVICE_TYPE_USERS), 0);
-    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_UNSAFE_FILE));
+    EXPECT_EQ(FailureOf(YLIBServiceTypeReload(YLIB_SERVICE_TYPE_USERS)), YLIBC_ERR_UNSAFE_FILE);
     EXPECT_EQ(Runs(), "");
 }
 

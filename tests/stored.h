@@ -13,6 +13,8 @@ namespace stored {
 constexpr const char *kFolder = "/usr/zelo/etc/credentials";
 constexpr const char *kDatabase = "/usr/zelo/etc/credentials/credentials.db";
 
+using Session = std::unique_ptr<ZELO_CRED_SESS, decltype(&ZELOCredSessFree)>;
+
 // Empties the store.
 inline void Clear() {
     for (const char *szApplication : {"ZELO.QRM", "ZELO.NotificationCenter", "Other"}) {
@@ -42,9 +44,15 @@ inline long AddCredential(const char *szApplication, const char *szHost,
     return id;
 }
 
+inline int Count(const char *szApplication = "ZELO.QRM") {
+    ZELO_CRED *pList = nullptr;
+    const int count = ZELOCredListGet(&pList, ZELOCredKeepByApplication, szApplication);
+    ZELOCredListFree(&pList);
+    return count;
+}
+
 inline void AddSession(long id, const char *szToken, const char *szCsrf = nullptr) {
-    const std::unique_ptr<ZELO_CRED_SESS, void (*)(ZELO_CRED_SESS *)> pSess(ZELOCredSessAlloc(),
-                                                                            ZELOCredSessFree);
+    const Session pSess(ZELOCredSessAlloc(), ZELOCredSessFree);
     ZELOCredSessItemSetID(pSess.get(), id);
     ZELOCredSessItemSetAccessToken(pSess.get(), szToken);
     if (szCsrf != nullptr) {
@@ -68,8 +76,7 @@ inline std::string Describe(const char *szApplication = "ZELO.QRM") {
     std::string strAll = text(ZELOCredItemGetProtocol(sz, sizeof(sz), pCred.get())) + "://";
     strAll += text(ZELOCredItemGetHost(sz, sizeof(sz), pCred.get())) + ':' + std::to_string(port);
     strAll += ' ' + text(ZELOCredItemGetExtraInfo(sz, sizeof(sz), pCred.get()));
-    const std::unique_ptr<ZELO_CRED_SESS, void (*)(ZELO_CRED_SESS *)> pSess(ZELOCredSessAlloc(),
-                                                                            ZELOCredSessFree);
+    const Session pSess(ZELOCredSessAlloc(), ZELOCredSessFree);
     if (ZELOCredSessLoad(id, pSess.get()) < 0) {
         return strAll;
     }

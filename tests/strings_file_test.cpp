@@ -4,33 +4,27 @@
 
 #include <fcntl.h>
 #include <gtest/gtest.h>
-#include <sys/stat.h>
-#include <unistd.h>
 
 #include <atomic>
 #include <ctime>
-#include <filesystem>
-#include <fstream>
+#include <map>
 #include <random>
-#include <sstream>
 #include <thread>
 #include <vector>
 
 #include "children.h"
-#include "last_error.h"
+#include "failures.h"
+#include "files.h"
 
 namespace {
 
+using namespace files;
+
 constexpr const char *kFile = "/tmp/strings";
 
-// In place: the file stays the same one.
-void Write(const std::string &strText, const char *szPath = kFile) {
-    std::ofstream(szPath, std::ios::binary | std::ios::trunc) << strText;
-}
-
 void Replace(const std::string &strText) {
-    Write(strText, "/tmp/strings.new");
-    std::filesystem::rename("/tmp/strings.new", kFile);
+    WriteFile("/tmp/strings.new", strText);
+    fs::rename("/tmp/strings.new", kFile);
 }
 
 // The value, or "-" and the code of the failure.
@@ -47,8 +41,7 @@ const std::string kNotFound = "-" + std::to_string(YLIBC_ERR_NOT_FOUND);
 
 // Until the system tells the file's last change from a change made now, nothing is kept of it.
 void AwaitAge() {
-    struct stat status = {};
-    ASSERT_EQ(stat(kFile, &status), 0);
+    const struct stat status = Status(kFile);
     timespec now = {};
     do {
         clock_gettime(CLOCK_REALTIME, &now);
@@ -80,11 +73,7 @@ TEST(StringsFile, ReadsEveryFormOfALine) {
         "plain=\"too late\"\n"
         "more=\"second section\"\n"
         "last=\"no line feed\"");
-    const struct {
-        const char *szSection;
-        const char *szKey;
-        std::string strValue;
-    } rows[] = {
+    const std::tuple<const char *, const char *, std::string> rows[] = {
         {"one", "plain", "text"},
         {"one", "spaced", " a b "},
         {"one", "utf8", "Größe ≥ 1 [x]"},
@@ -111,9 +100,8 @@ TEST(StringsFile, ReadsEveryFormOfALine) {
         {"on", "plain", kNotFound},
     };
     for (const bool blKept : {false, true}) {
-        for (const auto &row : rows) {
-            EXPECT_EQ(Get(row.szSection, row.szKey), row.strValue)
-                << row.szSection << ":" << row.szKey << blKept;
+        for (const auto &[szSection, szKey, strValue] : rows) {
+            EXPECT_EQ(Get(szSection, szKey), strValue) << szSection << ":" << szKey << blKept;
         }
         AwaitAge();
     }
@@ -132,10 +120,10 @@ TEST(StringsFile, CutsBetweenCharactersAndRefusesWhatItCannotUse) {
     mkfifo("/tmp/fifo", 0600);
     for (const char *szPath : {"/tmp/fifo", "/tmp", "/tmp/none", "/dev/null"}) {
         EXPECT_LT(YLIBCFileGetSectionValue(szPath, "s", "k", sz, 8), 0) << szPath;
-        EXPECT_EQ(YLIBCErrGet() == YLIBC_ERR_NOT_FOUND, !std::filesystem::exists(szPath));
+        EXPECT_EQ(YLIBCErrGet() == YLIBC_ERR_NOT_FOUND, !fs::exists(szPath));
     }
-    EXPECT_LT(YLIBCFileGetSectionValue(kFile, "s", nullptr, sz, 8), 0);
-    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_INVALID_ARGUMENT));
+    EXPECT_EQ(FailureOf(YLIBCFileGetSectionValue(kFile, "s", nullptr, sz, 8)),
+              YLIBC_ERR_INVALID_ARGUMENT);
     EXPECT_LT(YLIBCFileGetSectionValue(kFile, "s", "k", sz, 0), 0);
     EXPECT_STREQ(sz, "before");
 }
@@ -145,17 +133,16 @@ TEST(StringsFile, SeesEveryChangeAtOnce) {
                                        "[b]\nk=\"2\"\n[a]\nk=\"2\"\n"};
     // Changes of the same size, faster than the file's times advance.
     for (int i = 0; i < 300; ++i) {
-        Write(strSections[i % 2]);
+        WriteFile(kFile, strSections[i % 2]);
         ASSERT_EQ(Get("a", "k"), i % 2 == 0 ? "1" : "2");
     }
     // Of the same size, and with the former time of modification, after the file has been kept.
     for (const bool blInPlace : {true, false}) {
-        Write(strSections[0]);
+        WriteFile(kFile, strSections[0]);
         AwaitAge();
         ASSERT_EQ(Get("a", "k"), "1");
-        struct stat status = {};
-        stat(kFile, &status);
-        blInPlace ? Write(strSections[1]) : Replace(strSections[1]);
+        const struct stat status = Status(kFile);
+        blInPlace ? WriteFile(kFile, strSections[1]) : Replace(strSections[1]);
         const timespec times[] = {status.st_atim, status.st_mtim};
         utimensat(AT_FDCWD, kFile, times, 0);
         EXPECT_EQ(Get("a", "k"), "2");
@@ -163,32 +150,17 @@ TEST(StringsFile, SeesEveryChangeAtOnce) {
     // Another file in place of one that goes on under another name.
     ASSERT_EQ(Get("a", "k"), "2");
     const std::string strFormer = std::string(kFile) + ".former";
-    std::filesystem::rename(kFile, strFormer);
-    Write(strSections[0]);
+    fs::rename(kFile, strFormer);
+    WriteFile(kFile, strSections[0]);
     EXPECT_EQ(Get("a", "k"), "1");
-    std::filesystem::rename(strFormer, kFile);
+    fs::rename(strFormer, kFile);
     AwaitAge();
     EXPECT_EQ(Get("a", "k"), "2");
-    std::filesystem::resize_file(kFile, 11);
+    fs::resize_file(kFile, 11);
     EXPECT_EQ(Get("a", "k"), kNotFound);
     EXPECT_EQ(Get("b", "k"), "2");
-    std::filesystem::remove(kFile);
+    fs::remove(kFile);
     EXPECT_EQ(Get("b", "k"), kNotFound);
-}
-
-// The meaning of a file of plain lines, without any haste.
-std::string Meaning(const std::string &strText, const std::string &strSection,
-                    const std::string &strKey) {
-    std::istringstream lines(strText);
-    bool blOurs = false;
-    for (std::string strLine; std::getline(lines, strLine);) {
-        if (strLine.front() == '[') {
-            blOurs = strLine == "[" + strSection + "]";
-        } else if (blOurs && strLine.rfind(strKey + "=\"", 0) == 0) {
-            return strLine.substr(strKey.size() + 2, strLine.size() - strKey.size() - 3);
-        }
-    }
-    return kNotFound;
 }
 
 TEST(StringsFile, AnswersAlikeHoweverManySectionsThereAre) {
@@ -196,11 +168,16 @@ TEST(StringsFile, AnswersAlikeHoweverManySectionsThereAre) {
     // Few sections with long lines between them, some that come twice, more than are kept.
     for (const unsigned sections : {5U, 300U, 20000U}) {
         std::string strText;
+        std::map<std::string, std::string> values;  // of each key the first
         for (unsigned i = 0; i < sections; ++i) {
-            strText += "[s" + std::to_string(random() % sections) + "]\n";
+            const std::string strSection = "s" + std::to_string(random() % sections);
+            strText += '[' + strSection + "]\n";
             for (unsigned n = random() % 4; n > 0; --n) {
-                strText += "k" + std::to_string(random() % 4) + "=\"" + std::to_string(random()) +
-                           "\"\n#" + std::string(random() % (200000 / sections), '[') + "\n";
+                const std::string strKey = "k" + std::to_string(random() % 4);
+                const std::string strValue = std::to_string(random());
+                values.emplace(strSection + strKey, strValue);
+                strText.append(strKey).append("=\"").append(strValue).append("\"\n#");
+                strText += std::string(random() % (200000 / sections), '[') + "\n";
             }
         }
         Replace(strText);
@@ -208,7 +185,8 @@ TEST(StringsFile, AnswersAlikeHoweverManySectionsThereAre) {
             for (int i = 0; i < 25; ++i) {
                 const std::string strSection = "s" + std::to_string(random() % (sections + 1));
                 const std::string strKey = "k" + std::to_string(random() % 4);
-                ASSERT_EQ(Get(strSection, strKey), Meaning(strText, strSection, strKey))
+                values.emplace(strSection + strKey, kNotFound);
+                ASSERT_EQ(Get(strSection, strKey), values[strSection + strKey])
                     << sections << strSection << strKey << blKept;
             }
             AwaitAge();
@@ -236,7 +214,8 @@ TEST(StringsFile, IsSafeWhileTheFileIsCutShortAndProcessesFork) {
         });
     }
     for (int i = 0; i < 150 || found < 300; ++i) {
-        i % 3 == 0 ? Replace(strText) : Write(strText.substr(0, strText.size() * (i % 3) / 2));
+        i % 3 == 0 ? Replace(strText)
+                   : WriteFile(kFile, strText.substr(0, strText.size() * (i % 3) / 2));
     }
     Replace(strText);
     AwaitAge();

@@ -57,30 +57,25 @@ TEST(SzHash, KeepsTheOrderOfItsKeys) {
 }
 
 TEST(Text, SplitsAtTheWholeDelimiter) {
-    const struct {
-        const char *szText;
-        const char *szDelimiter;
-        std::vector<std::string> pieces;
-    } rows[] = {
+    const std::tuple<const char *, const char *, std::vector<std::string>> rows[] = {
         {"enu,ger", ",", {"enu", "ger"}}, {",a,,b,", ",", {"", "a", "", "b", ""}},
         {"a::b:c", "::", {"a", "b:c"}},   {"no", ",", {"no"}},
         {":::", "::", {"", ":"}},         {"", ",", {}},
     };
-    for (const auto &row : rows) {
+    for (const auto &[szText, szDelimiter, pieces] : rows) {
         YLIBSZLIST *pslList = YLIBCSzListAlloc(512);
-        EXPECT_EQ(YLIBCStrTok(row.szText, row.szDelimiter, &pslList),
-                  static_cast<int>(row.pieces.size()));
-        EXPECT_EQ(Texts(pslList), row.pieces) << row.szText;
+        EXPECT_EQ(YLIBCStrTok(szText, szDelimiter, &pslList), static_cast<int>(pieces.size()));
+        EXPECT_EQ(Texts(pslList), pieces) << szText;
         YLIBCSzListFree(pslList);
 
-        std::string strText = row.szText;
+        std::string strText = szText;
         char *szRest = strText.data();
         const std::vector<std::string> one = {""};
-        for (const std::string &strPiece : row.pieces.empty() ? one : row.pieces) {
-            EXPECT_EQ(YLIBCStrTokIndex(&szRest, row.szDelimiter), strPiece) << row.szText;
+        for (const std::string &strPiece : pieces.empty() ? one : pieces) {
+            EXPECT_EQ(YLIBCStrTokIndex(&szRest, szDelimiter), strPiece) << szText;
         }
         EXPECT_EQ(szRest, nullptr);
-        EXPECT_EQ(YLIBCStrTokIndex(&szRest, row.szDelimiter), nullptr);
+        EXPECT_EQ(YLIBCStrTokIndex(&szRest, szDelimiter), nullptr);
     }
 }
 

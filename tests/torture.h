@@ -5,8 +5,6 @@
 #define ZELO_TESTS_TORTURE_H
 
 #include <gtest/gtest.h>
-#include <sys/wait.h>
-#include <unistd.h>
 
 #include <cstdio>
 #include <functional>
@@ -16,6 +14,7 @@
 #include <string>
 #include <vector>
 
+#include "children.h"
 #include "seam.h"
 
 namespace torture {
@@ -60,16 +59,11 @@ inline void Separately(bool blInChild, const std::function<void()> &body) {
         return;
     }
     std::fflush(nullptr);
-    const pid_t pid = fork();
-    ASSERT_GE(pid, 0);
-    if (pid == 0) {
+    EXPECT_TRUE(children::InOne([&] {
         body();
         std::fflush(nullptr);
-        _exit(testing::Test::HasFailure() ? 1 : 0);
-    }
-    int status = -1;
-    waitpid(pid, &status, 0);
-    EXPECT_EQ(status, 0) << "in the child process; see above";
+        return !testing::Test::HasFailure();
+    })) << "in the child process; see above";
 }
 
 inline void Check(const Case &test, const seam::Outcome &outcome, const std::string &strResult,

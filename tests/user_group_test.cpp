@@ -7,15 +7,13 @@
 #include <algorithm>
 #include <atomic>
 #include <ctime>
-#include <filesystem>
-#include <fstream>
 #include <functional>
 #include <thread>
 
 #include "accounts.h"
 #include "children.h"
+#include "failures.h"
 #include "key_value_file.h"
-#include "last_error.h"
 
 namespace {
 
@@ -37,13 +35,11 @@ std::time_t time(std::time_t *pTime) noexcept {
 
 namespace {
 
-namespace fs = std::filesystem;
+using namespace files;
 using namespace accounts;
-using files::FileMode;
 
 constexpr const char *kName = "ZelonixQRM";
 constexpr const char *kHome = "/var/services/homes/ZelonixQRM";
-constexpr const char *kConfig = "/etc/zeloinfo.conf";
 const std::string kPassword = std::string(100, 'p') + '1';
 
 User NewUser(const std::string &strName, uid_t uid, const std::string &strPassword = kPassword,
@@ -161,11 +157,8 @@ TEST_F(UserGroup, OnlyMembersAreAdministrators) {
 }
 
 TEST_F(UserGroup, OnlyTheDifferenceToWhatWasReadIsWritten) {
-    const struct {
-        Names now;  // what others have made of {a, b, c} since it was read
-        Names set;
-        Names after;
-    } rows[] = {
+    // First, what others have made of {a, b, c} since it was read.
+    const std::tuple<Names, Names, Names> rows[] = {
         {{"a", "b", "c"}, {"c", "x", "a"}, {"c", "x", "a"}},
         {{"a", "b", "c", "new"}, {"a", "b", "c", "x"}, {"a", "b", "c", "new", "x"}},
         {{"b", "c"}, {"a", "b", "c", "x"}, {"b", "c", "x"}},
@@ -173,17 +166,16 @@ TEST_F(UserGroup, OnlyTheDifferenceToWhatWasReadIsWritten) {
         {{"x"}, {"a", "b", "c", "x"}, {"x"}},
         {{"new"}, {"a", "b", "c"}, {"new"}},
     };
-    for (const auto &row : rows) {
+    for (const auto &[now, set, after] : rows) {
         EXPECT_EQ(SetMembers({"a", "b", "c"}), 0);
         const Group pGroup = Administrators();
-        EXPECT_EQ(SetMembers(row.now), 0);
-        EXPECT_EQ(SetMembers(row.set, pGroup), 0);
-        EXPECT_EQ(Members(), row.after);
+        EXPECT_EQ(SetMembers(now), 0);
+        EXPECT_EQ(SetMembers(set, pGroup), 0);
+        EXPECT_EQ(Members(), after);
         EXPECT_EQ(SetMembers({"a", "b", "c"}, pGroup), 0);
-        EXPECT_EQ(SetMembers(row.set, pGroup), 0) << "what was set counts as read";
+        EXPECT_EQ(SetMembers(set, pGroup), 0) << "what was set counts as read";
         const Names again = Members();
-        EXPECT_TRUE(
-            std::is_permutation(row.after.begin(), row.after.end(), again.begin(), again.end()));
+        EXPECT_TRUE(std::is_permutation(after.begin(), after.end(), again.begin(), again.end()));
     }
     const Group pOwn(new ZELO_GROUP(), ZELOGroupFree);
     EXPECT_EQ(SetMembers({"b"}, pOwn), 0);
@@ -205,7 +197,7 @@ TEST_F(UserGroup, WhatCannotBeReadIsNotTakenForMissing) {
             blFolder ? fs::create_directory(szFile) : fs::remove(szFile);
             for (const auto &lookUp : lookUps) {
                 YLIBCErrSetEx(YLIBC_ERR_NOT_FOUND, "", 0);
-                failed += lookUp() < 0 && YLIBCErrGet() == YLIBC_ERR_FILE ? 1 : 0;
+                failed += FailureOf(lookUp()) == YLIBC_ERR_FILE ? 1 : 0;
             }
             // Of a setting that the missing file does not hold there is nothing to clear.
             EXPECT_EQ(failed, szFile == kConfig ? blFolder : 2) << szFile;
@@ -222,7 +214,7 @@ TEST_F(UserGroup, APasswordThatIsSetWithoutAClockNeedNotBeChanged) {
         EXPECT_EQ(Add(NewUser(kName, 50000)), 0);
         g_now = 0;
         const std::string strLine = PasswordIn("shadow", kName) + (now == 5 ? "::" : ":20000:");
-        EXPECT_TRUE(files::Holds(ReadFiles()["shadow"], ':' + strLine));
+        EXPECT_TRUE(Holds(ReadFiles()["shadow"], ':' + strLine));
         EXPECT_EQ(Delete({kName}), 0);
     }
 }
@@ -230,11 +222,7 @@ TEST_F(UserGroup, APasswordThatIsSetWithoutAClockNeedNotBeChanged) {
 TEST_F(UserGroup, WhatCannotBeStoredIsRefused) {
     ASSERT_EQ(Add(NewUser("present", 1500)), 0);
     const Files before = ReadFiles();
-    const struct {
-        const char *szCurrent;
-        User pUser;
-        unsigned error;
-    } rows[] = {
+    const std::tuple<const char *, User, YLIBC_ERROR> rows[] = {
         {nullptr, NewUser("present", 1501), YLIBC_ERR_EXISTS},
         {nullptr, NewUser("twin", 1500), YLIBC_ERR_EXISTS},
         {nullptr, NewUser("lost", 1501, "", 4711), YLIBC_ERR_NOT_FOUND},
@@ -249,9 +237,9 @@ TEST_F(UserGroup, WhatCannotBeStoredIsRefused) {
         {nullptr, NewUser("a", static_cast<uid_t>(-1)), YLIBC_ERR_INVALID_ARGUMENT},
         {nullptr, User(nullptr, ZELOUserFree), YLIBC_ERR_INVALID_ARGUMENT},
     };
-    for (const auto &row : rows) {
-        EXPECT_LT(ZELOUserSetOne(row.szCurrent, row.pUser.get(), nullptr), 0);
-        EXPECT_EQ(YLIBCErrGet(), row.error) << (row.pUser == nullptr ? "" : row.pUser->szName);
+    for (const auto &[szCurrent, pUser, error] : rows) {
+        EXPECT_EQ(FailureOf(ZELOUserSetOne(szCurrent, pUser.get(), nullptr)), error)
+            << (pUser == nullptr ? "" : pUser->szName);
     }
     EXPECT_EQ(Delete({"present", "root"}), -1);
     EXPECT_EQ(Delete({"present", nullptr}), -1);
@@ -269,8 +257,7 @@ TEST_F(UserGroup, TheNumberOfUsersIsLimited) {
     EXPECT_EQ(YLIBUserNumRemained(), 1);
     EXPECT_EQ(Add(NewUser(kName, 50000)), 0);
     EXPECT_EQ(YLIBUserNumRemained(), 0);
-    EXPECT_LT(Add(NewUser("more", 50001)), 0);
-    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_LIMIT));
+    EXPECT_EQ(FailureOf(Add(NewUser("more", 50001))), YLIBC_ERR_LIMIT);
     EXPECT_EQ(Change(NewUser(kName, 50000)), 0);
     EXPECT_EQ(YLIBCFileSetKeyValue(kConfig, "max_users", "many", 0), 0);
     EXPECT_LT(YLIBUserNumRemained(), 0);

@@ -5,33 +5,26 @@
 #include <poll.h>
 #include <sys/socket.h>
 
-#include <chrono>
 #include <climits>
 #include <cstdlib>
-#include <filesystem>
-#include <fstream>
 #include <memory>
 #include <set>
 
 #include "children.h"
 #include "dev_server_process.h"
+#include "files.h"
 #include "last_error.h"
+#include "run_program.h"
 #include "web_api_request.h"
 
 namespace {
 
+using namespace files;
+
 constexpr const char *kApi = "ZELO.QRM.RPC";
-constexpr const char *kCaFile = "/usr/zelo/etc/ssl/ca.d/server.pem";
 constexpr const char *kOtherCaFile = "/usr/zelo/etc/ssl/ca.d/other.pem";
-constexpr const char *kConfig = "/etc/zeloinfo.conf";
 
 using Cred = std::unique_ptr<ZELO_CRED, void (*)(ZELO_CRED *)>;
-
-void Write(const char *szPath, const std::string &strText) {
-    // A new file each time, as an operator's tool writes it: the folder changes too.
-    std::filesystem::remove(szPath);
-    std::ofstream(szPath) << strText;
-}
 
 Cred ServerAt(const char *szProtocol, int port, const char *szHost = "localhost") {
     Cred pCred(ZELOCredAlloc(), ZELOCredFree);
@@ -45,34 +38,30 @@ std::string PathOf(const char *szProtocol, int port, const char *szHost = "local
     return ZELO::CredRequestUtil::GetWebAPIPath(ServerAt(szProtocol, port, szHost).get(), kApi);
 }
 
-// Waits until the server has ended a connection that this process keeps.
-void AwaitEnd(int port) {
-    const auto end = std::chrono::steady_clock::now() + std::chrono::seconds(10);
-    while (std::chrono::steady_clock::now() < end) {
-        for (int fd = 3; fd < 64; ++fd) {
-            sockaddr_in peer = {};
-            socklen_t cb = sizeof(peer);
-            pollfd look = {fd, POLLIN, 0};
-            if (getpeername(fd, reinterpret_cast<sockaddr *>(&peer), &cb) == 0 &&
-                ntohs(peer.sin_port) == port && poll(&look, 1, 0) == 1) {
-                return;
-            }
+// Whether the server has ended a connection that this process keeps.
+bool HasEnded(int port) {
+    for (int fd = 3; fd < 64; ++fd) {
+        sockaddr_in peer = {};
+        socklen_t cb = sizeof(peer);
+        pollfd look = {fd, POLLIN, 0};
+        if (getpeername(fd, reinterpret_cast<sockaddr *>(&peer), &cb) == 0 &&
+            ntohs(peer.sin_port) == port && poll(&look, 1, 0) == 1) {
+            return true;
         }
     }
-    ADD_FAILURE() << "the server keeps its connections";
+    return false;
 }
 
 class Request : public testing::Test {
   protected:
     void SetUp() override {
         Start(devserver::Options());
-        Write(kCaFile, m_pServer->CaPem());
-        Write(kConfig, "");
+        Replace(kCaFile, m_pServer->CaPem());
+        Replace(kConfig, "");
     }
     void Start(const devserver::Options &options) {
         m_pServer = std::make_unique<DevServerProcess>(options);
-        std::string strReason;
-        ASSERT_TRUE(m_pServer->Start(strReason)) << strReason;
+        m_pServer->Start();
     }
     // The connections that the server saw, without repeating.
     std::set<std::string> Connections() const {
@@ -82,25 +71,20 @@ class Request : public testing::Test {
         }
         return connections;
     }
-    std::string Https() const { return PathOf("https", m_pServer->HttpsPort()); }
-    std::string Http() const { return PathOf("http", m_pServer->HttpPort()); }
+    int Port(const std::string &strProtocol) const {
+        return strProtocol == "https" ? m_pServer->HttpsPort() : m_pServer->HttpPort();
+    }
+    std::string Path(const char *szProtocol) const { return PathOf(szProtocol, Port(szProtocol)); }
+    std::string Https() const { return Path("https"); }
+    std::string Http() const { return Path("http"); }
     // A call that the server answers as it is told to; whether it got a reply.
     bool Call(const char *szProtocol, devserver::NextAnswer answer) {
-        const bool blTls = szProtocol == std::string("https");
-        const Cred pCred =
-            ServerAt(szProtocol, blTls ? m_pServer->HttpsPort() : m_pServer->HttpPort());
+        const Cred pCred = ServerAt(szProtocol, Port(szProtocol));
         ZELO::CredRequest request;
         EXPECT_TRUE(ZELO::CredRequestUtil::SetWebAPIURL(pCred.get(), kApi, 1, "join", &request));
         answer.method = "join";
         m_pServer->AnswerNext(kApi, answer);
         return request.Process(true, 0);
-    }
-    int CountOf(const char *szMethod) const {
-        int count = 0;
-        for (const Json::Value &request : m_pServer->Requests()) {
-            count += request["api_method"] == szMethod ? 1 : 0;
-        }
-        return count;
     }
     void AnswerDiscovery(devserver::NextAnswer answer) {
         answer.method = "discover";
@@ -116,26 +100,22 @@ TEST_F(Request, OnlyAVerifiedServerIsSpokenTo) {
 
     // A child process has to connect anew.
     const auto isTrusted = [&] { return children::InOne([&] { return Https() == "/qrm/rpc"; }); };
-    std::filesystem::remove(kCaFile);
+    fs::remove(kCaFile);
     EXPECT_FALSE(isTrusted());
-    Write(kCaFile, m_pServer->CaPem());
+    Replace(kCaFile, m_pServer->CaPem());
     EXPECT_TRUE(isTrusted());
-    Write(kCaFile, "no certificate");
+    Replace(kCaFile, "no certificate");
     EXPECT_FALSE(isTrusted());
-    Write(kCaFile, m_pServer->CaPem());
-    Write(kOtherCaFile, "no certificate");
+    Replace(kCaFile, m_pServer->CaPem());
+    Replace(kOtherCaFile, "no certificate");
     EXPECT_FALSE(isTrusted());
     EXPECT_EQ(Https(), "/qrm/rpc") << "a connection that is open goes on";
-    std::filesystem::remove(kOtherCaFile);
+    fs::remove(kOtherCaFile);
     EXPECT_TRUE(isTrusted());
 }
 
 TEST_F(Request, OnlyKnownProtocolsAndPlainHostsAreUsed) {
-    const struct {
-        const char *szProtocol;
-        const char *szHost;
-        bool blAnswers;
-    } rows[] = {
+    const std::tuple<const char *, const char *, bool> rows[] = {
         {"http", "localhost", true},       {"ftp", "localhost", false},
         {"file", "localhost", false},      {"HTTP", "localhost", false},
         {"", "localhost", false},          {"http", "", false},
@@ -143,17 +123,14 @@ TEST_F(Request, OnlyKnownProtocolsAndPlainHostsAreUsed) {
         {"http", "localhost?x", false},    {"http", "localhost\r\nX: y", false},
         {"http", "localhost:80", false},   {"fld", "localhost", false},
     };
-    for (const auto &row : rows) {
-        EXPECT_EQ(!PathOf(row.szProtocol, m_pServer->HttpPort(), row.szHost).empty(), row.blAnswers)
-            << row.szProtocol << ' ' << row.szHost;
+    for (const auto &[szProtocol, szHost, blAnswers] : rows) {
+        EXPECT_EQ(!PathOf(szProtocol, m_pServer->HttpPort(), szHost).empty(), blAnswers)
+            << szProtocol << ' ' << szHost;
     }
     EXPECT_EQ(PathOf("http", 0), "");
     EXPECT_EQ(PathOf("http", 65536), "");
-    for (int port : {-1, 65536}) {
-        EXPECT_FALSE(ZELO::APIValidator::IsPort(port));
-    }
-    for (int port : {0, 65535}) {
-        EXPECT_TRUE(ZELO::APIValidator::IsPort(port));
+    for (int port : {-1, 0, 65535, 65536}) {
+        EXPECT_EQ(ZELO::APIValidator::IsPort(port), port == 0 || port == 65535) << port;
     }
 }
 
@@ -164,7 +141,7 @@ TEST_F(Request, AnAddressOfIPv6IsAHostToo) {
     devserver::Options options;
     options.host = "::1";
     Start(options);
-    Write(kCaFile, m_pServer->CaPem());
+    Replace(kCaFile, m_pServer->CaPem());
     for (const char *szHost : {"::1", "[::1]"}) {
         EXPECT_EQ(PathOf("https", m_pServer->HttpsPort(), szHost), "/qrm/rpc") << szHost;
         ZELO::CredRequest request;
@@ -180,15 +157,15 @@ TEST_F(Request, ProxyVariablesCountOnlyWhereTheConfigurationSaysSo) {
     for (const char *szName :
          {"http_proxy", "https_proxy", "HTTPS_PROXY", "all_proxy", "ALL_PROXY"}) {
         SCOPED_TRACE(szName);
-        const bool blPlain = szName == std::string("http_proxy");
+        const char *szProtocol = szName == std::string("http_proxy") ? "http" : "https";
         setenv(szName, "http://127.0.0.1:1", 1);
-        Write(kConfig, "use_proxy_environment=no\n");
-        EXPECT_EQ(blPlain ? Http() : Https(), "/qrm/rpc");
-        Write(kConfig, "use_proxy_environment=yes\n");
-        EXPECT_EQ(blPlain ? Http() : Https(), "");
+        Replace(kConfig, "use_proxy_environment=no\n");
+        EXPECT_EQ(Path(szProtocol), "/qrm/rpc");
+        Replace(kConfig, "use_proxy_environment=yes\n");
+        EXPECT_EQ(Path(szProtocol), "");
         unsetenv(szName);
     }
-    Write(kConfig, "farlink_relay=\"127.0.0.1:1\"\n");
+    Replace(kConfig, "farlink_relay=\"127.0.0.1:1\"\n");
     EXPECT_EQ(PathOf("fld", m_pServer->HttpsPort()), "");
 }
 
@@ -252,19 +229,18 @@ TEST_F(Request, ACallIsSentOnceAndSurvivesEveryIdlePause) {
     constexpr int kPauses = 8;  // libcurl's own count of repetitions ends before
     for (const char *szProtocol : {"https", "http"}) {
         SCOPED_TRACE(szProtocol);
-        const bool blTls = szProtocol == std::string("https");
         for (int i = 0; i < kPauses; ++i) {
             EXPECT_TRUE(Call(szProtocol, closes));
-            AwaitEnd(blTls ? m_pServer->HttpsPort() : m_pServer->HttpPort());
+            EXPECT_TRUE(run_program::Until([&] { return HasEnded(Port(szProtocol)); }));
         }
-        EXPECT_EQ(blTls ? Https() : Http(), "/qrm/rpc");
+        EXPECT_EQ(Path(szProtocol), "/qrm/rpc");
         for (int i = 0; i < kPauses; ++i) {
             AnswerDiscovery(drops);
-            EXPECT_EQ(blTls ? Https() : Http(), "/qrm/rpc") << "only a question, asked again";
+            EXPECT_EQ(Path(szProtocol), "/qrm/rpc") << "only a question, asked again";
         }
         m_pServer->ForgetRequests();
         EXPECT_FALSE(Call(szProtocol, drops));
-        EXPECT_EQ(CountOf("join"), 1);
+        EXPECT_EQ(m_pServer->Requests().size(), 1U);
     }
 }
 
@@ -280,15 +256,10 @@ TEST_F(Request, ConnectionsAreUsedAgainButNotByAChild) {
 }
 
 TEST_F(Request, PathsAreLearntOnceAndForgottenWhenTheyAreGone) {
-    const Cred pCred = ServerAt("http", m_pServer->HttpPort());
     const auto call = [&](int status) {
-        ZELO::CredRequest request;
-        EXPECT_TRUE(ZELO::CredRequestUtil::SetWebAPIURL(pCred.get(), kApi, 1, "join", &request));
         devserver::NextAnswer answer;
-        answer.method = "join";
         answer.status = status;
-        m_pServer->AnswerNext(kApi, answer);
-        EXPECT_TRUE(request.Process(true, 0));
+        EXPECT_TRUE(Call("http", answer));
     };
     call(200);
     call(404);

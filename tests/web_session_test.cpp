@@ -2,15 +2,13 @@
 
 #include <gtest/gtest.h>
 
-#include <filesystem>
-
 #include "files.h"
 #include "last_error.h"
 #include "web_session.h"
 
 namespace {
 
-namespace fs = std::filesystem;
+using namespace files;
 
 constexpr const char *kFolder = "/usr/zelo/etc/sessions";
 constexpr const char *kDatabase = "/usr/zelo/etc/sessions/sessions.db";
@@ -67,11 +65,11 @@ TEST_F(WebSession, IsKnownByItsIndexAndItsWholeName) {
 TEST_F(WebSession, ADamagedFileIsLeftAsItIs) {
     const std::string strContent = "no database, but text";
     fs::create_directory(kFolder);
-    files::WriteFile(kDatabase, strContent);
+    WriteFile(kDatabase, strContent);
     ZELO_CGI_CONTEXT other = {};
     EXPECT_EQ(ZeloCgiInit("", &other), 0);
     EXPECT_FALSE(Exists(13, kClient) || Add(13, kClient) || Remove(13, kClient));
-    EXPECT_EQ(files::FileText(kDatabase), strContent);
+    EXPECT_EQ(FileText(kDatabase), strContent);
 }
 
 }  // namespace

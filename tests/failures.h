@@ -1,0 +1,13 @@
+// Why a call of the platform has failed.
+
+#ifndef ZELO_TESTS_FAILURES_H
+#define ZELO_TESTS_FAILURES_H
+
+#include "last_error.h"
+
+// Of the call that has just given the result; YLIBC_ERR_NONE when it has not failed.
+inline YLIBC_ERROR FailureOf(long result) {
+    return result < 0 ? static_cast<YLIBC_ERROR>(YLIBCErrGet()) : YLIBC_ERR_NONE;
+}
+
+#endif
