@@ -114,7 +114,7 @@ TEST_F(Membership, TheFirstRuleThatHoldsDecidesAndTheExplanationAgrees) {
         membership::Daemon(isThere(2) ? "start" : "stop");
         accounts::WriteFiles(account == 0 ? s_without : account == 1 ? s_with : WithoutMember());
         stored::Clear();
-        for (int i : {0, 1}) {
+        for (int i = 0; i < 2; ++i) {
             if (isThere(i)) {
                 stored::AddCredential(membership::kApplications[i], "h");
             }
