@@ -73,9 +73,9 @@ void AddColdCallRow() {
 }
 
 void AddCallRows() {
-    AddRow({"ZELOQRMClientSendWebapi, warm", "bare libcurl exchange", 1.10,
+    AddRow({"ZELOQRMClientSendWebapi, warm", "bare libcurl exchange", 1.25,
             [] { return WarmPair(true); }, ""});
-    AddRow({"ZELOQRMClientSendWebapi, useCache false", "bare libcurl exchange", 1.25,
+    AddRow({"ZELOQRMClientSendWebapi, useCache false", "bare libcurl exchange", 1.60,
             [] { return WarmPair(false); }, ""});
 }
 

@@ -39,7 +39,7 @@ Pair ConnectionTest() {
 }  // namespace
 
 void AddConnectionRows() {
-    AddRow({"ZELOQRMClientTestConnect, kept-alive HTTPS", "bare libcurl exchange", 1.10,
+    AddRow({"ZELOQRMClientTestConnect, kept-alive HTTPS", "bare libcurl exchange", 1.15,
             ConnectionTest, ""});
 }
 

@@ -160,7 +160,7 @@ Pair IdlePair(int count, Live live) {
 
 void AddIdleRow(const std::string &strRecords, int count, Live live, const std::string &strSmaller,
                 int pairs) {
-    AddRow({"ZELOQRMIdleTimeGet, " + strRecords, "bare lock, parse, kill, rename", 1.3,
+    AddRow({"ZELOQRMIdleTimeGet, " + strRecords, "bare lock, parse, kill, rename", 1.5,
             [=] { return IdlePair(count, live); },
             strSmaller.empty() ? "" : "ZELOQRMIdleTimeGet, " + strSmaller, pairs});
 }
@@ -168,7 +168,7 @@ void AddIdleRow(const std::string &strRecords, int count, Live live, const std::
 }  // namespace
 
 void AddFileRows() {
-    AddRow({"ZELOQRMClientSetInfo", "bare lock, write, rename", 1.3, InfoPair, ""});
+    AddRow({"ZELOQRMClientSetInfo", "bare lock, write, rename", 1.5, InfoPair, ""});
     AddIdleRow("1 record", 1, Live::kFirst, "", 0);
     AddIdleRow("100 records, the first live", 100, Live::kFirst, "1 record", 0);
     AddIdleRow("1,000 records, the first live", 1000, Live::kFirst, "100 records, the first live",

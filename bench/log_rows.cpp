@@ -198,9 +198,9 @@ void AddLogRows() {
     AddFirst("read and memmem", 1.3, ReadAndSearch);
 #ifdef ZELO_BENCH_PARSERS
     AddFirst("GKeyFile", 1.0 / 20, LookUpByKeyFile);
-    AddFirst("inih", 1.0 / 20, LookUpByInih);
+    AddFirst("inih", 1.0 / 10, LookUpByInih);
 #endif
-    AddRow({"ConvertLog, later", "read and memmem", 1.0 / 40, LaterPair, ""});
+    AddRow({"ConvertLog, later", "read and memmem", 1.0 / 20, LaterPair, ""});
 }
 
 }  // namespace bench

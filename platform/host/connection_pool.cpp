@@ -201,6 +201,8 @@ Borrowed::Borrowed() {
     }
     const std::lock_guard<std::mutex> lock(g_pool->mutex);
     g_pool->inUse.insert(m_pConnection.get());
+    // A child process, where memory may be short, moves all of them there.
+    g_pool->abandoned.reserve(g_pool->abandoned.size() + kMaxIdle + g_pool->inUse.size());
 }
 
 Borrowed::~Borrowed() {

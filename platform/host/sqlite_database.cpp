@@ -116,7 +116,8 @@ Result Database::Fail(int sqliteError, const char *szWhat, int line) {
         default:
             syslog(LOG_ERR, "%s:%d %s '%s': %s", kFile, line, m_store.szName, m_store.szPath,
                    systemError == 0 ? szWhat : std::strerror(systemError));
-            YLIBCErrSetEx(YLIBC_ERR_STORE, kFile, line);
+            YLIBCErrSetEx(sqliteError == SQLITE_NOMEM ? YLIBC_ERR_OUT_OF_MEMORY : YLIBC_ERR_STORE,
+                          kFile, line);
     }
     return Result::kFailed;
 }

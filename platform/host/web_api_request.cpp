@@ -16,6 +16,7 @@
 #include "json_text.h"
 #include "last_error.h"
 #include "never_destroyed.h"
+#include "printable.h"
 
 namespace ZELO {
 namespace {
@@ -160,8 +161,8 @@ int Ask(const host::HttpRequest &request, host::HttpReply &reply) {
 // A server without a path for the API: says why. The query names nothing that helps, and it came
 // from a caller.
 std::string NoPath(const std::string &strUrl, const std::string &strReason, int line) {
-    syslog(LOG_WARNING, "%s:%d %s: %s", kFile, line, strUrl.substr(0, strUrl.find('?')).c_str(),
-           strReason.c_str());
+    syslog(LOG_WARNING, "%s:%d %s: %s", kFile, line,
+           printable::Line(strUrl.substr(0, strUrl.find('?'))).c_str(), strReason.c_str());
     YLIBCErrSetEx(YLIBC_ERR_REPLY, kFile, line);
     return {};
 }
