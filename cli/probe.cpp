@@ -287,9 +287,13 @@ Probe RunProbe(const Way &way, Extent extent, const char *szPath, const std::str
     const Easy pEasy(globalInit == CURLE_OK ? curl_easy_init() : nullptr);
     const Url pUrl = BuildUrl(way, extent, szPath, strQuery);
     const Headers pHeaders(curl_slist_append(nullptr, "Accept: application/json"));
-    if (pEasy == nullptr || pUrl == nullptr ||
-        curl_slist_append(pHeaders.get(), "Accept-Encoding: identity") == nullptr) {
+    if (pUrl == nullptr) {
         probe.strReason = "the host or the port cannot stand in an URL";
+        return probe;
+    }
+    if (pEasy == nullptr || pHeaders == nullptr ||
+        curl_slist_append(pHeaders.get(), "Accept-Encoding: identity") == nullptr) {
+        probe.strReason = "out of memory";
         return probe;
     }
     if (limit_ms <= 0) {

@@ -124,21 +124,22 @@ std::string MaskTokenLike(const std::string &strLine) {
 }
 
 std::string MaskPlain(const std::string &strLine) {
-    // Two names that "%3D" joins are looked at once each, with what may stand across.
-    constexpr std::size_t kLongestPart = 10;
+    // A name is searched back to just before the separator in front of it, so that a long line
+    // takes linear time; so many bytes hold the longest escaped separator.
+    constexpr std::size_t kLongestSeparator = 10;
     std::size_t end = Lower(strLine).find("bearer ");
     std::size_t cbName = end == std::string::npos ? 0 : 7;
-    std::size_t behind = 0;
+    std::size_t from = 0;
     for (std::size_t at = 0; at < std::min(end, strLine.size()); ++at) {
         const std::size_t cb = SeparatorAt(strLine, at);
         if (cb == 0) {
             continue;
         }
-        if (IsSecretName(NameBefore(strLine, at, behind))) {
+        if (IsSecretName(NameBefore(strLine, at, from))) {
             end = at;
             cbName = cb;
         }
-        behind = at - std::min(at, kLongestPart);
+        from = at - std::min(at, kLongestSeparator);
     }
     const bool blMasked = end != std::string::npos;
     const std::string strBefore = blMasked ? strLine.substr(0, end + cbName) : strLine;

@@ -440,10 +440,10 @@ ZELOQRM_API bool ZELOQRMClientDeleteServerUser(void);
 // The file keeps its mode, and its owner as far as the process may give files away.
 //
 // Returns true when the file has been replaced; false with a log line, and the file as it was,
-// otherwise. A reader sees the old file or the new one. Calls for one user take turns, for 10 s at
-// most, in which they hold the file "usersettings.tmp" beside the settings: no call undoes
-// another's change. That file stays only where it cannot take the settings' place, and keeps no
-// later call waiting.
+// otherwise. A reader sees the old file or the new one. Calls for one user take turns: each waits
+// up to 10 s for its own, and then holds the file "usersettings.tmp" beside the settings, so that
+// none undoes another's change. That file stays only where it cannot take the settings' place, and
+// keeps no later call waiting.
 ZELOQRM_API bool ZELOQRMUserWelcomPage(const char *szUser, bool blShow);
 
 // ------------------------------------------------------------------------------------------------

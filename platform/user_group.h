@@ -52,7 +52,7 @@ struct ZELO_GROUP {
     char szName[256];  // as of a user
     gid_t gid;
     char **ppszMembers;
-    void *pPort;  // the port's
+    void *pPort;  // for the platform alone: the members as they were read
 };
 
 // What became of a change to several users.

@@ -25,7 +25,8 @@ constexpr long kNotifyInterval_s = 7200;
 // As long as a touch may take that another process has begun.
 constexpr std::chrono::seconds kTouchWait{1};
 
-// Whether nobody else can have put it there. What the platform does not tell of it is in order.
+// Whether nobody else can have put it there. A type or a number of names that the platform leaves
+// at 0 is taken as right.
 bool IsMarkerOurs(const struct stat &status) {
     const mode_t type = status.st_mode & S_IFMT;
     return (type == 0 || type == S_IFREG) && status.st_nlink <= 1 &&
@@ -64,7 +65,8 @@ void connect_failed_marker::Touch() {
     RemoveFolder();
     std::optional<LockedFile> marker(std::in_place, kMarker, kMode, kTouchWait);
     if (!marker->IsHeld() && unlink(kMarker) == 0) {
-        marker.emplace(kMarker, kMode, kTouchWait);  // what held it so long is no touch
+        // Who holds the lock for longer than a touch takes is no process of ours.
+        marker.emplace(kMarker, kMode, kTouchWait);
     }
     if (marker->IsHeld() && IsFolderSafe()) {
         static_cast<void>(YLIBCExec(kTouch, kMarker, nullptr, nullptr, nullptr));

@@ -78,6 +78,6 @@ LockedFile::Try LockedFile::Open(const char *szPath, std::optional<mode_t> mode,
     if (!LeadsTo(szPath, status)) {
         return Try::kAgain;
     }
-    // Somebody else's process, if one took a turn by this file, has ended it.
+    // Another user's file goes: its lock is held here, so nobody is at work with it.
     return IsOwnFile(status) ? Try::kHeld : unlink(szPath) == 0 ? Try::kAgain : Try::kFailed;
 }

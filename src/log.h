@@ -37,8 +37,8 @@ struct SourceStem {
     }
 };
 
-// Writes one line: control characters of the values are escaped ("\n", "\x1B"), whatever they come
-// from. Never throws and allocates nothing, so it works when memory is short.
+// Writes one line, made printable (printable.h). Never throws and allocates nothing, so it works
+// when memory is short.
 void Write(const char *szStem, int line, const char *szFormat, ...)
     __attribute__((format(printf, 3, 4)));
 

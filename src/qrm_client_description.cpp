@@ -96,7 +96,7 @@ bool IsHttpsServed() {
 }
 
 bool ReadSerialNumber(std::string &strSerial) {
-    // A number that fills what the platform may fill has its end behind that.
+    // One byte more than the platform is told, so that a text of the full size still ends.
     FixedText<kSerialSize + 1> serial;
     bool blRead = true;
     if (YLIBGetCustomSerialNumber(serial.Buffer(), kCustomSerialSize) < 0 || serial.Empty()) {

@@ -129,7 +129,7 @@ struct Request {
     bool blClearGluster;
 };
 
-// A field of the record ends within it, however far the platform fills what it is given.
+// Copies a text into a field, cut to fit: the platform may fill its buffer without an end.
 template <std::size_t N>
 bool ReadField(int (*pfnGet)(char *, int, const ZELO_CRED *), const ZELO_CRED *pCred,
                char (&szField)[N]) {

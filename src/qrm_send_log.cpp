@@ -265,7 +265,7 @@ int Push(int level, const char *szSection, const char *szKey, YLIBSZLIST *pslPar
         ZELO_LOG_NULL_ARGUMENT("__null != szKey");
         return -1;
     }
-    // A name that fills what the platform may fill has its end behind that.
+    // One byte more than the platform is told, so that a text of the full size still ends.
     FixedText<ZELO_LNX_HOSTNAME_SIZE + 1> hostName;
     if (ZELOLnxGetHostname(hostName.Buffer()) < 0) {
         ZELO_LOG("get hostname failed ");

@@ -55,7 +55,7 @@ bool IsGone(UserHandle &user) {
     if (reason == YLIBC_ERR_NONE) {
         YLIBCErrSetEx(code, szFile, line);
     }
-    // A platform that gives no reason has none to give but that one.
+    // A platform that sets no last error means that there is no such account.
     return !blExists && (reason == YLIBC_ERR_NONE || reason == YLIBC_ERR_NOT_FOUND);
 }
 
@@ -312,7 +312,7 @@ bool Delete() {
 
 constexpr const char *kSettingsFile = "usersettings";
 constexpr mode_t kModeOfNew = 0644;
-constexpr mode_t kModeOfOld = 0600;  // at first: it becomes that of the old file
+constexpr mode_t kModeUntilCopied = 0600;  // until the new file gets the old one's
 constexpr std::chrono::seconds kTurnWait{10};
 constexpr const char *kInstance = "ZELO.PKV.App.WelcomeApp.Instance";
 
@@ -350,7 +350,7 @@ bool ShowPages(const char *szUser, bool blShow) {
     // Whoever holds the temporary file reads and replaces the settings; the next one reads those.
     struct stat old = {};
     const bool blThere = stat(path.sz(), &old) == 0;
-    const LockedFile file(temporary.sz(), blThere ? kModeOfOld : kModeOfNew, kTurnWait);
+    const LockedFile file(temporary.sz(), blThere ? kModeUntilCopied : kModeOfNew, kTurnWait);
 
     Json::Value settings(Json::objectValue);
     if (access(path.sz(), R_OK) == 0) {
@@ -360,7 +360,9 @@ bool ShowPages(const char *szUser, bool blShow) {
         settings = Json::Value(Json::objectValue);
     }
     HidePages(settings, !blShow);
-    KeepModeAndOwner(old, file.Get());
+    if (file.IsHeld()) {
+        KeepModeAndOwner(old, file.Get());
+    }
     if (!file.IsHeld() || !json_text::ToFile(settings, file.Get())) {
         ZELO_LOG("Failed to write usersettins [%s] to [%s]", json_text::ToLogText(settings).c_str(),
                  temporary.sz());

@@ -7,9 +7,10 @@
 
 namespace {
 
-// Escaping can be repeated; more often than this it is noise.
+// Readings of one place; text with more is noise.
 constexpr std::size_t kMaxReadings = 16;
-constexpr std::size_t kTelling = 32;
+// So many bytes that agree tell a secret.
+constexpr std::size_t kTellingBytes = 32;
 
 constexpr struct {
     std::string_view name;
@@ -137,7 +138,7 @@ void AddBackslashed(const std::string &strText, std::size_t at, std::vector<Read
     }
 }
 
-bool IsLineEnd(const std::string &strBytes) {
+bool IsBlank(const std::string &strBytes) {
     return strBytes == "\n" || strBytes == "\r" || strBytes == " " || strBytes == "\t";
 }
 
@@ -206,7 +207,7 @@ std::size_t SecretSearch::EndOf(const std::string &strSecret, const std::string 
     if (strSecret.compare(0, first.strBytes.size(), first.strBytes) != 0) {
         return 0;
     }
-    const std::size_t telling = std::min(strSecret.size(), kTelling);
+    const std::size_t telling = std::min(strSecret.size(), kTellingBytes);
     std::size_t end = first.strBytes.size() >= telling ? first.end : 0;
     std::set<Progress> open = {{first.strBytes.size(), first.end}};
     const auto goOn = [&](const Progress &to) {
@@ -229,7 +230,7 @@ std::size_t SecretSearch::EndOf(const std::string &strSecret, const std::string 
             if (strSecret.compare(from.found, cb, reading.strBytes) == 0) {
                 open.insert(goOn({from.found + cb, reading.end}));
             }
-            if (reading.strBytes == "\\" || (m_blWrapped && IsLineEnd(reading.strBytes))) {
+            if (reading.strBytes == "\\" || (m_blWrapped && IsBlank(reading.strBytes))) {
                 open.insert({from.found, reading.end});
             }
         }

@@ -20,10 +20,10 @@ namespace host {
 namespace {
 
 // More idle handles than this are not kept.
-constexpr std::size_t kMaxIdle = 8;
+constexpr std::size_t kMaxIdleHandles = 8;
 // A connection that is idle for longer is not used again: servers close theirs after 5 s or more,
 // and a call must not meet that moment.
-constexpr long kMaxIdle_s = 3;
+constexpr long kMaxIdleTime_s = 3;
 // An authority that is removed is not trusted for longer than this.
 constexpr long kMaxLife_s = 180;
 
@@ -137,7 +137,7 @@ void SetOptions(Connection &connection) {
     // Forgets the options of the exchange before, and how often libcurl has sent one again.
     curl_easy_reset(pEasy);
     curl_easy_setopt(pEasy, CURLOPT_ERRORBUFFER, connection.reason.data());
-    curl_easy_setopt(pEasy, CURLOPT_MAXAGE_CONN, kMaxIdle_s);
+    curl_easy_setopt(pEasy, CURLOPT_MAXAGE_CONN, kMaxIdleTime_s);
     curl_easy_setopt(pEasy, CURLOPT_MAXLIFETIME_CONN, kMaxLife_s);
     // Each connection is verified against the authorities that there are as it begins.
     curl_easy_setopt(pEasy, CURLOPT_CA_CACHE_TIMEOUT, 0L);
@@ -154,7 +154,8 @@ void SetOptions(Connection &connection) {
     curl_easy_setopt(pEasy, CURLOPT_SSL_SESSIONID_CACHE, 0L);
 }
 
-// Between exchanges nothing comes but the other side's end. libcurl takes TLS's for data.
+// Between exchanges nothing arrives but the end of the connection. libcurl takes a close_notify of
+// TLS for data, and the connection for alive.
 bool IsQuiet(const Connection &connection) {
     return std::all_of(connection.sockets.begin(), connection.sockets.end(), [](curl_socket_t fd) {
         pollfd look = {fd, POLLIN, 0};
@@ -169,7 +170,7 @@ std::unique_ptr<Connection> TakeIdle() {
     while (true) {
         {
             const std::lock_guard<std::mutex> lock(pool.mutex);
-            pool.idle.reserve(kMaxIdle);
+            pool.idle.reserve(kMaxIdleHandles);
             if (pool.idle.empty()) {
                 return nullptr;
             }
@@ -202,7 +203,7 @@ Borrowed::Borrowed() {
     const std::lock_guard<std::mutex> lock(g_pool->mutex);
     g_pool->inUse.insert(m_pConnection.get());
     // A child process, where memory may be short, moves all of them there.
-    g_pool->abandoned.reserve(g_pool->abandoned.size() + kMaxIdle + g_pool->inUse.size());
+    g_pool->abandoned.reserve(g_pool->abandoned.size() + kMaxIdleHandles + g_pool->inUse.size());
 }
 
 Borrowed::~Borrowed() {

@@ -171,10 +171,10 @@ int FailToOpen(const char *szPath) {
 int Lock(const char *szPath, int timeout_s, int &handle) {
     const Clock::time_point end = Clock::now() + std::chrono::seconds(timeout_s);
     for (;;) {
-        const bool blCreate = host::MayCreateLockFile(szPath);
+        const bool blCreate = host::PrepareLockFile(szPath);
         LockFile file(szPath, blCreate);
         if (file.Get() < 0 && errno == ENOENT && !blCreate && Clock::now() < end) {
-            continue;
+            continue;  // a cleaner of old files has removed it since it was prepared
         }
         if (file.Get() < 0) {
             return FailToOpen(szPath);

@@ -95,7 +95,7 @@ void RemoveForeignFile(const std::string &strPath) {
     }
 }
 
-bool MayCreateLockFile(const char *szPath) {
+bool PrepareLockFile(const char *szPath) {
     // Taking the lock of the names does not lead to taking it, whoever may write to its folder.
     if (std::strcmp(szPath, kNamesLock) == 0 || !IsRootInSharedFolder(szPath)) {
         return true;

@@ -17,10 +17,9 @@ namespace host {
 void RemoveForeignFile(const std::string &strPath);
 
 // To be called before a lock file is opened. As root, in a folder that everybody can write to,
-// makes sure that a file of root's stands at the path (mode 0600), and returns false: opening it
-// must not create it. Returns true everywhere else, and where it could not make that file, so that
-// opening it does, or says why not. The last error stays as it was.
-bool MayCreateLockFile(const char *szPath);
+// removes another user's file and creates root's (mode 0600). Returns whether opening may still
+// create the file: not where it has just been made. The last error stays as it was.
+bool PrepareLockFile(const char *szPath);
 
 }  // namespace host
 

@@ -9,7 +9,8 @@
 
 namespace host {
 
-// Takes the mutex around each fork from now on. For a mutex of a file, while the library is loaded:
+// Takes the mutex around each fork from now on. Use at namespace scope, so that it runs while the
+// library is loaded:
 //     std::mutex g_mutex;
 //     const int g_forkHandlers = host::HoldAroundForks<g_mutex>();
 template <std::mutex &mutex>

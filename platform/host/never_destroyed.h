@@ -8,8 +8,8 @@
 
 namespace host {
 
-// For an object of a file. Within a function it would be made at the first call, which a child
-// process may never see the end of.
+// For an object at namespace scope. A static within a function is made at the first call; a fork in
+// the middle of that leaves it half made in the child for ever.
 template <typename T>
 class NeverDestroyed {
   public:

@@ -19,7 +19,7 @@ namespace host {
 namespace {
 
 constexpr const char *kFile = "program_folder";
-constexpr std::string_view kRoot = "/usr/zelo/etc";
+constexpr std::string_view kTopFolder = "/usr/zelo/etc";
 
 bool OthersCanChange(const struct stat &status) {
     return (status.st_uid != 0 && status.st_uid != geteuid()) ||
@@ -94,7 +94,7 @@ bool Succeeded(const ProgramEnd &end) {
 }  // namespace
 
 ProgramFolder CheckProgramFolder(const std::string &strFolder) {
-    for (std::size_t end = kRoot.size();; end = strFolder.find('/', end + 1)) {
+    for (std::size_t end = kTopFolder.size();; end = strFolder.find('/', end + 1)) {
         const std::string strPart = strFolder.substr(0, end);
         struct stat status = {};
         if (lstat(strPart.c_str(), &status) != 0) {

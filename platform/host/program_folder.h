@@ -11,7 +11,8 @@
 
 namespace host {
 
-// Whether the programs of a folder may be run. A folder and each one above it, up to
+// Whether the programs of a folder below "/usr/zelo/etc" may be run. The folder and each one above
+// it, up to
 // "/usr/zelo/etc", must be a real folder that only root and the process's own user can change:
 // whoever else can write to it can put a program of root's there. kRefused sets the last error and
 // writes a log line.
@@ -31,8 +32,9 @@ struct ProgramCall {
 // process's own user can change; a name that begins with a dot does not count, and any other file
 // is passed over with a log line. So is each program that fails.
 //
-// Returns how the first failing program ended, or kExited with 0 when none failed; a folder that
-// is missing has none. False when the folder is refused or cannot be read, with the last error set.
+// `first` becomes how the first failing program ended, kExited with 0 when none failed or the
+// folder is missing. Returns false when the folder is refused or cannot be read, with the last
+// error set.
 bool RunProgramFolder(const std::string &strFolder, const ProgramCall &call, ProgramEnd &first);
 
 // The last error of a program that did not end with status 0.

@@ -13,7 +13,7 @@ namespace {
 
 using Copy = std::vector<unsigned char>;
 
-// The first column of the first row that the pragma gives, by reading it with pfnRead.
+// Takes from the first row that the pragma gives what read() makes of it.
 template <typename Value, typename Read>
 int ReadPragma(sqlite3 *pDb, const char *szPragma, Value &value, const Read &read) {
     sqlite3_stmt *pRaw = nullptr;

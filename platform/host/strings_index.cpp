@@ -18,7 +18,7 @@ namespace {
 
 using IndexHandle = std::shared_ptr<const StringsIndex>;
 
-// More than an interface has languages. Past it all are made anew.
+// More than there are languages. When it is full, all are dropped.
 constexpr std::size_t kMaxIndexes = 64;
 
 constexpr off_t kBlock = off_t{64} * 1024;
