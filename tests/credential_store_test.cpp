@@ -118,27 +118,6 @@ TEST(CredentialStore, ProcessesWriteAtOnceAndLoseNothing) {
     EXPECT_GE(stored::AddCredential("Parent", "still works"), 0);
 }
 
-TEST(CredentialStore, AListCountsWhatIsThereNow) {
-    RemoveStore();
-    stored::AddCredential("ZELO.QRM", "a");
-    // The other process starts before this one counts: a fork closes the connection.
-    const children::Signal begin;
-    const pid_t pid = children::Start(
-        [&] { return begin.Await() && stored::AddCredential("ZELO.QRM", "b") >= 0; });
-    EXPECT_EQ(stored::Count(), 1);
-    EXPECT_TRUE(begin.Give());
-    EXPECT_TRUE(children::Ended(pid));
-    EXPECT_EQ(stored::Count(), 2) << "another process's change";
-    const long id = stored::AddCredential("ZELO.QRM", "c");
-    EXPECT_EQ(stored::Count(), 3) << "a change of its own";
-    EXPECT_EQ(stored::Count("Other"), 0);
-    stored::AddCredential("Other", "d");
-    EXPECT_EQ(stored::Count("Other"), 1);
-    EXPECT_EQ(stored::Count(), 3) << "of another application than the last";
-    ZELOCredRemoveByID(id);
-    EXPECT_EQ(stored::Count(), 2);
-}
-
 TEST(CredentialStore, FollowsTheFileThatStandsAtItsPlace) {
     RemoveStore();
     stored::AddCredential("ZELO.QRM", "old");

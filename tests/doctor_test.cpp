@@ -432,6 +432,7 @@ TEST_F(Support, NoSecretLeavesTheAppliance) {
 
     const Outcome outcome = Run();
     ASSERT_EQ(outcome.status, 0) << outcome.strErr;
+    EXPECT_EQ(FileMode("/tmp/folder/archive"), 0600U);
     Unpack();
     std::string strAll =
         run_program::Run({"/bin/gzip", "-dc", "/tmp/folder/archive"}).strOut + outcome.strOut;
@@ -550,18 +551,6 @@ TEST_F(Support, WhatMayHoldUnknownTokensIsLeftOut) {
             EXPECT_TRUE(Holds(Unpacked(szName), "Left out")) << szName;
         }
     }
-}
-
-TEST_F(Support, AnArchiveReplacesAFileOnlyWhenTold) {
-    Replace("/tmp/folder/archive", "mine");
-    EXPECT_TRUE(Holds(Run().strErr, "--force"));
-    EXPECT_EQ(FileText("/tmp/folder/archive"), "mine");
-    EXPECT_EQ(Run({"--force"}).status, 0);
-    Unpack();
-    EXPECT_NE(Unpacked("README.txt"), "");
-    EXPECT_EQ(FileMode("/tmp/folder/archive"), 0600U);
-    EXPECT_EQ(std::distance(fs::directory_iterator("/tmp/folder"), fs::directory_iterator()), 1);
-    EXPECT_EQ(run_program::Run({QRMCTL, "support", "/tmp/folder/absent/archive"}).status, 1);
 }
 
 }  // namespace

@@ -249,16 +249,6 @@ TEST(ServerCredential, ExtraInfoKeepsWhatItCannotRead) {
     }
 }
 
-TEST(ServerCredential, WhatCanBeStoredCanBeReadBack) {
-    for (int depth = json_text::kMaxDepth - 2; depth <= json_text::kMaxDepth; ++depth) {
-        std::string strText;
-        Json::Value read;
-        const bool blWritten = json_text::ToString(Nest(depth), strText);
-        EXPECT_EQ(blWritten, depth < json_text::kMaxDepth);
-        EXPECT_EQ(blWritten && json_text::FromString(strText, read), blWritten) << depth;
-    }
-}
-
 TEST(ServerCredential, TokensAreReadAsTheyAreStored) {
     stored::Clear();
     const long id = stored::AddCredential("ZELO.QRM", "qrm");

@@ -7,8 +7,6 @@
 
 #include <atomic>
 #include <ctime>
-#include <map>
-#include <random>
 #include <thread>
 #include <vector>
 
@@ -161,37 +159,6 @@ TEST(StringsFile, SeesEveryChangeAtOnce) {
     EXPECT_EQ(Get("b", "k"), "2");
     fs::remove(kFile);
     EXPECT_EQ(Get("b", "k"), kNotFound);
-}
-
-TEST(StringsFile, AnswersAlikeHoweverManySectionsThereAre) {
-    std::mt19937 random(1);
-    // Few sections with long lines between them, some that come twice, more than are kept.
-    for (const unsigned sections : {5U, 300U, 20000U}) {
-        std::string strText;
-        std::map<std::string, std::string> values;  // of each key the first
-        for (unsigned i = 0; i < sections; ++i) {
-            const std::string strSection = "s" + std::to_string(random() % sections);
-            strText += '[' + strSection + "]\n";
-            for (unsigned n = random() % 4; n > 0; --n) {
-                const std::string strKey = "k" + std::to_string(random() % 4);
-                const std::string strValue = std::to_string(random());
-                values.emplace(strSection + strKey, strValue);
-                strText.append(strKey).append("=\"").append(strValue).append("\"\n#");
-                strText += std::string(random() % (200000 / sections), '[') + "\n";
-            }
-        }
-        Replace(strText);
-        for (const bool blKept : {false, true}) {
-            for (int i = 0; i < 25; ++i) {
-                const std::string strSection = "s" + std::to_string(random() % (sections + 1));
-                const std::string strKey = "k" + std::to_string(random() % 4);
-                values.emplace(strSection + strKey, kNotFound);
-                ASSERT_EQ(Get(strSection, strKey), values[strSection + strKey])
-                    << sections << strSection << strKey << blKept;
-            }
-            AwaitAge();
-        }
-    }
 }
 
 TEST(StringsFile, IsSafeWhileTheFileIsCutShortAndProcessesFork) {

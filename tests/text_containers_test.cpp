@@ -15,15 +15,6 @@ namespace {
 using List = std::unique_ptr<YLIBSZLIST, decltype(&YLIBCSzListFree)>;
 using Hash = std::unique_ptr<YLIBSZHASH, decltype(&YLIBCSzHashFree)>;
 
-std::vector<std::string> Texts(const YLIBSZLIST *pslList) {
-    std::vector<std::string> texts;
-    texts.reserve(static_cast<std::size_t>(pslList->nItem));
-    for (int i = 0; i < pslList->nItem; ++i) {
-        texts.emplace_back(YLIBCSzListGet(pslList, i));
-    }
-    return texts;
-}
-
 TEST(SzList, GrowsPastItsInitialSize) {
     YLIBSZLIST *pslList = YLIBCSzListAlloc(16);
     for (int i = 0; i < 1000; ++i) {
@@ -54,29 +45,6 @@ TEST(SzHash, KeepsTheOrderOfItsKeys) {
     EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_NOT_FOUND));
     EXPECT_EQ(YLIBCSzHashKeyAt(pHash, 1000), nullptr);
     EXPECT_EQ(YLIBCSzHashValueAt(pHash, -1), nullptr);
-}
-
-TEST(Text, SplitsAtTheWholeDelimiter) {
-    const std::tuple<const char *, const char *, std::vector<std::string>> rows[] = {
-        {"enu,ger", ",", {"enu", "ger"}}, {",a,,b,", ",", {"", "a", "", "b", ""}},
-        {"a::b:c", "::", {"a", "b:c"}},   {"no", ",", {"no"}},
-        {":::", "::", {"", ":"}},         {"", ",", {}},
-    };
-    for (const auto &[szText, szDelimiter, pieces] : rows) {
-        YLIBSZLIST *pslList = YLIBCSzListAlloc(512);
-        EXPECT_EQ(YLIBCStrTok(szText, szDelimiter, &pslList), static_cast<int>(pieces.size()));
-        EXPECT_EQ(Texts(pslList), pieces) << szText;
-        YLIBCSzListFree(pslList);
-
-        std::string strText = szText;
-        char *szRest = strText.data();
-        const std::vector<std::string> one = {""};
-        for (const std::string &strPiece : pieces.empty() ? one : pieces) {
-            EXPECT_EQ(YLIBCStrTokIndex(&szRest, szDelimiter), strPiece) << szText;
-        }
-        EXPECT_EQ(szRest, nullptr);
-        EXPECT_EQ(YLIBCStrTokIndex(&szRest, szDelimiter), nullptr);
-    }
 }
 
 TEST(Text, ReplacesEveryOccurrenceOrNone) {

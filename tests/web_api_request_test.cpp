@@ -267,11 +267,6 @@ TEST_F(Request, PathsAreLearntOnceAndForgottenWhenTheyAreGone) {
     EXPECT_EQ(m_pServer->Requests().size(), 3U) << "one discovery, two calls";
     call(200);
     EXPECT_EQ(m_pServer->Requests().size(), 5U) << "asked again after the 404";
-
-    ZELO::CredRequest empty;
-    EXPECT_FALSE(empty.Process(true, 0));
-    EXPECT_FALSE(empty.AddPostParam(Json::Value("text")));
-    EXPECT_EQ(empty.GetResponse(), "");
 }
 
 TEST_F(Request, TheCallersTimeLimitEndsAnExchange) {

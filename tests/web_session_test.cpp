@@ -13,7 +13,6 @@ using namespace files;
 constexpr const char *kFolder = "/usr/zelo/etc/sessions";
 constexpr const char *kDatabase = "/usr/zelo/etc/sessions/sessions.db";
 constexpr const char *kClient = "ZELO.QRM.Client";
-constexpr const char *kMachine = "ZELO.QRM.Client.Machine";
 
 class WebSession : public testing::Test {
   protected:
@@ -48,18 +47,6 @@ TEST_F(WebSession, LookingAndRemovingCreateNothing) {
     fs::permissions(kDatabase, fs::perms::all);
     EXPECT_TRUE(Exists(13, kClient));
     EXPECT_EQ(fs::status(kDatabase).permissions(), fs::perms::owner_read | fs::perms::owner_write);
-}
-
-TEST_F(WebSession, IsKnownByItsIndexAndItsWholeName) {
-    EXPECT_TRUE(Add(13, kMachine));
-    EXPECT_TRUE(Add(13, kMachine)) << "one that is there counts as added";
-    EXPECT_FALSE(Exists(13, kClient));
-    EXPECT_FALSE(Exists(13, "zelo.qrm.client.machine"));
-    EXPECT_FALSE(Exists(0, kMachine));
-    EXPECT_TRUE(Remove(0, kMachine));
-    EXPECT_TRUE(Exists(13, kMachine));
-    EXPECT_TRUE(Remove(13, kMachine));
-    EXPECT_FALSE(Exists(13, kMachine));
 }
 
 TEST_F(WebSession, ADamagedFileIsLeftAsItIs) {
