@@ -3,7 +3,7 @@
 #include <openssl/ssl.h>
 #include <unistd.h>
 
-#include "json_text.h"
+#include "json.h"
 
 namespace bench {
 namespace {
@@ -76,8 +76,8 @@ bool BareExchange::Perform() {
 }
 
 bool BareExchange::Perform(Json::Value &envelope) {
-    return Perform() && json_text::FromString(m_strReply, envelope) &&
-           json_text::IsTrue(json_text::Member(envelope, "success"));
+    return Perform() && json::FromString(m_strReply, envelope) &&
+           json::IsTrue(json::Member(envelope, "success"));
 }
 
 }  // namespace bench

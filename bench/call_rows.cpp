@@ -4,7 +4,7 @@
 
 #include "bare_exchange.h"
 #include "child_process.h"
-#include "json_text.h"
+#include "json.h"
 #include "ratio_table.h"
 #include "rows.h"
 #include "zeloqrmclient.h"
@@ -18,7 +18,7 @@ bool Call(bool blUseCache) {
     Json::Value reply;
     return ZELOQRMClientSendWebapi(reply, kConstantApi, 1, kConstantMethod, Json::objectValue,
                                    blUseCache) == 0 &&
-           json_text::IsTrue(json_text::Member(reply, "success"));
+           json::IsTrue(json::Member(reply, "success"));
 }
 
 void PrepareCall(BareExchange &bare, const std::string &strUrl) {
@@ -47,8 +47,7 @@ bool CallFromTheBeginning(const ServerProcess &server) {
     if (!bare.Perform(reply)) {
         return false;
     }
-    const char *szPath =
-        json_text::Text(json_text::Member(json_text::Member(reply, "data"), "path"));
+    const char *szPath = json::Text(json::Member(json::Member(reply, "data"), "path"));
     PrepareCall(bare, server.Url(kHttps, szPath == nullptr ? "" : szPath));
     return bare.Perform(reply);
 }

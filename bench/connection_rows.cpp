@@ -4,7 +4,7 @@
 
 #include "bare_exchange.h"
 #include "child_process.h"
-#include "json_text.h"
+#include "json.h"
 #include "ratio_table.h"
 #include "rows.h"
 #include "zeloqrmclient.h"

@@ -5,7 +5,7 @@
 #include "commands.h"
 #include "input_file.h"
 #include "joined_server.h"
-#include "json_text.h"
+#include "json.h"
 #include "server_request.h"
 #include "web_api_request.h"
 #include "zeloqrmclient.h"
@@ -50,8 +50,8 @@ ExitCode Call(const Options &options, Report &report) {
                                  report);
     }
     report.Document("reply", reply);
-    if (!json_text::IsTrue(json_text::Member(reply, "success"))) {
-        const int code = json_text::ErrorCode(reply);
+    if (!json::IsTrue(json::Member(reply, "success"))) {
+        const int code = json::ErrorCode(reply);
         report.Member("server_code", code);
         report.Member("server_error", ServerErrorName(code));
         return FailRequest(ErrorId::kRefused, "the server refused the call",

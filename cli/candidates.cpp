@@ -3,24 +3,24 @@
 #include <algorithm>
 
 #include "input_file.h"
-#include "json_text.h"
+#include "json.h"
 #include "web_api_request.h"
 #include "words.h"
 
 namespace qrmctl {
 namespace {
 
-using json_text::Member;
+using json::Member;
 
 bool IsPort(const Json::Value &value) {
     int port = 0;
-    return json_text::ReadInt(value, port) && ZELO::APIValidator::IsPort(port);
+    return json::ReadInt(value, port) && ZELO::APIValidator::IsPort(port);
 }
 
 // Port 0 is not tried.
 bool IsTried(const Json::Value &value) {
     int port = 0;
-    return json_text::ReadInt(value, port) && port > 0;
+    return json::ReadInt(value, port) && port > 0;
 }
 
 // What keeps an entry from being tried; null when nothing does.
@@ -28,7 +28,7 @@ const char *Flaw(const Json::Value &candidate) {
     if (!candidate.isObject()) {
         return "it is no object";
     }
-    const char *szHost = json_text::Text(Member(candidate, "host"));
+    const char *szHost = json::Text(Member(candidate, "host"));
     if (szHost == nullptr || szHost[0] == '\0') {
         return "\"host\" has to be a text that is not empty";
     }

@@ -9,7 +9,7 @@
 
 #include "certificate_authorities.h"
 #include "fixed_text.h"
-#include "json_text.h"
+#include "json.h"
 #include "platform_handles.h"
 
 namespace qrmctl {
@@ -356,7 +356,7 @@ void CheckClock(const Probe &probe, Story &story) {
 
 std::string ReasonForNoApi(const std::string &strBody) {
     Json::Value reply;
-    const int code = json_text::FromString(strBody, reply) ? json_text::ErrorCode(reply) : 0;
+    const int code = json::FromString(strBody, reply) ? json::ErrorCode(reply) : 0;
     return code == 0 ? "it does not answer as a QRM server would"
                      : "the server does not serve the API " + std::string(kQrmApi) +
                            " (error code " + std::to_string(code) + ")";

@@ -2,7 +2,7 @@
 
 #include "connection_checks.h"
 #include "fixed_text.h"
-#include "json_text.h"
+#include "json.h"
 #include "key_value_file.h"
 #include "last_error.h"
 #include "membership.h"
@@ -95,15 +95,15 @@ Check CheckStored(Stored &stored, bool &blFound) {
 
 Check Judge(const std::string &strResponse, long duration_ms) {
     Json::Value reply;
-    if (!json_text::FromString(strResponse, reply)) {
+    if (!json::FromString(strResponse, reply)) {
         return {"token", Outcome::kFailed, duration_ms,
                 "the server does not answer as a QRM server would",
                 "check that the stored server is still the QRM server"};
     }
-    if (json_text::IsTrue(json_text::Member(reply, "success"))) {
+    if (json::IsTrue(json::Member(reply, "success"))) {
         return {"token", Outcome::kOk, duration_ms, "the server accepts it", ""};
     }
-    const int code = json_text::ErrorCode(reply);
+    const int code = json::ErrorCode(reply);
     const std::string strCode = " (error code " + std::to_string(code) + ")";
     if (code >= 105 && code <= 107) {
         const char *szWhy = code == 105   ? "it is wrong"

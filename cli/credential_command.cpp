@@ -9,14 +9,14 @@
 #include "credential_store.h"
 #include "input_file.h"
 #include "joined_server.h"
-#include "json_text.h"
+#include "json.h"
 #include "zeloqrmclient.h"
 
 namespace qrmctl {
 namespace {
 
-using json_text::HasMember;
-using json_text::Member;
+using json::HasMember;
+using json::Member;
 
 ExitCode Show(bool blWithToken, Report &report) {
     Report::Stage("reading the credential store");
@@ -56,17 +56,17 @@ std::string FlawOfValues(const Json::Value &cred, bool blComplete) {
             return "there is no member \"" + strName + '"';
         }
     }
-    const char *szProtocol = json_text::Text(Member(cred, "protocol"));
+    const char *szProtocol = json::Text(Member(cred, "protocol"));
     const std::string strProtocol = szProtocol == nullptr ? "https" : szProtocol;
     if (strProtocol != "http" && strProtocol != "https" && strProtocol != "fld") {
         return "\"protocol\" has to be http, https or fld";
     }
-    const char *szHost = json_text::Text(Member(cred, "host"));
+    const char *szHost = json::Text(Member(cred, "host"));
     if (szHost != nullptr && szHost[0] == '\0') {
         return "\"host\" is empty";
     }
     int port = 0;
-    if (json_text::ReadInt(Member(cred, "port"), port) && (port < 1 || port > 65535)) {
+    if (json::ReadInt(Member(cred, "port"), port) && (port < 1 || port > 65535)) {
         return "\"port\" has to be 1 to 65535";
     }
     return {};
@@ -79,7 +79,7 @@ std::string Flaw(const Json::Value &cred, bool blComplete) {
     }
     for (const char *szName : {"protocol", "host", "application", "access_token"}) {
         const bool blNeeded = blComplete || std::string(szName) == "application";
-        const char *szText = json_text::Text(Member(cred, szName));
+        const char *szText = json::Text(Member(cred, szName));
         if (szText == nullptr && (blNeeded || HasMember(cred, szName))) {
             return std::string("\"") + szName + "\" has to be a text";
         }
@@ -88,7 +88,7 @@ std::string Flaw(const Json::Value &cred, bool blComplete) {
         }
     }
     int port = 0;
-    if (!HasMember(cred, "port") ? blComplete : !json_text::ReadInt(Member(cred, "port"), port)) {
+    if (!HasMember(cred, "port") ? blComplete : !json::ReadInt(Member(cred, "port"), port)) {
         return "\"port\" has to be an integer";
     }
     return FlawOfValues(cred, blComplete);

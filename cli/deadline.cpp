@@ -18,7 +18,7 @@
 #include <utility>
 
 #include "fixed_text.h"
-#include "json_text.h"
+#include "json.h"
 #include "output.h"
 #include "printable.h"
 #include "report.h"
@@ -155,7 +155,7 @@ void Tell(const Watch &watch, const std::string &strStage, Clock::duration time)
         result["deadline_s"] = watch.limit_s;
         result["stage"] = strStage;
         result["longest_stage"] = blEarlier ? strLongest : strStage;
-        WriteSoon(STDOUT_FILENO, json_text::ToLogText(result) + '\n');
+        WriteSoon(STDOUT_FILENO, json::ToLogText(result) + '\n');
     }
     WriteSoon(STDERR_FILENO, "qrmctl: " + printable::Line(strError) + '\n');
 }

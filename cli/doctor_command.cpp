@@ -8,7 +8,7 @@
 #include "commands.h"
 #include "connection_checks.h"
 #include "credential_checks.h"
-#include "json_text.h"
+#include "json.h"
 #include "web_api_request.h"
 
 namespace qrmctl {
@@ -27,17 +27,17 @@ struct Options {
 // The ways of a candidate in the order in which the connection test tries them; none when it would
 // pass the candidate over.
 void AddWays(const Json::Value &candidate, std::vector<Way> &ways) {
-    const char *szHost = json_text::Text(json_text::Member(candidate, "host"));
+    const char *szHost = json::Text(json::Member(candidate, "host"));
     int httpPort = 0;
     int httpsPort = 0;
     if (szHost == nullptr || szHost[0] == '\0' ||
-        !json_text::ReadInt(json_text::Member(candidate, "http_port"), httpPort) ||
-        !json_text::ReadInt(json_text::Member(candidate, "https_port"), httpsPort) ||
+        !json::ReadInt(json::Member(candidate, "http_port"), httpPort) ||
+        !json::ReadInt(json::Member(candidate, "https_port"), httpsPort) ||
         !ZELO::APIValidator::IsPort(httpPort) || !ZELO::APIValidator::IsPort(httpsPort)) {
         return;
     }
     if (httpsPort > 0) {
-        const bool blRelayed = json_text::IsTrue(json_text::Member(candidate, "farlink_direct"));
+        const bool blRelayed = json::IsTrue(json::Member(candidate, "farlink_direct"));
         ways.push_back({blRelayed ? "fld" : "https", szHost, httpsPort});
     }
     if (httpPort > 0) {

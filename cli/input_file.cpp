@@ -9,7 +9,7 @@
 #include <iterator>
 #include <memory>
 
-#include "json_text.h"
+#include "json.h"
 #include "words.h"
 
 namespace qrmctl {
@@ -55,7 +55,7 @@ bool EndsWithValue(const std::string &strText, const Json::Value &value) {
 
 bool ReadJson(const std::string &strText, Json::Value &value, std::string &strReason) {
     Json::Value read;
-    if (!json_text::FromString(strText, read, &strReason)) {
+    if (!json::FromString(strText, read, &strReason)) {
         return false;
     }
     if (!EndsWithValue(strText, read)) {

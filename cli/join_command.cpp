@@ -13,7 +13,7 @@
 #include "commands.h"
 #include "input_file.h"
 #include "joined_server.h"
-#include "json_text.h"
+#include "json.h"
 #include "key_value_file.h"
 #include "membership.h"
 #include "server_request.h"
@@ -41,8 +41,7 @@ struct Options {
 Json::Value IdValue(const std::string &strId) {
     Json::Value value;
     int id = 0;
-    return json_text::FromString(strId, value) && json_text::ReadInt(value, id) &&
-                   std::to_string(id) == strId
+    return json::FromString(strId, value) && json::ReadInt(value, id) && std::to_string(id) == strId
                ? Json::Value(id)
                : Json::Value(strId);
 }
@@ -216,7 +215,7 @@ bool IsSameName(const Json::Value &one, const Json::Value &other) {
 
 // Whether one of the candidates is that server.
 bool Holds(const Json::Value &candidates, const JoinedServer &server) {
-    using json_text::Member;
+    using json::Member;
     return std::any_of(candidates.begin(), candidates.end(), [&](const Json::Value &candidate) {
         return IsSameName(Member(candidate, "host"), server.host) &&
                (Member(candidate, "https_port") == server.port ||

@@ -2,7 +2,7 @@
 
 #include "credential_store.h"
 #include "fixed_text.h"
-#include "json_text.h"
+#include "json.h"
 #include "last_error.h"
 #include "membership.h"
 #include "serial_number.h"
@@ -75,7 +75,7 @@ std::optional<ExitCode> ClearDamagedStores(Report &report, bool &blServerLost) {
 }
 
 std::string AsText(const Json::Value &value) {
-    return value.isString() ? value.asString() : json_text::ToLogText(value);
+    return value.isString() ? value.asString() : json::ToLogText(value);
 }
 
 std::string OwnSerialNumber() {
@@ -97,7 +97,7 @@ std::string JoinedServer::Address() const {
 namespace {
 
 JoinedServer ServerOf(const Json::Value &cred) {
-    using json_text::Member;
+    using json::Member;
     return {Member(cred, "host"), Member(cred, "port"), Member(cred, "protocol"),
             Member(cred, "sn")};
 }

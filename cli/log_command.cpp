@@ -6,7 +6,7 @@
 
 #include "commands.h"
 #include "joined_server.h"
-#include "json_text.h"
+#include "json.h"
 #include "platform_handles.h"
 #include "server_request.h"
 #include "zeloqrmclient.h"
@@ -86,7 +86,7 @@ void WarnOfLeftMarker(const std::string &strMarker, const Json::Value &texts,
     const auto language =
         std::find_if(languages.begin(), languages.end(), [&](const std::string &strLanguage) {
             cb = SizeFilled(texts[strLanguage].asString(), strMarker,
-                            json_text::Member(values, strLanguage.c_str()).asString());
+                            json::Member(values, strLanguage.c_str()).asString());
             return cb > kMaxText;
         });
     if (language != languages.end()) {

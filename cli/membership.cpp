@@ -10,7 +10,7 @@
 #include "credential_store.h"
 #include "file_lock.h"
 #include "fixed_text.h"
-#include "json_text.h"
+#include "json.h"
 #include "key_value_file.h"
 #include "last_error.h"
 #include "platform_handles.h"
@@ -114,7 +114,7 @@ bool StoreSerial(const std::string &strSerial) {
     std::string strText;
     const CredHandle pCred(ZELOCredAlloc());
     const long id = ZELOCredIDGetByApplication(kServerApplication);
-    return pCred != nullptr && id >= 0 && json_text::ToString(extraInfo, strText) &&
+    return pCred != nullptr && id >= 0 && json::ToString(extraInfo, strText) &&
            ZELOCredLoad(id, pCred.get()) >= 0 &&
            ZELOCredItemSetExtraInfo(pCred.get(), strText.c_str()) >= 0 &&
            ZELOCredSave(pCred.get()) >= 0;

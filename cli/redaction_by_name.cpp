@@ -5,7 +5,7 @@
 #include <cctype>
 #include <string_view>
 
-#include "json_text.h"
+#include "json.h"
 #include "redaction.h"
 #include "words.h"
 
@@ -148,9 +148,9 @@ std::string MaskPlain(const std::string &strLine) {
 
 std::string MaskLine(const std::string &strLine) {
     Json::Value value;
-    if (json_text::FromString(strLine, value) && (value.isObject() || value.isArray())) {
+    if (json::FromString(strLine, value) && (value.isObject() || value.isArray())) {
         MaskMembers(value);
-        return json_text::ToLogText(value);
+        return json::ToLogText(value);
     }
     return MaskPlain(strLine);
 }

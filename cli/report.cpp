@@ -11,7 +11,7 @@
 
 #include "certificate_authorities.h"
 #include "deadline.h"
-#include "json_text.h"
+#include "json.h"
 #include "output.h"
 #include "printable.h"
 
@@ -22,8 +22,7 @@ static constexpr const char *kOutputStage = "writing the result";
 void Report::Fact(const std::string &strName, const Json::Value &value) {
     m_result[strName] = value;
     if (!m_blJson) {
-        const std::string strText =
-            value.isString() ? value.asString() : json_text::ToLogText(value);
+        const std::string strText = value.isString() ? value.asString() : json::ToLogText(value);
         std::cout << strName << ": " << printable::Line(strText) << '\n';
     }
 }
@@ -130,7 +129,7 @@ ExitCode Report::FailExchange(ErrorId id, const std::string &strError) {
 // Puts everything out that is meant for standard output; the deadline is over when it is.
 bool Report::PutOutResult() {
     if (m_blJson) {
-        std::cout << json_text::ToLogText(m_result) + '\n';
+        std::cout << json::ToLogText(m_result) + '\n';
     }
     return PutOutLast(std::cout);
 }

@@ -9,13 +9,13 @@
 
 #include "console_page.h"
 #include "foreign_page.h"
-#include "json_text.h"
+#include "json.h"
 
 namespace devserver {
 namespace {
 
-using json_text::HasMember;
-using json_text::Member;
+using json::HasMember;
+using json::Member;
 
 constexpr const char *kDiscoveryPath = "/qrm/discover";
 constexpr const char *kDiscoveryMethod = "discover";
@@ -39,7 +39,7 @@ constexpr std::size_t kShownBody = 64UL << 10U;
 constexpr std::size_t kKeptRequests = 10'000;
 
 std::string TextOrEmpty(const Json::Value &value) {
-    const char *szText = json_text::Text(value);
+    const char *szText = json::Text(value);
     return szText == nullptr ? "" : szText;
 }
 
@@ -146,7 +146,7 @@ struct DevServer::Call {
             strApi = request.get_param_value("api");
             strMethod = kDiscoveryMethod;
         } else if (blPost) {
-            json_text::FromString(request.body, body);
+            json::FromString(request.body, body);
             strApi = TextOrEmpty(Member(body, "api"));
             strMethod = TextOrEmpty(Member(body, "method"));
             strAuthorization = request.get_header_value("Authorization");
@@ -181,8 +181,8 @@ Json::Value *DevServer::FindClient(const Json::Value &sn, int &id) {
 }
 
 Reply DevServer::Join(const Json::Value &params) {
-    const char *szSn = json_text::Text(Member(params, "sn"));
-    const char *szToken = json_text::Text(Member(params, "access_token"));
+    const char *szSn = json::Text(Member(params, "sn"));
+    const char *szToken = json::Text(Member(params, "access_token"));
     if (szSn == nullptr || szToken == nullptr || !HasDescriptionTypes(params)) {
         return Refuse(kBadParameter);
     }
@@ -214,7 +214,7 @@ Reply DevServer::Info(const Json::Value & /*params*/) {
 }
 
 Reply DevServer::Update(const Json::Value &params) {
-    if (json_text::Text(Member(params, "sn")) == nullptr || !HasDescriptionTypes(params)) {
+    if (json::Text(Member(params, "sn")) == nullptr || !HasDescriptionTypes(params)) {
         return Refuse(kBadParameter);
     }
     const std::lock_guard<std::mutex> lock(m_mutex);
@@ -232,7 +232,7 @@ Reply DevServer::Update(const Json::Value &params) {
 }
 
 Reply DevServer::File(const Json::Value &params) {
-    const char *szName = json_text::Text(Member(params, "name"));
+    const char *szName = json::Text(Member(params, "name"));
     const Json::Value &size = Member(params, "size");
     if (szName == nullptr || !size.isInt64() || size.asInt64() < 0 || size.asInt64() > kMaxFile) {
         return RefuseFile(kBadParameter, "a file has a \"name\" and a \"size\"");
@@ -355,7 +355,7 @@ Reply DevServer::CarryOut(const Call &call) {
     int version = 0;
     const Json::Value &params = Member(call.body, "params");
     if (call.strApi.empty() || call.strMethod.empty() || !params.isObject() ||
-        !json_text::ReadInt(Member(call.body, "version"), version)) {
+        !json::ReadInt(Member(call.body, "version"), version)) {
         return refuse(kBadParameter);
     }
     int code = kUnknownApi;

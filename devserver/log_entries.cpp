@@ -3,13 +3,13 @@
 #include <algorithm>
 #include <iterator>
 
-#include "json_text.h"
+#include "json.h"
 
 namespace devserver {
 namespace {
 
-using json_text::HasMember;
-using json_text::Member;
+using json::HasMember;
+using json::Member;
 
 constexpr const char *kMembers[] = {"happen_time", "level", "username", "extra_info", "log"};
 constexpr const char *kLevels[] = {"emerg",   "alert",  "crit", "err",

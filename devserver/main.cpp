@@ -17,7 +17,7 @@
 #include "command_line.h"
 #include "console_page.h"
 #include "dev_server.h"
-#include "json_text.h"
+#include "json.h"
 
 namespace {
 
@@ -95,7 +95,7 @@ bool Announce(const devserver::DevServer &server, const std::string &strHost, co
     std::string strPorts;
     ports["http_port"] = server.HttpPort();
     ports["https_port"] = server.HttpsPort();
-    json_text::ToString(ports, strPorts);
+    json::ToString(ports, strPorts);
     // Who waits for the ports file finds the authority's certificate in place.
     if ((!files.ca.empty() && !WriteFile(files.ca, server.CaPem(), Lock::kNone)) ||
         (!files.ports.empty() && !WriteFile(files.ports, strPorts + "\n", Lock::kUntilTheEnd))) {

@@ -5,7 +5,7 @@
 #include <algorithm>
 #include <limits>
 
-#include "json_text.h"
+#include "json.h"
 
 namespace devserver {
 namespace {
@@ -26,7 +26,7 @@ bool ReadText(const Json::Value &value, Text &text) {
 template <typename Number>
 bool ReadNumber(const Json::Value &value, int least, int most, Number &number) {
     int n = 0;
-    if (!json_text::ReadInt(value, n) || n < least || n > most) {
+    if (!json::ReadInt(value, n) || n < least || n > most) {
         return false;
     }
     number = n;
@@ -84,10 +84,10 @@ bool ReadMember(const std::string &strName, V value, A answer) {
 std::string ReadNextAnswer(const std::string &strJson, std::string &strApi, NextAnswer &answer) {
     Json::Value object;
     std::string strError;
-    if (!json_text::FromString(strJson, object, &strError)) {
+    if (!json::FromString(strJson, object, &strError)) {
         return "the body is no JSON: " + strError;
     }
-    if (!ReadText(json_text::Member(object, "api"), strApi)) {
+    if (!ReadText(json::Member(object, "api"), strApi)) {
         return "the body has to be an object with the name of an API as \"api\"";
     }
     object.removeMember("api");

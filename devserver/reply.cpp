@@ -7,7 +7,7 @@
 #include <iomanip>
 #include <sstream>
 
-#include "json_text.h"
+#include "json.h"
 
 namespace devserver {
 namespace {
@@ -96,7 +96,7 @@ std::string HttpDate(std::time_t time) {
 Reply JsonReply(int status, const Json::Value &value) {
     Reply reply;
     reply.status = status;
-    json_text::ToString(value, reply.strBody);
+    json::ToString(value, reply.strBody);
     return reply;
 }
 

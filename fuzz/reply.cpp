@@ -2,23 +2,23 @@
 // written back, and made safe for the log.
 
 #include "input.h"
-#include "json_text.h"
+#include "json.h"
 #include "log.h"
 
 int LLVMFuzzerTestOneInput(const std::uint8_t *pData, std::size_t cb) {
     const std::string strText(fuzz::Input(pData, cb));
     Json::Value reply = "untouched";
     std::string strError;
-    if (json_text::FromString(strText, reply, &strError)) {
-        json_text::IsTrue(json_text::Member(reply, "success"));
-        json_text::ErrorCode(reply);
-        json_text::Text(json_text::Member(reply, "data"));
+    if (json::FromString(strText, reply, &strError)) {
+        json::IsTrue(json::Member(reply, "success"));
+        json::ErrorCode(reply);
+        json::Text(json::Member(reply, "data"));
         std::string strWritten;
         Json::Value again;
-        FUZZ_EXPECT(json_text::ToString(reply, strWritten));
+        FUZZ_EXPECT(json::ToString(reply, strWritten));
         FUZZ_EXPECT(strWritten.find('\n') == std::string::npos);
-        FUZZ_EXPECT(json_text::FromString(strWritten, again));
-        FUZZ_EXPECT(json_text::ErrorCode(again) == json_text::ErrorCode(reply));
+        FUZZ_EXPECT(json::FromString(strWritten, again));
+        FUZZ_EXPECT(json::ErrorCode(again) == json::ErrorCode(reply));
     } else {
         FUZZ_EXPECT(reply == "untouched");
         FUZZ_EXPECT(!strError.empty() && strError.find('\n') == std::string::npos);

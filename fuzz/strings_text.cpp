@@ -5,8 +5,8 @@
 
 #include <vector>
 
-#include "host/strings_text.h"
 #include "input.h"
+#include "strings/strings_text.h"
 
 namespace {
 

@@ -4,6 +4,7 @@
 
 #include "fixed_text.h"
 #include "guard.h"
+#include "json.h"
 #include "json_text.h"
 #include "key_value_file.h"
 #include "log.h"
@@ -170,7 +171,7 @@ void DescribeServer(const Request &request, __tag_ZELO_QRM_SERVER_INFO__ &server
     }
     Json::Value extraInfo;
     if (json_text::FromString(strExtraInfo, extraInfo)) {
-        const char *szSn = json_text::Text(json_text::Member(extraInfo, "sn"));
+        const char *szSn = json::Text(json::Member(extraInfo, "sn"));
         CopyToFit(server.szSn, sizeof(server.szSn), szSn == nullptr ? "" : szSn);
     }
     server.iRejoin = request.blRejoin ? 1 : 0;

@@ -7,6 +7,7 @@
 
 #include "credential_store.h"
 #include "guard.h"
+#include "json.h"
 #include "json_text.h"
 #include "log.h"
 #include "platform_handles.h"
@@ -16,9 +17,9 @@
 
 namespace {
 
-using json_text::HasMember;
-using json_text::Member;
-using json_text::Text;
+using json::HasMember;
+using json::Member;
+using json::Text;
 
 constexpr const char *kApplication = "ZELO.QRM";
 constexpr const char *kApi = "ZELO.QRM.RPC";
@@ -38,16 +39,15 @@ struct Candidate {
 bool ReadCandidate(const Json::Value &value, Candidate &candidate) {
     candidate.szHost = Text(Member(value, "host"));
     if (candidate.szHost == nullptr ||
-        !json_text::ReadInt(Member(value, "http_port"), candidate.httpPort) ||
-        !json_text::ReadInt(Member(value, "https_port"), candidate.httpsPort)) {
+        !json::ReadInt(Member(value, "http_port"), candidate.httpPort) ||
+        !json::ReadInt(Member(value, "https_port"), candidate.httpsPort)) {
         return false;
     }
     if (candidate.szHost[0] == '\0' || !ZELO::APIValidator::IsPort(candidate.httpPort) ||
         !ZELO::APIValidator::IsPort(candidate.httpsPort)) {
         return false;
     }
-    candidate.szSecureProtocol =
-        json_text::IsTrue(Member(value, "farlink_direct")) ? "fld" : "https";
+    candidate.szSecureProtocol = json::IsTrue(Member(value, "farlink_direct")) ? "fld" : "https";
     return true;
 }
 
@@ -187,7 +187,7 @@ bool Describe(const Json::Value &joinInfo, Json::Value &description) {
 
 bool IsAccepted(const std::string &strReply) {
     Json::Value reply;
-    return json_text::FromString(strReply, reply) && json_text::IsTrue(Member(reply, "success"));
+    return json_text::FromString(strReply, reply) && json::IsTrue(Member(reply, "success"));
 }
 
 // The texts that make up a token, which may be of any type.
@@ -199,7 +199,7 @@ void CollectTexts(const Json::Value &value, std::vector<std::string> &texts) {
             CollectTexts(element, texts);
         }
     } else if (!value.isNull()) {
-        texts.push_back(json_text::ToLogText(value));
+        texts.push_back(json::ToLogText(value));
     }
 }
 
@@ -238,7 +238,7 @@ int Join(const Json::Value &joinInfo) {
         return -1;
     }
     if (!Connect(candidates, pCred.get(), pRequest.get())) {
-        ZELO_LOG("Cannot find available Connection[%s]", json_text::ToLogText(candidates).c_str());
+        ZELO_LOG("Cannot find available Connection[%s]", json::ToLogText(candidates).c_str());
         return -1;
     }
     if (!SaveServer(pCred.get())) {

@@ -10,7 +10,7 @@
 #include "fixed_text.h"
 #include "guard.h"
 #include "host_name.h"
-#include "json_text.h"
+#include "json.h"
 #include "log.h"
 #include "platform_handles.h"
 #include "strings_file.h"
@@ -288,13 +288,12 @@ int Push(int level, const char *szSection, const char *szKey, YLIBSZLIST *pslPar
 
     Json::Value reply;
     if (ZELOQRMClientSendWebapi(reply, kApi, kVersion, kMethod, request, false) < 0) {
-        ZELO_LOG("push log webapi failed, jsReq=%s", json_text::ToLogText(request).c_str());
+        ZELO_LOG("push log webapi failed, jsReq=%s", json::ToLogText(request).c_str());
         return -1;
     }
-    const Json::Value &success = json_text::Member(reply, "success");
+    const Json::Value &success = json::Member(reply, "success");
     if (!success.isBool() || !success.asBool()) {
-        ZELO_LOG("push log webapi response failed, jsReq=%s",
-                 json_text::ToLogText(request).c_str());
+        ZELO_LOG("push log webapi response failed, jsReq=%s", json::ToLogText(request).c_str());
         return -1;
     }
     return 0;

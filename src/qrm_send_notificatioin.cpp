@@ -1,7 +1,7 @@
 // Notifications of the server link to the appliance's own users.
 
 #include "guard.h"
-#include "json_text.h"
+#include "json.h"
 #include "log.h"
 #include "notification.h"
 #include "platform_handles.h"
@@ -18,7 +18,7 @@ void SetServerVariable(YLIBSZHASH **ppHash) {
     if (YLIBCSzHashGetValue(*ppHash, kServerVariable) != nullptr) {
         return;
     }
-    const char *szHost = json_text::Text(json_text::Member(server, "host"));
+    const char *szHost = json::Text(json::Member(server, "host"));
     if (YLIBCSzHashSetValue(ppHash, kServerVariable, szHost == nullptr ? "Unknown" : szHost) < 0) {
         ZELO_LOG("Failed to YLIBCSzHashSetValue[0x%04X %s:%d]", ZELO_LAST_ERROR);
     }

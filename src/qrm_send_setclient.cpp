@@ -1,15 +1,15 @@
 // Client info update: the joined server's entry for this appliance is brought up to date.
 
 #include "guard.h"
-#include "json_text.h"
+#include "json.h"
 #include "log.h"
 #include "qrm_client_description.h"
 #include "zeloqrmclient.h"
 
 namespace {
 
-using json_text::HasMember;
-using json_text::Member;
+using json::HasMember;
+using json::Member;
 
 constexpr const char *kApi = "ZELO.QRM.RPC.ClientInfo";
 constexpr const char *kMethod = "update";
@@ -59,10 +59,10 @@ int Update(const Json::Value &info) {
         ZELO_LOG("Send create client failed. (%d)", kNoReply);
         return -1;
     }
-    if (json_text::IsTrue(Member(reply, "success"))) {
+    if (json::IsTrue(Member(reply, "success"))) {
         return 0;
     }
-    ZELO_LOG("Send create client failed. (%d)", json_text::ErrorCode(reply));
+    ZELO_LOG("Send create client failed. (%d)", json::ErrorCode(reply));
     return -1;
 }
 

@@ -16,6 +16,7 @@
 #include "file_system.h"
 #include "fixed_text.h"
 #include "guard.h"
+#include "json.h"
 #include "json_text.h"
 #include "log.h"
 #include "platform_handles.h"
@@ -24,7 +25,7 @@
 
 namespace {
 
-using json_text::Member;
+using json::Member;
 
 constexpr const char *kApplication = "ZELO.QRM";
 constexpr long kDefaultRecord = -1;
@@ -127,7 +128,7 @@ void LogReply(const std::string &api, const std::string &method, const std::stri
 }
 
 const char *StatusOfFailure(const Json::Value &reply) {
-    const int code = json_text::ErrorCode(reply);
+    const int code = json::ErrorCode(reply);
     return code >= 105 && code <= 107 ? "no_permission" : "error";
 }
 
@@ -161,7 +162,7 @@ bool Call(Json::Value &resp, const std::string &api, int ver, const std::string 
         LogReply(api, method, strReply);
         return false;
     }
-    if (json_text::IsTrue(Member(reply, "success"))) {
+    if (json::IsTrue(Member(reply, "success"))) {
         SetStatus("success");
     } else {
         LogReply(api, method, strReply);

@@ -7,6 +7,7 @@
 #include "credential_store.h"
 #include "fixed_text.h"
 #include "guard.h"
+#include "json.h"
 #include "json_text.h"
 #include "log.h"
 #include "platform_handles.h"
@@ -14,9 +15,9 @@
 
 namespace {
 
-using json_text::HasMember;
-using json_text::Member;
-using json_text::Text;
+using json::HasMember;
+using json::Member;
+using json::Text;
 
 constexpr const char *kApplication = "ZELO.QRM";
 constexpr const char *kNotificationCenter = "ZELO.NotificationCenter";
@@ -34,7 +35,7 @@ bool SetText(int (*pfnSet)(Record *, const char *), Record *pRecord, const Json:
 
 bool SetPort(ZELO_CRED *pCred, const Json::Value &value) {
     int port = 0;
-    return json_text::ReadInt(value, port) && ZELOCredItemSetPort(pCred, port) >= 0;
+    return json::ReadInt(value, port) && ZELOCredItemSetPort(pCred, port) >= 0;
 }
 
 bool SetExtraInfo(ZELO_CRED *pCred, const Json::Value &value) {

@@ -11,6 +11,7 @@
 
 #include "fixed_text.h"
 #include "guard.h"
+#include "json.h"
 #include "json_text.h"
 #include "locked_file.h"
 #include "log.h"
@@ -364,7 +365,7 @@ bool ShowPages(const char *szUser, bool blShow) {
         KeepModeAndOwner(old, file.Get());
     }
     if (!file.IsHeld() || !json_text::ToFile(settings, file.Get())) {
-        ZELO_LOG("Failed to write usersettins [%s] to [%s]", json_text::ToLogText(settings).c_str(),
+        ZELO_LOG("Failed to write usersettins [%s] to [%s]", json::ToLogText(settings).c_str(),
                  temporary.sz());
         return false;
     }

@@ -1,0 +1,151 @@
+// The system's account files, read and changed with the C library's account functions.
+//
+// A file is held as its lines. The C library reads each of them, and it writes the one that
+// changes; every other line goes back byte for byte, whatever it holds (a comment, an entry in an
+// odd form).
+
+#ifndef ZELO_HOST_ACCOUNT_FILES_H
+#define ZELO_HOST_ACCOUNT_FILES_H
+
+#include <grp.h>
+#include <gshadow.h>
+#include <pwd.h>
+#include <shadow.h>
+
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "files/trusted_file.h"
+
+namespace host {
+
+struct PasswdFormat {
+    using Entry = passwd;
+    static constexpr const char *kPath = "/etc/passwd";
+    static constexpr bool kRequired = true;
+    static constexpr auto kRead = fgetpwent_r;
+    static constexpr auto kWrite = putpwent;
+    static constexpr auto kName = &passwd::pw_name;
+};
+
+struct ShadowFormat {
+    using Entry = spwd;
+    static constexpr const char *kPath = "/etc/shadow";
+    static constexpr bool kRequired = false;
+    static constexpr auto kRead = fgetspent_r;
+    static constexpr auto kWrite = putspent;
+    static constexpr auto kName = &spwd::sp_namp;
+};
+
+struct GroupFormat {
+    using Entry = group;
+    static constexpr const char *kPath = "/etc/group";
+    static constexpr bool kRequired = true;
+    static constexpr auto kRead = fgetgrent_r;
+    static constexpr auto kWrite = putgrent;
+    static constexpr auto kName = &group::gr_name;
+};
+
+struct GroupShadowFormat {
+    using Entry = sgrp;
+    static constexpr const char *kPath = "/etc/gshadow";
+    static constexpr bool kRequired = false;
+    static constexpr auto kRead = fgetsgent_r;
+    static constexpr auto kWrite = putsgent;
+    static constexpr auto kName = &sgrp::sg_namp;
+};
+
+// The texts of a list that ends with a null, without that null.
+inline std::vector<char *> ListTexts(char **ppszList) {
+    std::vector<char *> texts;
+    for (; *ppszList != nullptr; ++ppszList) {
+        texts.push_back(*ppszList);
+    }
+    return texts;
+}
+
+// Where an operation can fail it returns false with the error set. Entries that are handed out live
+// until they are replaced or one is removed.
+template <typename Format>
+class AccountFile {
+  public:
+    using Entry = typename Format::Entry;
+
+    // Reads the file. A shadow file that is not there has no entries and does not exist; without
+    // one of the other two nobody can say which accounts there are.
+    bool Read();
+    bool Exists() const { return m_found.file.IsOpen(); }
+
+    // The entry of this name, of several the first; null when there is none.
+    const Entry *Find(const std::string &strName) const;
+
+    // All entries, in the order of the file.
+    std::vector<const Entry *> Entries() const;
+
+    // Puts the entry in the place of one of the file's own, which it may share texts with; at the
+    // file's end when pPlace is null. The other entries that were handed out stay valid.
+    bool Put(const Entry &entry, const Entry *pPlace);
+
+    // Removes every entry of this name.
+    void Remove(const std::string &strName);
+
+    // Replaces the file, if anything has changed.
+    bool Write();
+
+    // Puts the content back that was read, where Write has replaced it; as far as that is possible.
+    void PutBack();
+
+  private:
+    static constexpr auto kName = Format::kName;
+
+    struct Line {
+        std::string strText;
+        Entry entry = {};
+        std::unique_ptr<char[]> texts;  // what the entry's pointers lead to; null: no entry
+    };
+
+    // Reads the entry from the line's text, if it holds one.
+    static void Parse(Line &line);
+
+    FoundFile m_found;
+    std::string m_strRead;
+    std::vector<Line> m_lines;
+    bool m_blWritten = false;
+};
+
+using PasswdFile = AccountFile<PasswdFormat>;
+using ShadowFile = AccountFile<ShadowFormat>;
+using GroupFile = AccountFile<GroupFormat>;
+using GroupShadowFile = AccountFile<GroupShadowFormat>;
+
+// Replaces the files in this order. When one cannot be written, those before it get their old
+// content back. Readers who look in between see the first files already new: the file that makes an
+// account exist goes last.
+template <typename... Files>
+bool WriteInOrder(Files &...files) {
+    if ((files.Write() && ...)) {
+        return true;
+    }
+    (files.PutBack(), ...);
+    return false;
+}
+
+// The system's lock on its account files, which the shadow suite's programs take too.
+class AccountLock {
+  public:
+    AccountLock();
+    ~AccountLock();
+    AccountLock(const AccountLock &) = delete;
+    AccountLock &operator=(const AccountLock &) = delete;
+
+    // False, with the error set, when the lock could not be had in time.
+    bool IsHeld() const { return m_blHeld; }
+
+  private:
+    bool m_blHeld = false;
+};
+
+}  // namespace host
+
+#endif

@@ -1,0 +1,120 @@
+// Disk idle timer: the time is kept as a key of the platform's configuration; a disk that spins
+// gets it through the kernel's runtime power management, where its driver offers that.
+
+#include "idle_timer.h"
+
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstdlib>
+#include <filesystem>
+#include <limits>
+#include <new>
+#include <string>
+
+#include "files/key_value_lookup.h"
+#include "key_value_file.h"
+#include "status.h"
+
+namespace {
+
+namespace fs = std::filesystem;
+
+constexpr const char *kFile = "idle_timer";
+constexpr const char *kKey = "disk_idle_minutes";
+constexpr unsigned long kDefault_min = 20;
+constexpr const char *kDisks = "/sys/block";
+constexpr unsigned long kMsPerMinute = 60'000;
+
+bool ReadNumber(const std::string &strText, unsigned long &number) {
+    char *szEnd = nullptr;
+    errno = 0;
+    number = std::strtoul(strText.c_str(), &szEnd, 10);
+    return !strText.empty() && strText[0] >= '0' && strText[0] <= '9' && *szEnd == '\0' &&
+           errno == 0;
+}
+
+bool WriteAttribute(const fs::path &path, const std::string &strText) {
+    const int fd = open(path.c_str(), O_WRONLY | O_CLOEXEC);
+    const bool blWritten = fd >= 0 && write(fd, strText.data(), strText.size()) ==
+                                          static_cast<ssize_t>(strText.size());
+    if (fd >= 0) {
+        close(fd);
+    }
+    return blWritten;
+}
+
+bool Spins(const fs::path &disk) {
+    const int fd = open((disk / "queue/rotational").c_str(), O_RDONLY | O_CLOEXEC);
+    char c = '0';
+    const bool blRead = fd >= 0 && read(fd, &c, 1) == 1;
+    if (fd >= 0) {
+        close(fd);
+    }
+    return blRead && c == '1';
+}
+
+void ApplyTo(const fs::path &disk, unsigned long idleTime) {
+    const fs::path power = disk / "device/power";
+    if (idleTime == 0) {
+        WriteAttribute(power / "control", "on");
+        return;
+    }
+    constexpr unsigned long kLongest_min = std::numeric_limits<int>::max() / kMsPerMinute;
+    const unsigned long delay_ms = std::min(idleTime, kLongest_min) * kMsPerMinute;
+    // A driver without the timer refuses the delay; without a delay the disk would sleep at once.
+    if (WriteAttribute(power / "autosuspend_delay_ms", std::to_string(delay_ms))) {
+        WriteAttribute(power / "control", "auto");
+    }
+}
+
+void Apply(unsigned long idleTime) {
+    std::error_code error;
+    for (fs::directory_iterator disk(kDisks, error); !error && disk != fs::directory_iterator();
+         disk.increment(error)) {
+        if (Spins(disk->path())) {
+            ApplyTo(disk->path(), idleTime);
+        }
+    }
+}
+
+}  // namespace
+
+int ZELODiskAllIdleTimerGet(unsigned long *pIdleTime) {
+    if (pIdleTime == nullptr) {
+        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
+    }
+    try {
+        std::string strValue;
+        unsigned long idleTime = kDefault_min;
+        switch (host::LookUpKey(host::kConfigFile, kKey, strValue)) {
+            case host::LookUp::kUnreadable:
+                return -1;
+            case host::LookUp::kFound:
+                if (!ReadNumber(strValue, idleTime)) {
+                    return HOST_FAIL(YLIBC_ERR_FILE);
+                }
+                break;
+            default:
+                break;
+        }
+        *pIdleTime = idleTime;
+        return 0;
+    } catch (const std::bad_alloc &) {
+        return HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
+    }
+}
+
+int ZELODiskAllIdleTimerSet(unsigned long idleTime) {
+    try {
+        if (YLIBCINFOSetKeyValue(kKey, std::to_string(idleTime).c_str()) < 0) {
+            return -1;
+        }
+        Apply(idleTime);
+        return 0;
+    } catch (const std::bad_alloc &) {
+        return HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
+    }
+}

@@ -1,0 +1,112 @@
+// Files and directories by the system's own calls.
+
+#include "file_system.h"
+
+#include <fcntl.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <new>
+#include <string>
+
+#include "file_descriptor.h"
+#include "status.h"
+
+namespace {
+
+constexpr const char *kFile = "file_system";
+
+struct Owner {
+    bool blSet;
+    uid_t uid;
+    gid_t gid;
+};
+
+// An ordinary user may not give directories away, and root of a user namespace only to the users
+// that there are in it.
+bool SetOwnerAndMode(int fd, const Owner &owner, mode_t mode) {
+    if (owner.blSet && fchown(fd, owner.uid, owner.gid) != 0 && errno != EPERM && errno != EINVAL) {
+        return false;
+    }
+    return fchmod(fd, mode) == 0;
+}
+
+// Whether it is a link that may be followed. One that somebody else has put into a folder that
+// everybody can write to may lead into a folder of the caller's. What is no link now may be one of
+// theirs in the next moment.
+bool IsTrustedLink(int parent, const char *szName) {
+    struct stat folder = {};
+    struct stat entry = {};
+    return fstatat(parent, szName, &entry, AT_SYMLINK_NOFOLLOW) == 0 && S_ISLNK(entry.st_mode) &&
+           fstat(parent, &folder) == 0 &&
+           ((folder.st_mode & S_IWOTH) == 0 || entry.st_uid == geteuid() ||
+            entry.st_uid == folder.st_uid);
+}
+
+// Opens a directory in the parent, creating it when there is nothing of that name.
+host::FileDescriptor OpenDirectory(int parent, const char *szName, const Owner &owner,
+                                   mode_t mode) {
+    constexpr int kLook = O_PATH | O_DIRECTORY | O_CLOEXEC;
+    constexpr int kChange = O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC;
+    host::FileDescriptor entry(openat(parent, szName, kLook | O_NOFOLLOW));
+    if (entry.IsOpen()) {
+        return entry;
+    }
+    if (errno == ENOTDIR) {
+        return host::FileDescriptor(IsTrustedLink(parent, szName) ? openat(parent, szName, kLook)
+                                                                  : -1);
+    }
+    if (errno != ENOENT) {
+        return entry;
+    }
+    if (mkdirat(parent, szName, mode) != 0) {
+        // Another process may have been quicker.
+        return host::FileDescriptor(errno == EEXIST ? openat(parent, szName, kLook | O_NOFOLLOW)
+                                                    : -1);
+    }
+    host::FileDescriptor created(openat(parent, szName, kChange));
+    if (created.IsOpen() && !SetOwnerAndMode(created.Get(), owner, mode)) {
+        return host::FileDescriptor();
+    }
+    return created;
+}
+
+int MakeDirectories(const std::string &strPath, const Owner &owner, mode_t mode) {
+    host::FileDescriptor parent(
+        open(strPath.front() == '/' ? "/" : ".", O_PATH | O_DIRECTORY | O_CLOEXEC));
+    std::size_t begin = strPath.find_first_not_of('/');
+    while (parent.IsOpen() && begin != std::string::npos) {
+        const std::size_t end = std::min(strPath.find('/', begin), strPath.size());
+        const std::string strName = strPath.substr(begin, end - begin);
+        parent = OpenDirectory(parent.Get(), strName.c_str(), owner, mode);
+        begin = strPath.find_first_not_of('/', end);
+    }
+    return parent.IsOpen() ? 0 : HOST_FAIL(YLIBC_ERR_FILE);
+}
+
+}  // namespace
+
+int YLIBCFileStat(const char *szPath, int blNoFollow, struct stat *pStatus) {
+    if (szPath == nullptr || pStatus == nullptr) {
+        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
+    }
+    struct stat status = {};
+    if (fstatat(AT_FDCWD, szPath, &status, blNoFollow != 0 ? AT_SYMLINK_NOFOLLOW : 0) != 0) {
+        return HOST_FAIL(errno == ENOENT || errno == ENOTDIR ? YLIBC_ERR_NOT_FOUND
+                                                             : YLIBC_ERR_FILE);
+    }
+    *pStatus = status;
+    return 0;
+}
+
+int ZELOFSMkdirP(const char *szPath, int /*flags*/, int blOwner, int uid, int gid, mode_t mode) {
+    if (szPath == nullptr || szPath[0] == '\0') {
+        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
+    }
+    try {
+        const Owner owner = {blOwner != 0, static_cast<uid_t>(uid), static_cast<gid_t>(gid)};
+        return MakeDirectories(szPath, owner, mode);
+    } catch (const std::bad_alloc &) {
+        return HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
+    }
+}
