@@ -24,8 +24,9 @@ class Descriptor {
     Descriptor(const Descriptor &) = delete;
     Descriptor &operator=(const Descriptor &) = delete;
 
-    // The descriptor; negative when there is none.
+    // The open call's result: negative when there is nothing open.
     int Get() const { return m_fd; }
+    bool IsOpen() const { return m_fd >= 0; }
 
   private:
     int m_fd = -1;

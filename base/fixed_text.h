@@ -3,6 +3,7 @@
 #ifndef ZELO_FIXED_TEXT_H
 #define ZELO_FIXED_TEXT_H
 
+#include <algorithm>
 #include <cstdarg>
 #include <cstddef>
 #include <cstdio>
@@ -10,35 +11,43 @@
 #include <initializer_list>
 #include <string_view>
 
-// Takes away a UTF-8 character of which only the beginning is left at the end of a text that was
-// cut.
-inline void DropPartialCharacter(char *szText) {
-    std::size_t cb = std::strlen(szText);
+// Takes away a UTF-8 character of which only the beginning is left at the end of a text of cb
+// bytes that was cut. Returns the length that is left.
+inline std::size_t DropPartialCharacter(char *szText, std::size_t cb) {
     std::size_t begin = cb;
     while (begin > 0 && cb - begin < 3 && (szText[begin - 1] & 0xC0) == 0x80) {
         --begin;
     }
     if (begin == 0 || (szText[begin - 1] & 0x80) == 0) {
-        return;
+        return cb;
     }
     const auto lead = static_cast<unsigned char>(szText[--begin]);
     const std::size_t whole = lead >= 0xF0 ? 4 : lead >= 0xE0 ? 3 : lead >= 0xC0 ? 2 : 1;
-    if (cb - begin < whole) {
-        szText[begin] = '\0';
+    if (cb - begin >= whole) {
+        return cb;
     }
+    szText[begin] = '\0';
+    return begin;
 }
 
 // Copies a text into a caller's buffer of cbOut bytes, cut to fit and never inside a UTF-8
-// character.
-inline void CopyToFit(char *szOut, int cbOut, const char *szText) {
+// character, and zero-terminated. Returns the number of bytes copied; a buffer without room stays
+// as it is.
+inline int CopyToFit(char *szOut, int cbOut, std::string_view text) {
     if (cbOut <= 0) {
-        return;
+        return 0;
     }
-    const auto size = static_cast<std::size_t>(cbOut);
-    if (memccpy(szOut, szText, '\0', size) == nullptr) {
-        szOut[size - 1] = '\0';
-        DropPartialCharacter(szOut);
+    std::size_t cb = std::min(text.size(), static_cast<std::size_t>(cbOut) - 1);
+    szOut[text.copy(szOut, cb)] = '\0';
+    if (cb < text.size()) {
+        cb = DropPartialCharacter(szOut, cb);
     }
+    return static_cast<int>(cb);
+}
+
+inline int CopyToFit(char *szOut, int cbOut, const char *szText) {
+    const std::size_t cbMost = cbOut <= 0 ? 0 : static_cast<std::size_t>(cbOut);
+    return CopyToFit(szOut, cbOut, std::string_view(szText, strnlen(szText, cbMost)));
 }
 
 // A buffer of N bytes that holds zero-terminated text of at most N - 1 bytes, at first none. It is
@@ -85,7 +94,7 @@ class FixedText {
     std::size_t FormatV(const char *szFormat, va_list args) __attribute__((format(printf, 2, 0))) {
         const int cb = std::vsnprintf(m_sz, N, szFormat, args);
         if (cb >= Size()) {
-            DropPartialCharacter(m_sz);
+            DropPartialCharacter(m_sz, N - 1);
         }
         return cb < 0 ? 0 : static_cast<std::size_t>(cb);
     }
@@ -95,7 +104,7 @@ class FixedText {
     void End() const {
         if (m_sz[N - 1] != '\0') {
             m_sz[N - 1] = '\0';
-            DropPartialCharacter(m_sz);
+            DropPartialCharacter(m_sz, N - 1);
         }
     }
 

@@ -1,17 +1,12 @@
 #include "json.h"
 
-#include <fcntl.h>
 #include <json/reader.h>
 #include <json/writer.h>
-#include <sys/stat.h>
-#include <unistd.h>
 
 #include <algorithm>
-#include <cerrno>
 #include <cstring>
 #include <string_view>
 
-#include "descriptor.h"
 #include "printable.h"
 
 namespace json {

@@ -20,6 +20,7 @@ enum YLIBC_ERROR {
     YLIBC_ERR_FILE = 0x0400,           // a file or directory could not be opened, read or written
     YLIBC_ERR_BUSY = 0x0401,           // a lock was held elsewhere for too long
     YLIBC_ERR_UNSAFE_FILE = 0x0402,    // a link, or somebody else's file, stands where ours should
+    YLIBC_ERR_DEADLINE = 0x0403,       // the process's deadline ended a wait (diagnosis.h)
     YLIBC_ERR_STORE = 0x0500,          // a database refused an operation
     YLIBC_ERR_STORE_BUSY = 0x0501,     // another process kept the database locked for too long
     YLIBC_ERR_STORE_DAMAGED = 0x0502,  // the database file is damaged or of another format

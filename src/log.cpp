@@ -3,44 +3,25 @@
 #include <syslog.h>
 
 #include <cstdarg>
-#include <cstring>
 #include <string_view>
 
 #include "fixed_text.h"
 #include "printable.h"
 #include "secret_search.h"
+#include "system_log.h"
 
 namespace qrm_log {
 namespace {
-
-// What the usual log daemons take in one message.
-constexpr std::size_t kMaxMessage = 8000;
 
 // How much of a line text from outside may take.
 constexpr std::size_t kMaxOutside = 7000;
 
 constexpr const char *kBlank = "***";
 
-// Copies the text made safe for a line; false, with whole characters, when it is cut.
-bool CopySafe(std::string_view text, FixedText<kMaxMessage> &out) {
-    std::size_t cb = 0;
-    for (std::size_t at = 0; at < text.size();) {
-        const printable::Shown shown = printable::ShowAt(text, at);
-        const std::size_t cbShown = std::strlen(shown.text.sz());
-        if (cbShown >= kMaxMessage - cb) {
-            return false;
-        }
-        std::memcpy(out.Buffer() + cb, shown.text.sz(), cbShown);
-        cb += cbShown;
-        at += shown.cb;
-    }
-    return true;
-}
-
 }  // namespace
 
 void Write(const char *szStem, int line, const char *szFormat, ...) {
-    FixedText<kMaxMessage> message;
+    FixedText<system_log::kMaxMessage> message;
     va_list args;
     va_start(args, szFormat);
     const std::size_t cbWhole = message.FormatV(szFormat, args);
@@ -48,15 +29,11 @@ void Write(const char *szStem, int line, const char *szFormat, ...) {
 
     // A line feed at the end of the fixed text stays one.
     std::string_view text = message.sz();
+    const bool blCut = cbWhole > text.size();
     const bool blEnded =
         !text.empty() && text.back() == '\n' && std::string_view(szFormat).back() == '\n';
     text.remove_suffix(blEnded ? 1 : 0);
-    FixedText<kMaxMessage> safe;
-    if (CopySafe(text, safe) && cbWhole < kMaxMessage) {
-        syslog(LOG_ERR, "%s:%d %s%s", szStem, line, safe.sz(), blEnded ? "\n" : "");
-    } else {
-        syslog(LOG_ERR, "%s:%d %s... [cut, %zu bytes in all]", szStem, line, safe.sz(), cbWhole);
-    }
+    system_log::Write(LOG_ERR, szStem, line, text, blCut ? cbWhole : 0, blEnded ? "\n" : "");
 }
 
 std::string SafeText(const std::string &strText, const std::vector<std::string> &secrets) {

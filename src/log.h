@@ -11,31 +11,9 @@
 #include <vector>
 
 #include "last_error.h"
+#include "source_stem.h"
 
 namespace qrm_log {
-
-// A source file's name without directory and suffix, worked out while compiling, so that no path of
-// the build machine gets into the library.
-template <std::size_t N>
-struct SourceStem {
-    char sz[N] = {};
-
-    constexpr explicit SourceStem(const char (&szPath)[N]) {
-        std::size_t begin = 0;
-        std::size_t end = N - 1;
-        for (std::size_t i = 0; i + 1 < N; ++i) {
-            if (szPath[i] == '/') {
-                begin = i + 1;
-                end = N - 1;
-            } else if (szPath[i] == '.') {
-                end = i;
-            }
-        }
-        for (std::size_t i = begin; i < end; ++i) {
-            sz[i - begin] = szPath[i];
-        }
-    }
-};
 
 // Writes one line, made printable (printable.h). Never throws and allocates nothing, so it works
 // when memory is short.
@@ -48,12 +26,6 @@ void Write(const char *szStem, int line, const char *szFormat, ...)
 std::string SafeText(const std::string &strText, const std::vector<std::string> &secrets);
 
 }  // namespace qrm_log
-
-#define ZELO_SOURCE_STEM                                       \
-    ([]() -> const char * {                                    \
-        static constexpr ::qrm_log::SourceStem stem(__FILE__); \
-        return stem.sz;                                        \
-    }())
 
 // The arguments for a message that ends in "[0x%04X %s:%d]": why a platform operation failed.
 #define ZELO_LAST_ERROR YLIBCErrGet(), YLIBCErrorGetFile(), YLIBCErrorGetLine()

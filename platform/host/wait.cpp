@@ -12,8 +12,8 @@
 #include <new>
 #include <string>
 
+#include "fixed_text.h"
 #include "status.h"
-#include "text_buffer.h"
 #include "waiting.h"
 
 namespace {
@@ -118,7 +118,7 @@ int ZELOWaitingFor(char *sz, int cb) {
         for (const Place *pPlace = Oldest(turn); pPlace != nullptr; pPlace = Oldest(turn)) {
             const std::string strText = TextOf(*pPlace, turn);
             if (!strText.empty()) {
-                return host::CopyWholeCharacters(strText, sz, cb);
+                return CopyToFit(sz, cb, strText);
             }
         }
         return 0;

@@ -12,7 +12,7 @@
 #include <utility>
 
 #include "files/file_replacement.h"
-#include "held_mutex.h"
+#include "fork_safe.h"
 #include "status.h"
 #include "wait.h"
 

@@ -13,9 +13,9 @@
 #include "account_change.h"
 #include "file_system.h"
 #include "files/key_value_lookup.h"
+#include "fixed_text.h"
 #include "key_value_file.h"
 #include "status.h"
-#include "text_buffer.h"
 
 namespace {
 
@@ -110,7 +110,7 @@ int Report(int result, int nUsers, const std::string &strFirst, YLIBCM_RESULT **
         record.nDone = nUsers;
     } else {
         record.nFailed = nUsers;
-        host::CopyText(strFirst, record.szFailed, sizeof(record.szFailed));
+        CopyToFit(record.szFailed, sizeof(record.szFailed), strFirst);
     }
     return result;
 }
@@ -257,7 +257,7 @@ int ZELOUserPreferenceDirGet(const char *szName, char *szPath, int cbPath) {
             ZELOFSMkdirP(strPath.c_str(), 0, 0, 0, 0, kPreferenceMode) < 0) {
             return -1;
         }
-        host::CopyText(strPath, szPath, cbPath);
+        CopyToFit(szPath, cbPath, strPath);
         return 0;
     });
 }

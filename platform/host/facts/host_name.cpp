@@ -7,8 +7,8 @@
 #include <climits>
 #include <new>
 
+#include "fixed_text.h"
 #include "status.h"
-#include "text_buffer.h"
 
 namespace {
 
@@ -25,7 +25,7 @@ int ZELOLnxGetHostname(char *szHostName) {
         return HOST_FAIL(YLIBC_ERR_NOT_FOUND);
     }
     try {
-        return host::CopyText(szWhole, szHostName, ZELO_LNX_HOSTNAME_SIZE);
+        return CopyToFit(szHostName, ZELO_LNX_HOSTNAME_SIZE, szWhole);
     } catch (const std::bad_alloc &) {
         return HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
     }

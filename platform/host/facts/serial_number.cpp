@@ -8,8 +8,8 @@
 #include <new>
 #include <string>
 
+#include "fixed_text.h"
 #include "status.h"
-#include "text_buffer.h"
 
 namespace {
 
@@ -37,7 +37,7 @@ int YLIBGetCustomSerialNumber(char *szSerial, int cbSerial) {
         if (file ? !ReadFirstLine(file, strSerial) : errno != ENOENT) {
             return HOST_FAIL(YLIBC_ERR_FILE);
         }
-        return host::CopyText(strSerial, szSerial, cbSerial);
+        return CopyToFit(szSerial, cbSerial, strSerial);
     } catch (const std::bad_alloc &) {
         return HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
     }
@@ -53,7 +53,7 @@ int YLIBGetSerialNumber(char *szSerial, int cbSerial) {
         if (!file || !ReadFirstLine(file, strSerial) || strSerial.empty()) {
             return HOST_FAIL(YLIBC_ERR_NOT_FOUND);
         }
-        return host::CopyText(strSerial, szSerial, cbSerial);
+        return CopyToFit(szSerial, cbSerial, strSerial);
     } catch (const std::bad_alloc &) {
         return HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
     }

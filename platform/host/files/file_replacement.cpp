@@ -29,7 +29,7 @@ constexpr int kCreate = O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC;
 // Goes when it was not put in place.
 struct TemporaryFile {
     std::string strPath;
-    FileDescriptor file;
+    Descriptor file;
     struct stat status = {};
     bool blPlaced = false;
 
@@ -49,7 +49,7 @@ struct TemporaryFile {
 // that writer's to remove.
 bool CreateUnderUsualName(const FoundFile &found, mode_t mode, TemporaryFile &temporary) {
     temporary.strPath = found.strFolder + '.' + found.strName + ".zelo-new";
-    FileDescriptor file(open(temporary.strPath.c_str(), kCreate, mode));
+    Descriptor file(open(temporary.strPath.c_str(), kCreate, mode));
     if (!file.IsOpen()) {
         return false;
     }
@@ -65,7 +65,7 @@ bool CreateUnderUsualName(const FoundFile &found, mode_t mode, TemporaryFile &te
 // Only the writer who has the file's lock renames or removes it, so under the lock a name that
 // leads to the file goes on doing so.
 bool RemoveLeftover(const char *szPath) {
-    const FileDescriptor file(open(szPath, O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC));
+    const Descriptor file(open(szPath, O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC));
     struct stat opened = {};
     struct stat named = {};
     return file.IsOpen() && fstat(file.Get(), &opened) == 0 && IsOwnFile(opened) &&
@@ -81,7 +81,7 @@ bool CreateUnderRandomName(mode_t mode, TemporaryFile &temporary) {
     char szNumber[24];
     std::snprintf(szNumber, sizeof(szNumber), "-%016llx", static_cast<unsigned long long>(number));
     temporary.strPath += szNumber;
-    temporary.file = FileDescriptor(open(temporary.strPath.c_str(), kCreate, mode));
+    temporary.file = Descriptor(open(temporary.strPath.c_str(), kCreate, mode));
     return temporary.file.IsOpen() && fstat(temporary.file.Get(), &temporary.status) == 0;
 }
 
@@ -123,7 +123,7 @@ bool WriteAll(int fd, std::string_view content) {
 }
 
 bool SyncFolder(const std::string &strFolder) {
-    const FileDescriptor folder(
+    const Descriptor folder(
         open(strFolder.empty() ? "." : strFolder.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
     return folder.IsOpen() && fsync(folder.Get()) == 0;
 }

@@ -9,7 +9,7 @@
 #include <new>
 #include <string>
 
-#include "file_descriptor.h"
+#include "descriptor.h"
 #include "status.h"
 
 namespace {
@@ -44,36 +44,32 @@ bool IsTrustedLink(int parent, const char *szName) {
 }
 
 // Opens a directory in the parent, creating it when there is nothing of that name.
-host::FileDescriptor OpenDirectory(int parent, const char *szName, const Owner &owner,
-                                   mode_t mode) {
+Descriptor OpenDirectory(int parent, const char *szName, const Owner &owner, mode_t mode) {
     constexpr int kLook = O_PATH | O_DIRECTORY | O_CLOEXEC;
     constexpr int kChange = O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC;
-    host::FileDescriptor entry(openat(parent, szName, kLook | O_NOFOLLOW));
+    Descriptor entry(openat(parent, szName, kLook | O_NOFOLLOW));
     if (entry.IsOpen()) {
         return entry;
     }
     if (errno == ENOTDIR) {
-        return host::FileDescriptor(IsTrustedLink(parent, szName) ? openat(parent, szName, kLook)
-                                                                  : -1);
+        return Descriptor(IsTrustedLink(parent, szName) ? openat(parent, szName, kLook) : -1);
     }
     if (errno != ENOENT) {
         return entry;
     }
     if (mkdirat(parent, szName, mode) != 0) {
         // Another process may have been quicker.
-        return host::FileDescriptor(errno == EEXIST ? openat(parent, szName, kLook | O_NOFOLLOW)
-                                                    : -1);
+        return Descriptor(errno == EEXIST ? openat(parent, szName, kLook | O_NOFOLLOW) : -1);
     }
-    host::FileDescriptor created(openat(parent, szName, kChange));
+    Descriptor created(openat(parent, szName, kChange));
     if (created.IsOpen() && !SetOwnerAndMode(created.Get(), owner, mode)) {
-        return host::FileDescriptor();
+        return Descriptor();
     }
     return created;
 }
 
 int MakeDirectories(const std::string &strPath, const Owner &owner, mode_t mode) {
-    host::FileDescriptor parent(
-        open(strPath.front() == '/' ? "/" : ".", O_PATH | O_DIRECTORY | O_CLOEXEC));
+    Descriptor parent(open(strPath.front() == '/' ? "/" : ".", O_PATH | O_DIRECTORY | O_CLOEXEC));
     std::size_t begin = strPath.find_first_not_of('/');
     while (parent.IsOpen() && begin != std::string::npos) {
         const std::size_t end = std::min(strPath.find('/', begin), strPath.size());

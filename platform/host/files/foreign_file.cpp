@@ -10,7 +10,7 @@
 #include <cstdio>
 #include <cstring>
 
-#include "file_descriptor.h"
+#include "descriptor.h"
 #include "file_lock.h"
 #include "status.h"
 
@@ -109,7 +109,7 @@ bool PrepareLockFile(const char *szPath) {
         // Where nobody can hold it, nobody removes what is created meanwhile.
         return !lock.IsHeldElsewhere();
     }
-    const FileDescriptor file(open(szPath, O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0600));
+    const Descriptor file(open(szPath, O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0600));
     return !file.IsOpen() && errno != EEXIST;
 }
 

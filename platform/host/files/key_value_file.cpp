@@ -9,10 +9,10 @@
 
 #include "file_lock.h"
 #include "file_replacement.h"
+#include "fixed_text.h"
 #include "key_value_lookup.h"
 #include "status.h"
 #include "strings/hash_place.h"
-#include "text_buffer.h"
 #include "trusted_file.h"
 
 namespace {
@@ -162,7 +162,7 @@ bool ReadForChange(const char *szPath, OldFile &old) {
 
 int Replace(OldFile &old, const std::string &strNew) {
     // A file system takes longer to replace a file that is still open.
-    old.found.file = host::FileDescriptor();
+    old.found.file = Descriptor();
     return host::ReplaceFile(old.found, strNew);
 }
 
@@ -274,7 +274,7 @@ int YLIBCFileGetKeyValue(const char *szPath, const char *szKey, char *szValue, i
         std::string strValue;
         switch (host::LookUpKey(szPath, szKey, strValue)) {
             case host::LookUp::kFound:
-                return host::CopyText(strValue, szValue, cbValue);
+                return CopyToFit(szValue, cbValue, strValue);
             case host::LookUp::kAbsent:
                 HOST_FAIL(YLIBC_ERR_NOT_FOUND);
                 return 0;

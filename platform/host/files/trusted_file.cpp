@@ -100,7 +100,7 @@ Find FindFile(const char *szPath, FoundFile &found) {
     SetPath(found, szPath);
     for (int links = 0; links <= kMaxLinks; ++links) {
         RemoveForeignFile(found.Path());
-        found.file = FileDescriptor(
+        found.file = Descriptor(
             open(found.Path().c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
         found.blThere = found.file.IsOpen();
         if (found.blThere) {

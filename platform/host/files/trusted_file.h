@@ -14,7 +14,7 @@
 
 #include <string>
 
-#include "file_descriptor.h"
+#include "descriptor.h"
 
 namespace host {
 
@@ -23,7 +23,7 @@ struct FoundFile {
     std::string strFolder;  // "" or with a slash at its end
     std::string strName;
     bool blThere = false;     // whether there is a file
-    FileDescriptor file;      // for reading; a caller who has read it may close it
+    Descriptor file;          // for reading; a caller who has read it may close it
     struct stat status = {};  // of that file
 
     std::string Path() const { return strFolder + strName; }

@@ -18,9 +18,9 @@
 #include <utility>
 
 #include "certificate_authorities.h"
+#include "fixed_text.h"
 #include "printable.h"
 #include "status.h"
-#include "text_buffer.h"
 
 namespace host {
 namespace {
@@ -128,7 +128,7 @@ int ZELOCertAddAuthorities(struct x509_store_st *pStore, char *szPlace, int cbPl
         if (host::AddFolder(pStore, strPath)) {
             return 0;
         }
-        host::CopyWholeCharacters(strPath, szPlace, cbPlace);
+        CopyToFit(szPlace, cbPlace, strPath);
         return host::Fail(YLIBC_ERR_FILE, host::kFile, __LINE__);
     } catch (const std::bad_alloc &) {
         return host::Fail(YLIBC_ERR_OUT_OF_MEMORY, host::kFile, __LINE__);

@@ -10,7 +10,7 @@
 #include <new>
 #include <utility>
 
-#include "held_mutex.h"
+#include "fork_safe.h"
 #include "http_exchange.h"
 #include "json.h"
 #include "never_destroyed.h"
@@ -62,7 +62,7 @@ bool ReadServer(const ZELO_CRED *pCred, Server &server) {
 
 // The URLs that this process has learnt, by server and API.
 std::mutex g_urlMutex;
-const int g_forkHandlers = host::HoldAroundForks<g_urlMutex>();
+const int g_forkHandlers = HoldAroundForks<g_urlMutex>();
 host::NeverDestroyed<std::map<std::string, std::string>> g_urls;
 
 std::string FindUrl(const std::string &strKey) {

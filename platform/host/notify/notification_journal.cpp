@@ -17,8 +17,8 @@
 #include <string>
 #include <utility>
 
-#include "files/file_descriptor.h"
-#include "held_mutex.h"
+#include "descriptor.h"
+#include "fork_safe.h"
 #include "json.h"
 #include "status.h"
 #include "wait.h"
@@ -55,7 +55,7 @@ class HeldJournal {
     int Take() {
         do {
             LetGo();
-            m_file = host::FileDescriptor(open(
+            m_file = Descriptor(open(
                 kJournal, O_RDWR | O_APPEND | O_CREAT | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC, 0640));
             if (!m_file.IsOpen()) {
                 return errno == ELOOP    ? JOURNAL_FAIL(YLIBC_ERR_UNSAFE_FILE, "it is a link")
@@ -104,13 +104,13 @@ class HeldJournal {
                there.st_dev == m_status.st_dev;
     }
 
-    host::FileDescriptor m_file;
+    Descriptor m_file;
     struct stat m_status = {};
 };
 
 // The C library takes a lock for each conversion, which a child process may find taken.
 std::mutex g_conversion;
-const int g_forkHandlers = host::HoldAroundForks<g_conversion>();
+const int g_forkHandlers = HoldAroundForks<g_conversion>();
 
 std::string Now() {
     const time_t now = time(nullptr);

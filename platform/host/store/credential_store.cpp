@@ -8,8 +8,8 @@
 
 #include "credential_database.h"
 #include "credential_record.h"
+#include "fixed_text.h"
 #include "status.h"
-#include "text_buffer.h"
 
 namespace {
 
@@ -66,7 +66,7 @@ int GetText(char *szBuffer, int cbBuffer, const Record *pRecord,
     if (!field) {
         return HOST_FAIL(YLIBC_ERR_NOT_FOUND);
     }
-    host::CopyText(*field, szBuffer, cbBuffer);
+    CopyToFit(szBuffer, cbBuffer, *field);
     return 0;
 }
 

@@ -13,7 +13,7 @@
 #include <filesystem>
 #include <system_error>
 
-#include "files/file_descriptor.h"
+#include "descriptor.h"
 
 namespace host {
 namespace {
@@ -76,7 +76,7 @@ bool IsBesideItsDatabase(const std::string &strPath) {
 }
 
 bool SyncFolder(const std::string &strFolder) {
-    const FileDescriptor folder(open(strFolder.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    const Descriptor folder(open(strFolder.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
     return folder.Get() >= 0 && fsync(folder.Get()) == 0;
 }
 

@@ -13,10 +13,10 @@
 #include <vector>
 
 #include "files/file_state.h"
+#include "fixed_text.h"
 #include "set_aside.h"
 #include "sqlite_damage.h"
 #include "status.h"
-#include "text_buffer.h"
 
 namespace host::sqlite {
 namespace {
@@ -294,7 +294,7 @@ int Database::SetAsideIfDamaged(char *szPath, int cbPath) {
     try {
         std::string strPath = m_store.szPath;
         const Result result = MoveIfDamaged(strPath);
-        static_cast<void>(CopyText(strPath, szPath, cbPath));
+        static_cast<void>(CopyToFit(szPath, cbPath, strPath));
         return result == Result::kDone ? 1 : result == Result::kAbsent ? 0 : -1;
     } catch (const std::bad_alloc &) {
         return HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);

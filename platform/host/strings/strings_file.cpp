@@ -12,12 +12,12 @@
 #include <string_view>
 #include <utility>
 
-#include "files/file_descriptor.h"
+#include "descriptor.h"
 #include "files/file_state.h"
+#include "fixed_text.h"
 #include "status.h"
 #include "strings_index.h"
 #include "strings_text.h"
-#include "text_buffer.h"
 
 namespace {
 
@@ -50,7 +50,7 @@ Result Search(int fd, const host::StringsIndex &index, std::string_view section,
 Result ReadOnce(const char *szPath, std::string_view section, std::string_view key,
                 std::string &strValue) {
     // Should a FIFO stand at the path, its writer is not waited for.
-    const host::FileDescriptor file(open(szPath, O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
+    const Descriptor file(open(szPath, O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
     struct stat state = {};
     if (!file.IsOpen() || fstat(file.Get(), &state) != 0 || !S_ISREG(state.st_mode)) {
         return Result::kUnread;
@@ -84,7 +84,7 @@ int YLIBCFileGetSectionValue(const char *szPath, const char *szSection, const ch
         std::string strValue;
         switch (Read(szPath, szSection, szKey, strValue)) {
             case Result::kFound:
-                return host::CopyWholeCharacters(strValue, szValue, cbValue);
+                return CopyToFit(szValue, cbValue, strValue);
             case Result::kAbsent:
                 return HOST_FAIL(YLIBC_ERR_NOT_FOUND);
             default:

@@ -9,7 +9,7 @@
 #include <mutex>
 
 #include "files/file_state.h"
-#include "held_mutex.h"
+#include "fork_safe.h"
 #include "never_destroyed.h"
 #include "strings_text.h"
 

@@ -15,9 +15,9 @@
 #include <unordered_map>
 #include <vector>
 
+#include "fixed_text.h"
 #include "hash_place.h"
 #include "status.h"
-#include "text_buffer.h"
 
 struct YLIBSZLIST_ITEMS {
     YLIBSZLIST record = {0, this};
@@ -288,7 +288,7 @@ int YLIBCStrReplace(char *szText, const char *szOld, const char *szNew, int /*fl
             return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
         }
         if (occurrences > 0) {
-            host::CopyText(strResult, szText, cbText);
+            CopyToFit(szText, cbText, strResult);
         }
         return occurrences;
     } catch (const std::bad_alloc &) {

@@ -1,0 +1,54 @@
+// Diagnosis: what tools ask beyond what the library needs.
+//
+// Why something failed, what the process waits for and for how long it may, and what to do about a
+// damaged store. The library calls none of it. A port may leave all of it out: the symbols are
+// weak, and a caller looks whether it is there before it calls:
+//
+//     if (ZELODiagnosisReason != nullptr) …
+//
+// A program without it says less. Callers are position-independent.
+
+#ifndef ZELO_PLATFORM_DIAGNOSIS_H
+#define ZELO_PLATFORM_DIAGNOSIS_H
+
+#include "api.h"
+#include "text_containers.h"
+
+#define ZELO_DIAGNOSIS_API ZELO_PLATFORM_API __attribute__((weak))
+
+extern "C" {
+
+// --- Reasons
+// --------------------------------------------------------------------------------------
+
+// Writes the words of the calling thread's latest failure (last_error.h) into the buffer of
+// cbReason bytes, cut between characters and zero-terminated, such as "cannot connect to
+// qrm.example:5001: connection refused". Returns the length; 0 where the failure has no words, or
+// nothing has failed yet; -1 for no buffer.
+ZELO_DIAGNOSIS_API int ZELODiagnosisReason(char *szReason, int cbReason);
+
+// --- The deadline
+// ---------------------------------------------------------------------------------
+//
+// One point in time for the whole process, at which every wait of the platform ends: for a lock, a
+// busy store, a program, a server, a name. An operation that had to give up so fails with
+// YLIBC_ERR_DEADLINE, and its words tell what it waited for; a program that it ran is ended. Waits
+// that begin later look once and give up. There is no deadline at first.
+
+// Sets the deadline to that many milliseconds from now, or takes it away when the number is
+// negative. May be called in any thread and in a signal handler: with 0 all waits end now.
+ZELO_DIAGNOSIS_API void ZELODeadlineSet(long long left_ms);
+
+// The milliseconds until the deadline, 0 when it is over; -1 when there is none.
+ZELO_DIAGNOSIS_API long long ZELODeadlineLeft(void);
+
+// Called in the waiting thread, about once a second while an operation waits: what for, such as
+// "the lock '/tmp/userlock'", and for how long already. It must not throw.
+typedef void (*ZELO_WAIT_OBSERVER)(void *pContext, const char *szWaitsFor, double waited_s);
+
+// Sets the observer of all waits of the process; null for none, as at the start. Set it while no
+// other thread is in an operation.
+ZELO_DIAGNOSIS_API void ZELOWaitObserverSet(ZELO_WAIT_OBSERVER pfnObserver, void *pContext);
+}
+
+#endif
