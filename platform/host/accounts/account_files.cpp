@@ -73,16 +73,16 @@ void AccountFile<Format>::Parse(Line &line) {
 
 template <typename Format>
 bool AccountFile<Format>::Read() {
-    switch (FindFile(Format::kPath, m_found)) {
-        case Find::kNoFile:
-            return !Format::kRequired || HOST_FAIL(YLIBC_ERR_FILE) == 0;
-        case Find::kFailed:
-            return false;
-        case Find::kFile:
-            break;
+    Status status = FindFile(Format::kPath, m_found);
+    if (!status.Failed() && m_found.blThere) {
+        status = ReadContent(m_found, m_strRead);
     }
-    if (!ReadContent(m_found, m_strRead)) {
+    if (status.Failed()) {
+        status.Publish();
         return false;
+    }
+    if (!m_found.blThere) {
+        return !Format::kRequired || HOST_FAIL(YLIBC_ERR_FILE) == 0;
     }
     for (std::string &strLine : SplitLines(m_strRead)) {
         m_lines.emplace_back();
@@ -154,13 +154,17 @@ bool AccountFile<Format>::Write() {
         return true;
     }
     m_blWritten = true;
-    return ReplaceFile(m_found, strText) == 0;
+    Status status = ReplaceFile(m_found, strText);
+    if (status.Failed()) {
+        status.Publish();
+    }
+    return !status.Failed();
 }
 
 template <typename Format>
 void AccountFile<Format>::PutBack() {
     if (m_blWritten) {
-        ReplaceFile(m_found, m_strRead);
+        static_cast<void>(ReplaceFile(m_found, m_strRead));
     }
 }
 

@@ -344,14 +344,13 @@ int YLIBGroupExtraAdminSet(const char *szName, int n1, int n2, int n3, int n4) {
     }
     return NoThrow([&] {
         const std::string strKey = kExtraAdminKey + std::string(szName);
-        std::string strValue;
+        std::optional<std::string> before;
         const bool blClear = n1 == 0 && n2 == 0 && n3 == 0 && n4 == 0;
-        const host::LookUp found = host::LookUpKey(host::kConfigFile, strKey.c_str(), strValue);
-        if (blClear && (found == host::LookUp::kAbsent ||
-                        (found == host::LookUp::kFound && strValue.empty()))) {
+        const bool blRead = !host::LookUpKey(host::kConfigFile, strKey.c_str(), before).Failed();
+        if (blClear && blRead && before.value_or("").empty()) {
             return 0;
         }
-        strValue.clear();
+        std::string strValue;
         if (!blClear) {
             for (const int n : {n1, n2, n3, n4}) {
                 strValue += (strValue.empty() ? "" : " ") + std::to_string(n);
