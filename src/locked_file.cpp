@@ -8,6 +8,8 @@
 #include <cerrno>
 #include <thread>
 
+#include "own_file.h"
+
 namespace {
 
 using Clock = std::chrono::steady_clock;
@@ -23,17 +25,6 @@ bool Lock(int fd, Clock::time_point end) {
         std::this_thread::sleep_for(kPause);
     }
     return true;
-}
-
-bool LeadsTo(const char *szPath, const struct stat &opened) {
-    struct stat named = {};
-    return lstat(szPath, &named) == 0 && named.st_ino == opened.st_ino &&
-           named.st_dev == opened.st_dev;
-}
-
-// Whether it is a regular file of the caller's own with no other name.
-bool IsOwnFile(const struct stat &status) {
-    return S_ISREG(status.st_mode) && status.st_nlink == 1 && status.st_uid == geteuid();
 }
 
 }  // namespace
@@ -57,7 +48,7 @@ LockedFile::~LockedFile() {
 
 LockedFile::Try LockedFile::Open(const char *szPath, std::optional<mode_t> mode,
                                  Clock::time_point end) {
-    constexpr int kFlags = O_RDWR | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC;
+    constexpr int kFlags = O_RDWR | own_file::kFlags;
     m_file = Descriptor(open(szPath, kFlags));
     if (Get() < 0 && errno == ENOENT && mode) {
         // With O_CREAT alone, the kernel may refuse what somebody else has put there.
@@ -75,9 +66,9 @@ LockedFile::Try LockedFile::Open(const char *szPath, std::optional<mode_t> mode,
     if (!Lock(Get(), end) || fstat(Get(), &status) != 0) {
         return Try::kFailed;
     }
-    if (!LeadsTo(szPath, status)) {
+    if (!own_file::IsNamed(szPath, status)) {
         return Try::kAgain;
     }
     // Another user's file goes: its lock is held here, so nobody is at work with it.
-    return IsOwnFile(status) ? Try::kHeld : unlink(szPath) == 0 ? Try::kAgain : Try::kFailed;
+    return own_file::IsOwn(status) ? Try::kHeld : unlink(szPath) == 0 ? Try::kAgain : Try::kFailed;
 }

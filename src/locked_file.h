@@ -15,8 +15,8 @@
 class LockedFile {
   public:
     // Opens the file, never through a link, and waits for its lock. While the lock is held, the
-    // name leads to this file, which is the caller's own: a link, a socket or another file that
-    // stands there is removed first, and a folder is a failure.
+    // name leads to this file, which is the caller's own (own_file.h): a link, a socket or another
+    // file that stands there is removed first, and a folder is a failure.
     //
     // mode: of a file that is created; without one, the file has to be there.
     LockedFile(const char *szPath, std::optional<mode_t> mode, std::chrono::milliseconds wait);

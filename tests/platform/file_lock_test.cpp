@@ -4,12 +4,15 @@
 
 #include <fcntl.h>
 #include <gtest/gtest.h>
+#include <sys/mman.h>
 #include <sys/syscall.h>
 
+#include <algorithm>
 #include <chrono>
 #include <thread>
 
 #include "children.h"
+#include "diagnosis.h"
 #include "failures.h"
 #include "files.h"
 
@@ -200,15 +203,101 @@ TEST(FileLock, RootTakesItsNameBack) {
     close(fd);
 }
 
-TEST(FileLock, RootNeedsNoOtherFolderForALock) {
-    constexpr const char *kNames = "/etc/.zelo-shared-names.lock";
-    fs::remove(kNames);
-    fs::remove(kLock);
-    fs::create_directory(kNames);
-    YLIBCErrSetEx(0x1234, "before", 7);
-    EXPECT_TRUE(IsFree());
-    EXPECT_EQ(YLIBCErrGet(), 0x1234U) << "a success is no error";
-    fs::remove(kNames);
+// Also by several programs at once: one of them makes the lock file that all of them use.
+TEST(FileLock, RootTakesItsNameBackOnce) {
+    constexpr const char *kCounter = "/tmp/counter";
+    for (int i = 0; i < 3; ++i) {
+        std::ofstream(kCounter) << 0;
+        fs::remove(kLock);
+        if (!PutStrangers(i == 0 ? "link" : "file", kLock)) {
+            GTEST_SKIP() << "there are no files of another user's";
+        }
+        EXPECT_TRUE(children::InEach(8, [&](int /*process*/) {
+            const int handle = Take();
+            WriteFile(kCounter, std::to_string(std::stoi(FileText(kCounter)) + 1));
+            return YLIBCFileUnlockByFile(handle) == 0;
+        }));
+        EXPECT_EQ(FileText(kCounter), "8");
+    }
+    for (const auto &entry : fs::directory_iterator("/tmp")) {
+        EXPECT_FALSE(Holds(entry.path(), "a.lock.")) << entry.path();
+    }
+}
+
+TEST(FileLock, ARefusalNamesTheFileAndItsOwner) {
+    fs::create_directory("/tmp/private");
+    const std::string strLock = "/tmp/private/b.lock";
+    int handle = -1;
+    fs::create_symlink(kVictim, strLock);
+    EXPECT_EQ(FailureOf(YLIBCFileLockByFile(strLock.c_str(), 0, &handle)), YLIBC_ERR_UNSAFE_FILE);
+    EXPECT_EQ(failures::Reason(), "'" + strLock + "' is a link");
+    fs::remove(strLock);
+    if (!PutStrangers("file", strLock)) {
+        GTEST_SKIP() << "there are no files of another user's";
+    }
+    EXPECT_EQ(FailureOf(YLIBCFileLockByFile(strLock.c_str(), 0, &handle)), YLIBC_ERR_UNSAFE_FILE);
+    EXPECT_EQ(failures::Reason(), "'" + strLock + "' belongs to the user " +
+                                      std::to_string(Status(strLock).st_uid) + " (nobody)");
+}
+
+TEST(FileLock, ADeadlineEndsTheWaitAndAFreeLockIsTakenAfterIt) {
+    const int handle = Take();
+    std::vector<std::string> seen;
+    ZELOWaitObserverSet(
+        [](void *pSeen, const char *szWaitsFor, double) {
+            static_cast<std::vector<std::string> *>(pSeen)->emplace_back(szWaitsFor);
+        },
+        &seen);
+    const auto begin = Clock::now();
+    ZELODeadlineSet(2500);
+    EXPECT_FALSE(IsFree(60));
+    EXPECT_EQ(FailureOf(-1), YLIBC_ERR_DEADLINE);
+    EXPECT_EQ(failures::Reason(), "the deadline came while waiting for the lock '/tmp/a.lock'");
+    EXPECT_GE(Clock::now() - begin, std::chrono::milliseconds(2500));
+    EXPECT_LT(Clock::now() - begin, std::chrono::seconds(20));
+    ASSERT_FALSE(seen.empty());
+    EXPECT_LE(seen.size(), 20U) << "about once a second";
+    EXPECT_EQ(seen.front(), "the lock '/tmp/a.lock'");
+    ZELOWaitObserverSet(nullptr, nullptr);
+    EXPECT_EQ(YLIBCFileUnlockByFile(handle), 0);
+    EXPECT_EQ(ZELODeadlineLeft(), 0);
+    EXPECT_TRUE(IsFree(60));
+    ZELODeadlineSet(-1);
+}
+
+TEST(FileLock, SixteenProcessesGetTheirTurns) {
+    constexpr int kProcesses = 16;
+    struct Share {
+        int turns;
+        double longest_s;
+    };
+    auto *const pShares =
+        static_cast<Share *>(mmap(nullptr, kProcesses * sizeof(Share), PROT_READ | PROT_WRITE,
+                                  MAP_SHARED | MAP_ANONYMOUS, -1, 0));
+    ASSERT_NE(static_cast<void *>(pShares), MAP_FAILED);
+    const auto end = Clock::now() + std::chrono::seconds(20);
+    EXPECT_TRUE(children::InEach(kProcesses, [&](int process) {
+        for (auto begin = Clock::now(); begin < end; begin = Clock::now()) {
+            const int handle = Take();
+            const std::chrono::duration<double> waited = Clock::now() - begin;
+            Share &share = pShares[process];
+            ++share.turns;
+            share.longest_s = std::max(share.longest_s, waited.count());
+            YLIBCFileUnlockByFile(handle);
+        }
+        return true;
+    }));
+    const auto [pLeast, pMost] = std::minmax_element(
+        pShares, pShares + kProcesses,
+        [](const Share &one, const Share &other) { return one.turns < other.turns; });
+    double longest_s = 0;
+    for (int i = 0; i < kProcesses; ++i) {
+        longest_s = std::max(longest_s, pShares[i].longest_s);
+    }
+    EXPECT_GE(2 * pLeast->turns, pMost->turns);
+    EXPECT_LT(longest_s, 2);
+    std::printf("%d to %d turns, the longest wait %g s\n", pLeast->turns, pMost->turns, longest_s);
+    munmap(pShares, kProcesses * sizeof(Share));
 }
 
 }  // namespace

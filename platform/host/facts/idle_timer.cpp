@@ -11,18 +11,16 @@
 #include <cstdlib>
 #include <filesystem>
 #include <limits>
-#include <new>
+#include <optional>
 #include <string>
 
 #include "files/key_value_lookup.h"
-#include "key_value_file.h"
 #include "status.h"
 
 namespace {
 
 namespace fs = std::filesystem;
 
-constexpr const char *kFile = "idle_timer";
 constexpr const char *kKey = "disk_idle_minutes";
 constexpr unsigned long kDefault_min = 20;
 constexpr const char *kDisks = "/sys/block";
@@ -83,38 +81,24 @@ void Apply(unsigned long idleTime) {
 }  // namespace
 
 int ZELODiskAllIdleTimerGet(unsigned long *pIdleTime) {
-    if (pIdleTime == nullptr) {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    try {
-        std::string strValue;
+    return HOST_OPERATION([&]() -> host::Status {
+        HOST_REQUIRE(pIdleTime != nullptr);
+        std::optional<std::string> value;
         unsigned long idleTime = kDefault_min;
-        switch (host::LookUpKey(host::kConfigFile, kKey, strValue)) {
-            case host::LookUp::kUnreadable:
-                return -1;
-            case host::LookUp::kFound:
-                if (!ReadNumber(strValue, idleTime)) {
-                    return HOST_FAIL(YLIBC_ERR_FILE);
-                }
-                break;
-            default:
-                break;
+        HOST_TRY(host::LookUpKey(host::kConfigFile, kKey, value));
+        if (value && !ReadNumber(*value, idleTime)) {
+            return HOST_ERROR(YLIBC_ERR_FILE, "'" + *value + "' of '" + kKey + "' in '" +
+                                                  host::kConfigFile + "' is no number");
         }
         *pIdleTime = idleTime;
-        return 0;
-    } catch (const std::bad_alloc &) {
-        return HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
-    }
+        return {};
+    });
 }
 
 int ZELODiskAllIdleTimerSet(unsigned long idleTime) {
-    try {
-        if (YLIBCINFOSetKeyValue(kKey, std::to_string(idleTime).c_str()) < 0) {
-            return -1;
-        }
+    return HOST_OPERATION([&]() -> host::Status {
+        HOST_TRY(host::SetSetting(kKey, std::to_string(idleTime).c_str()));
         Apply(idleTime);
-        return 0;
-    } catch (const std::bad_alloc &) {
-        return HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
-    }
+        return {};
+    });
 }

@@ -13,24 +13,23 @@
 #include <algorithm>
 #include <cerrno>
 #include <chrono>
+#include <cstring>
 #include <mutex>
-#include <new>
 #include <thread>
 #include <utility>
 #include <vector>
 
-#include "file_state.h"
-#include "foreign_file.h"
+#include "deadline.h"
+#include "held_lock.h"
 #include "never_destroyed.h"
-#include "status.h"
-#include "trusted_file.h"
-#include "wait.h"
+#include "own_file.h"
+#include "shared_folder.h"
 
 namespace {
 
-using Clock = std::chrono::steady_clock;
+using host::Status;
+using host::Wait;
 
-constexpr const char *kFile = "file_lock";
 constexpr int kTimeout_s = 30;
 constexpr off_t kLock = 0;
 constexpr off_t kHead = 1;
@@ -67,20 +66,21 @@ bool Set(int fd, off_t byte, short type) {
 // A lock file, opened anew for each lock. What is not handed out as a handle is closed.
 class LockFile {
   public:
-    LockFile(const char *szPath, bool blCreate) {
-        const std::lock_guard<std::mutex> guard(g_mutex);
-        g_open->reserve(g_open->size() + 1);
-        m_fd =
-            open(szPath,
-                 O_RDWR | (blCreate ? O_CREAT : 0) | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC,
-                 0600);
-        if (m_fd >= 0) {
-            g_open->push_back(m_fd);
-        }
-    }
+    LockFile() = default;
     LockFile(const LockFile &) = delete;
     LockFile &operator=(const LockFile &) = delete;
     ~LockFile() { Close(m_fd); }
+
+    // False with errno.
+    bool Open(const char *szPath, int flags) {
+        const std::lock_guard<std::mutex> guard(g_mutex);
+        g_open->reserve(g_open->size() + 1);
+        m_fd = open(szPath, O_RDWR | flags | own_file::kFlags, 0600);
+        if (m_fd >= 0) {
+            g_open->push_back(m_fd);
+        }
+        return m_fd >= 0;
+    }
 
     int Get() const { return m_fd; }
     int HandOut() { return std::exchange(m_fd, -1); }
@@ -103,119 +103,139 @@ class LockFile {
     int m_fd = -1;
 };
 
-enum class Try { kHeld, kHeldElsewhere, kRemoved, kUnsafe, kFailed };
+Status Failure(const char *szWhat, const std::string &strPath) {
+    return HOST_ERROR(YLIBC_ERR_FILE, std::string(szWhat) + " the lock file '" + strPath +
+                                          "': " + std::strerror(errno));
+}
 
-Try Await(int fd, off_t byte, Clock::time_point end) {
-    std::chrono::microseconds wait = kFirstWait;
+// Root's: puts a lock file in the place of what another user has put at the path. It is locked
+// meanwhile, so nobody holds it when it turns out that another program of root's has been quicker:
+// that one's file then gets its name back.
+void TakeNameBack(const std::string &strPath) {
+    const std::string strOwn = host::UnusedName(strPath);
+    LockFile own;
+    if (strOwn.empty() || !own.Open(strOwn.c_str(), O_CREAT | O_EXCL)) {
+        return;
+    }
+    const auto exchange = [&] {
+        return renameat2(AT_FDCWD, strOwn.c_str(), AT_FDCWD, strPath.c_str(), RENAME_EXCHANGE) == 0;
+    };
+    struct stat away = {};
+    if (Set(own.Get(), kLock, F_WRLCK) && exchange() && lstat(strOwn.c_str(), &away) == 0 &&
+        away.st_uid == 0) {
+        static_cast<void>(exchange());
+    }
+    host::RemoveAny(strOwn);
+}
+
+// Opens the lock file, or creates it. blAgain: somebody was quicker, or root has taken the name
+// back.
+Status OpenOrCreate(const std::string &strPath, LockFile &file, bool &blAgain) {
+    const char *const szPath = strPath.c_str();
+    struct stat there = {};
+    // With O_CREAT alone, the kernel may refuse what somebody else has put there.
+    const bool blOpen =
+        file.Open(szPath, 0) || (errno == ENOENT && file.Open(szPath, O_CREAT | O_EXCL));
+    const int error = errno;
+    if ((blOpen ? fstat(file.Get(), &there) : lstat(szPath, &there)) != 0) {
+        errno = error;
+        return Failure("cannot open", strPath);
+    }
+    if (blOpen && own_file::IsOwn(there)) {
+        blAgain = there.st_nlink == 0;
+        return {};
+    }
+    if (host::IsForeignToRoot(strPath, there)) {
+        TakeNameBack(strPath);
+        blAgain = true;
+        return {};
+    }
+    if (!own_file::IsOwn(there)) {
+        return host::Refusal(strPath, there);
+    }
+    errno = error;
+    blAgain = error == EEXIST;
+    return blAgain ? Status() : Failure("cannot open", strPath);
+}
+
+Status Await(int fd, off_t byte, const std::string &strPath, Wait &wait) {
+    std::chrono::microseconds pause = kFirstWait;
     while (!Set(fd, byte, F_WRLCK)) {
         if (errno != EAGAIN && errno != EACCES) {
-            return Try::kFailed;
+            return Failure("cannot lock", strPath);
         }
-        const Clock::duration left = end - Clock::now();
-        if (left <= Clock::duration::zero()) {
-            return Try::kHeldElsewhere;
+        const Wait::Clock::duration slice = wait.Slice();
+        if (slice <= Wait::Clock::duration::zero()) {
+            return wait.TimeUp(YLIBC_ERR_BUSY);
         }
-        std::this_thread::sleep_for(std::min<Clock::duration>(wait, left));
-        wait = std::min(2 * wait, kLastWait);
+        std::this_thread::sleep_for(std::min<Wait::Clock::duration>(pause, slice));
+        pause = std::min(2 * pause, kLastWait);
     }
-    return Try::kHeld;
+    return {};
 }
 
-// What holding the file's lock is worth: nothing when a cleaner of old files, say, has taken its
-// name away, since whoever comes next makes a new lock file.
-Try CheckHeld(int fd, const char *szPath) {
+Status AwaitLock(int fd, const std::string &strPath, Wait &wait) {
+    HOST_TRY(Await(fd, kHead, strPath, wait));
+    Status status = Await(fd, kLock, strPath, wait);
+    static_cast<void>(Set(fd, kHead, F_UNLCK));
+    return status;
+}
+
+// What holding the file's lock is worth: nothing (blAgain) when a cleaner of old files, say, has
+// taken its name away, since whoever comes next makes a new lock file.
+Status CheckHeld(int fd, const std::string &strPath, bool &blAgain) {
     struct stat held = {};
-    struct stat named = {};
     if (fstat(fd, &held) != 0) {
-        return Try::kFailed;
+        return Failure("cannot look at", strPath);
     }
-    if (lstat(szPath, &named) != 0 || !host::IsSameFile(held, named)) {
-        return Try::kRemoved;
-    }
+    blAgain = !own_file::IsNamed(strPath.c_str(), held);
     // Whoever may open the file can lock it: nobody else may.
-    if ((held.st_mode & 07777U) != 0600 && fchmod(fd, 0600) != 0) {
-        return Try::kFailed;
-    }
-    return Try::kHeld;
-}
-
-Try TakeLock(int fd, const char *szPath, Clock::time_point end) {
-    struct stat status = {};
-    if (fstat(fd, &status) != 0) {
-        return Try::kFailed;
-    }
-    if (status.st_nlink == 0) {
-        return Try::kRemoved;
-    }
-    // What is refused is not waited for.
-    if (!host::IsOwnFile(status)) {
-        return Try::kUnsafe;
-    }
-    const host::Waiting waiting({"waiting for the lock '", szPath, "'"});
-    Try result = Await(fd, kHead, end);
-    if (result == Try::kHeld) {
-        result = Await(fd, kLock, end);
-        static_cast<void>(Set(fd, kHead, F_UNLCK));
-    }
-    return result == Try::kHeld ? CheckHeld(fd, szPath) : result;
-}
-
-// Why the lock file could not be opened. The kernel refuses some of what may not stand there, such
-// as a folder, before it can be looked at.
-int FailToOpen(const char *szPath) {
-    struct stat status = {};
-    const bool blUnsafe = lstat(szPath, &status) == 0 && !host::IsOwnFile(status);
-    return HOST_FAIL(blUnsafe ? YLIBC_ERR_UNSAFE_FILE : YLIBC_ERR_FILE);
-}
-
-int Lock(const char *szPath, int timeout_s, int &handle) {
-    const Clock::time_point end = Clock::now() + std::chrono::seconds(timeout_s);
-    for (;;) {
-        const bool blCreate = host::PrepareLockFile(szPath);
-        LockFile file(szPath, blCreate);
-        if (file.Get() < 0 && errno == ENOENT && !blCreate && Clock::now() < end) {
-            continue;  // a cleaner of old files has removed it since it was prepared
-        }
-        if (file.Get() < 0) {
-            return FailToOpen(szPath);
-        }
-        switch (TakeLock(file.Get(), szPath, end)) {
-            case Try::kHeld:
-                handle = file.HandOut();
-                return 1;
-            case Try::kRemoved:
-                continue;
-            case Try::kHeldElsewhere:
-                return HOST_FAIL(YLIBC_ERR_BUSY);
-            case Try::kUnsafe:
-                return HOST_FAIL(YLIBC_ERR_UNSAFE_FILE);
-            default:
-                return HOST_FAIL(YLIBC_ERR_FILE);
-        }
-    }
+    return blAgain || (held.st_mode & 07777U) == 0600 || fchmod(fd, 0600) == 0
+               ? Status()
+               : Failure("cannot set the mode of", strPath);
 }
 
 }  // namespace
+
+Status host::TakeLock(const char *szPath, int timeout_s, int &handle) {
+    // Of a name that root cannot take back, another user makes a lock file again and again.
+    constexpr int kMostTries = 1000;
+    const std::string strPath = szPath;
+    Wait wait("the lock '" + strPath + '\'', std::chrono::seconds(std::max(timeout_s, 0)));
+    for (int tries = 0; tries < kMostTries; ++tries) {
+        LockFile file;
+        bool blAgain = false;
+        HOST_TRY(OpenOrCreate(strPath, file, blAgain));
+        if (!blAgain) {
+            HOST_TRY(AwaitLock(file.Get(), strPath, wait));
+            HOST_TRY(CheckHeld(file.Get(), strPath, blAgain));
+        }
+        if (!blAgain) {
+            handle = file.HandOut();
+            return {};
+        }
+    }
+    return HOST_ERROR(YLIBC_ERR_UNSAFE_FILE,
+                      "somebody else puts files at '" + strPath + "' again and again");
+}
 
 int YLIBCFileLockByFile(const char *szLockFile, int flags, int *pHandle) {
     return YLIBCFileLockTimeByFile(szLockFile, flags, kTimeout_s, pHandle);
 }
 
 int YLIBCFileLockTimeByFile(const char *szLockFile, int /*flags*/, int timeout_s, int *pHandle) {
-    if (pHandle == nullptr) {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    *pHandle = -1;
-    if (szLockFile == nullptr) {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    try {
-        return Lock(szLockFile, timeout_s, *pHandle);
-    } catch (const std::bad_alloc &) {
-        return HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
-    }
+    int held = 1;
+    return HOST_OPERATION(-1, held, [&]() -> Status {
+        HOST_REQUIRE(pHandle != nullptr);
+        *pHandle = -1;
+        HOST_REQUIRE(szLockFile != nullptr);
+        return host::TakeLock(szLockFile, timeout_s, *pHandle);
+    });
 }
 
 int YLIBCFileUnlockByFile(int handle) {
-    return LockFile::Close(handle) ? 0 : HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
+    return HOST_OPERATION([&]() -> Status {
+        HOST_REQUIRE(LockFile::Close(handle));
+        return {};
+    });
 }

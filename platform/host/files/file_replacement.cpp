@@ -10,19 +10,17 @@
 
 #include <fcntl.h>
 #include <sys/file.h>
-#include <sys/random.h>
 
 #include <cerrno>
-#include <cstdint>
-#include <cstdio>
+#include <cstring>
 #include <string_view>
 
-#include "status.h"
+#include "own_file.h"
+#include "shared_folder.h"
 
 namespace host {
 namespace {
 
-constexpr const char *kFile = "file_replacement";
 constexpr mode_t kModeOfNew = 0644;
 constexpr int kCreate = O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC;
 
@@ -47,9 +45,8 @@ struct TemporaryFile {
 
 // Between its creation and its lock another writer may take the file for a leftover; it is then
 // that writer's to remove.
-bool CreateUnderUsualName(const FoundFile &found, mode_t mode, TemporaryFile &temporary) {
-    temporary.strPath = found.strFolder + '.' + found.strName + ".zelo-new";
-    Descriptor file(open(temporary.strPath.c_str(), kCreate, mode));
+bool CreateUnderUsualName(const std::string &strPath, mode_t mode, TemporaryFile &temporary) {
+    Descriptor file(open(strPath.c_str(), kCreate, mode));
     if (!file.IsOpen()) {
         return false;
     }
@@ -58,6 +55,7 @@ bool CreateUnderUsualName(const FoundFile &found, mode_t mode, TemporaryFile &te
         errno = EEXIST;
         return false;
     }
+    temporary.strPath = strPath;
     temporary.file = std::move(file);
     return true;
 }
@@ -65,37 +63,28 @@ bool CreateUnderUsualName(const FoundFile &found, mode_t mode, TemporaryFile &te
 // Only the writer who has the file's lock renames or removes it, so under the lock a name that
 // leads to the file goes on doing so.
 bool RemoveLeftover(const char *szPath) {
-    const Descriptor file(open(szPath, O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC));
+    const Descriptor file(open(szPath, O_RDONLY | own_file::kFlags));
     struct stat opened = {};
-    struct stat named = {};
-    return file.IsOpen() && fstat(file.Get(), &opened) == 0 && IsOwnFile(opened) &&
-           flock(file.Get(), LOCK_EX | LOCK_NB) == 0 && lstat(szPath, &named) == 0 &&
-           named.st_ino == opened.st_ino && named.st_dev == opened.st_dev && unlink(szPath) == 0;
+    return file.IsOpen() && fstat(file.Get(), &opened) == 0 && own_file::IsOwn(opened) &&
+           flock(file.Get(), LOCK_EX | LOCK_NB) == 0 && own_file::IsNamed(szPath, opened) &&
+           unlink(szPath) == 0;
 }
 
-bool CreateUnderRandomName(mode_t mode, TemporaryFile &temporary) {
-    std::uint64_t number = 0;
-    if (getrandom(&number, sizeof(number), 0) != sizeof(number)) {
-        return false;
-    }
-    char szNumber[24];
-    std::snprintf(szNumber, sizeof(szNumber), "-%016llx", static_cast<unsigned long long>(number));
-    temporary.strPath += szNumber;
-    temporary.file = Descriptor(open(temporary.strPath.c_str(), kCreate, mode));
-    return temporary.file.IsOpen() && fstat(temporary.file.Get(), &temporary.status) == 0;
-}
-
-bool Create(const FoundFile &found, mode_t mode, TemporaryFile &temporary) {
-    if (CreateUnderUsualName(found, mode, temporary)) {
+bool Create(const std::string &strBeside, mode_t mode, TemporaryFile &temporary) {
+    const std::string strFolder = FolderOf(strBeside);
+    const std::string strUsual = strFolder + '.' + strBeside.substr(strFolder.size()) + ".zelo-new";
+    if (CreateUnderUsualName(strUsual, mode, temporary)) {
         return true;
     }
     if (errno != EEXIST) {
         return false;
     }
-    if (RemoveLeftover(temporary.strPath.c_str()) && CreateUnderUsualName(found, mode, temporary)) {
+    if (RemoveLeftover(strUsual.c_str()) && CreateUnderUsualName(strUsual, mode, temporary)) {
         return true;
     }
-    return CreateUnderRandomName(mode, temporary);
+    temporary.strPath = UnusedName(strUsual);
+    temporary.file = Descriptor(open(temporary.strPath.c_str(), kCreate, mode));
+    return temporary.file.IsOpen() && fstat(temporary.file.Get(), &temporary.status) == 0;
 }
 
 // --- Filling it ---------------------------------------------------------------------------------
@@ -130,26 +119,27 @@ bool SyncFolder(const std::string &strFolder) {
 
 }  // namespace
 
-int ReplaceFile(const FoundFile &found, const std::string &strContent) {
+Status ReplaceFile(const FoundFile &found, const std::string &strContent) {
+    const std::string strFolder = FolderOf(found.strPath);
     bool blShared = false;
-    if (!ReadShared(found.strFolder, blShared)) {
-        return -1;
-    }
+    HOST_TRY(ReadShared(strFolder, blShared));
     const mode_t mode = found.blThere ? found.status.st_mode & 07777U : kModeOfNew;
     // Until it has its owner, nobody else may change the file or read what is not for everybody.
     const mode_t modeAtFirst = mode & ((mode & S_IROTH) != 0 ? 0755U : 0700U);
     TemporaryFile temporary;
-    if (!Create(found, modeAtFirst, temporary) || !SetOwnerAndMode(found, mode, temporary) ||
-        !WriteAll(temporary.file.Get(), strContent) ||
+    if (!Create(found.strPath, modeAtFirst, temporary) ||
+        !SetOwnerAndMode(found, mode, temporary) || !WriteAll(temporary.file.Get(), strContent) ||
         (!blShared && fsync(temporary.file.Get()) != 0) ||
-        rename(temporary.strPath.c_str(), found.Path().c_str()) != 0) {
-        return HOST_FAIL(YLIBC_ERR_FILE);
+        rename(temporary.strPath.c_str(), found.strPath.c_str()) != 0) {
+        return HOST_ERROR(YLIBC_ERR_FILE,
+                          "cannot write '" + found.strPath + "': " + std::strerror(errno));
     }
     temporary.blPlaced = true;
-    if (!blShared && !SyncFolder(found.strFolder)) {
-        return HOST_FAIL(YLIBC_ERR_FILE);
+    if (!blShared && !SyncFolder(strFolder)) {
+        return HOST_ERROR(YLIBC_ERR_FILE, "'" + found.strPath + "' is written, but not durable: " +
+                                              std::strerror(errno));
     }
-    return 0;
+    return {};
 }
 
 }  // namespace host

@@ -13,9 +13,9 @@ namespace host {
 // returns; what stands in a shared one, such as "/tmp", does not outlive a restart anyway, and the
 // disks may sleep.
 //
-// Returns 0, or -1 with the error set. The file is then as it was, unless the change is there and
-// only could not be made durable.
-int ReplaceFile(const FoundFile &found, const std::string &strContent);
+// After a failure the file is as it was, unless the change is there and only could not be made
+// durable.
+Status ReplaceFile(const FoundFile &found, const std::string &strContent);
 
 }  // namespace host
 

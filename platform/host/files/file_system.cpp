@@ -6,21 +6,16 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <new>
+#include <cstring>
 #include <string>
 
 #include "descriptor.h"
-#include "status.h"
+#include "directories.h"
 
 namespace {
 
-constexpr const char *kFile = "file_system";
-
-struct Owner {
-    bool blSet;
-    uid_t uid;
-    gid_t gid;
-};
+using host::Owner;
+using host::Status;
 
 // An ordinary user may not give directories away, and root of a user namespace only to the users
 // that there are in it.
@@ -68,41 +63,43 @@ Descriptor OpenDirectory(int parent, const char *szName, const Owner &owner, mod
     return created;
 }
 
-int MakeDirectories(const std::string &strPath, const Owner &owner, mode_t mode) {
+}  // namespace
+
+Status host::MakeDirectories(const std::string &strPath, const Owner &owner, mode_t mode) {
     Descriptor parent(open(strPath.front() == '/' ? "/" : ".", O_PATH | O_DIRECTORY | O_CLOEXEC));
     std::size_t begin = strPath.find_first_not_of('/');
+    std::size_t end = 0;
     while (parent.IsOpen() && begin != std::string::npos) {
-        const std::size_t end = std::min(strPath.find('/', begin), strPath.size());
+        end = std::min(strPath.find('/', begin), strPath.size());
         const std::string strName = strPath.substr(begin, end - begin);
         parent = OpenDirectory(parent.Get(), strName.c_str(), owner, mode);
         begin = strPath.find_first_not_of('/', end);
     }
-    return parent.IsOpen() ? 0 : HOST_FAIL(YLIBC_ERR_FILE);
+    return parent.IsOpen() ? Status()
+                           : HOST_ERROR(YLIBC_ERR_FILE, "cannot open or create the directory '" +
+                                                            strPath.substr(0, end) +
+                                                            "': " + std::strerror(errno));
 }
 
-}  // namespace
-
 int YLIBCFileStat(const char *szPath, int blNoFollow, struct stat *pStatus) {
-    if (szPath == nullptr || pStatus == nullptr) {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    struct stat status = {};
-    if (fstatat(AT_FDCWD, szPath, &status, blNoFollow != 0 ? AT_SYMLINK_NOFOLLOW : 0) != 0) {
-        return HOST_FAIL(errno == ENOENT || errno == ENOTDIR ? YLIBC_ERR_NOT_FOUND
-                                                             : YLIBC_ERR_FILE);
-    }
-    *pStatus = status;
-    return 0;
+    return HOST_OPERATION([&]() -> Status {
+        HOST_REQUIRE(szPath != nullptr);
+        HOST_REQUIRE(pStatus != nullptr);
+        struct stat status = {};
+        if (fstatat(AT_FDCWD, szPath, &status, blNoFollow != 0 ? AT_SYMLINK_NOFOLLOW : 0) != 0) {
+            return HOST_ERROR(
+                errno == ENOENT || errno == ENOTDIR ? YLIBC_ERR_NOT_FOUND : YLIBC_ERR_FILE,
+                std::string("cannot look at '") + szPath + "': " + std::strerror(errno));
+        }
+        *pStatus = status;
+        return {};
+    });
 }
 
 int ZELOFSMkdirP(const char *szPath, int /*flags*/, int blOwner, int uid, int gid, mode_t mode) {
-    if (szPath == nullptr || szPath[0] == '\0') {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    try {
+    return HOST_OPERATION([&]() -> Status {
+        HOST_REQUIRE(szPath != nullptr && szPath[0] != '\0');
         const Owner owner = {blOwner != 0, static_cast<uid_t>(uid), static_cast<gid_t>(gid)};
-        return MakeDirectories(szPath, owner, mode);
-    } catch (const std::bad_alloc &) {
-        return HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
-    }
+        return host::MakeDirectories(szPath, owner, mode);
+    });
 }

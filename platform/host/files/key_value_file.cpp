@@ -2,22 +2,21 @@
 
 #include "key_value_file.h"
 
-#include <new>
 #include <string_view>
 #include <utility>
 #include <vector>
 
-#include "file_lock.h"
 #include "file_replacement.h"
 #include "fixed_text.h"
+#include "held_lock.h"
 #include "key_value_lookup.h"
-#include "status.h"
 #include "strings/hash_place.h"
 #include "trusted_file.h"
 
 namespace {
 
-constexpr const char *kFile = "key_value_file";
+using host::Status;
+
 constexpr const char *kConfigLock = "/etc/.zeloinfo.conf.lock";
 
 // --- The format ---------------------------------------------------------------------------------
@@ -124,27 +123,13 @@ void AppendLine(std::string &strText, std::string_view key, std::string_view val
 
 // --- Reading and changing -----------------------------------------------------------------------
 
-// Runs the body of an operation. Short memory fails it like anything else.
-template <typename Body>
-int Guarded(const Body &body) {
-    try {
-        return body();
-    } catch (const std::bad_alloc &) {
-        return HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
-    }
-}
-
-bool Read(const char *szPath, std::string &strText) {
+Status Read(const char *szPath, std::string &strText) {
     host::FoundFile found;
-    switch (host::FindFile(szPath, found)) {
-        case host::Find::kFile:
-            return host::ReadContent(found, strText);
-        case host::Find::kNoFile:
-            HOST_FAIL(YLIBC_ERR_NOT_FOUND);
-            return false;
-        default:
-            return false;
+    HOST_TRY(host::FindFile(szPath, found));
+    if (!found.blThere) {
+        return HOST_ERROR(YLIBC_ERR_NOT_FOUND, "there is no file '" + found.strPath + '\'');
     }
+    return host::ReadContent(found, strText);
 }
 
 // A file as it stands before a change.
@@ -154,30 +139,27 @@ struct OldFile {
 };
 
 // Reads a file that may be missing: it then counts as empty.
-bool ReadForChange(const char *szPath, OldFile &old) {
-    const host::Find find = host::FindFile(szPath, old.found);
-    return find == host::Find::kNoFile ||
-           (find == host::Find::kFile && host::ReadContent(old.found, old.strText));
+Status ReadForChange(const char *szPath, OldFile &old) {
+    HOST_TRY(host::FindFile(szPath, old.found));
+    return old.found.blThere ? host::ReadContent(old.found, old.strText) : Status();
 }
 
-int Replace(OldFile &old, const std::string &strNew) {
+Status Replace(OldFile &old, const std::string &strNew) {
     // A file system takes longer to replace a file that is still open.
     old.found.file = Descriptor();
     return host::ReplaceFile(old.found, strNew);
 }
 
-int SetValue(const char *szPath, std::string_view key, std::string_view value) {
+Status SetValue(const char *szPath, std::string_view key, std::string_view value) {
     OldFile old;
-    if (!ReadForChange(szPath, old)) {
-        return -1;
-    }
+    HOST_TRY(ReadForChange(szPath, old));
     std::string strNew;
     strNew.reserve(old.strText.size() + key.size() + 2 * value.size() + sizeof("\n=\"\"\n"));
     Line line;
     std::string_view rest = old.strText;
     if (TakeLineWithKey(rest, key, line)) {
         if (ValueOf(line.value) == value) {
-            return 0;
+            return {};
         }
         strNew.assign(old.strText, 0, old.strText.size() - rest.size() - line.text.size());
     } else {
@@ -191,11 +173,9 @@ int SetValue(const char *szPath, std::string_view key, std::string_view value) {
     return Replace(old, strNew);
 }
 
-int RemoveLines(const char *szPath, std::string_view key) {
+Status RemoveLines(const char *szPath, std::string_view key) {
     OldFile old;
-    if (!ReadForChange(szPath, old)) {
-        return -1;
-    }
+    HOST_TRY(ReadForChange(szPath, old));
     std::string strNew;
     strNew.reserve(old.strText.size());
     Line line;
@@ -206,18 +186,15 @@ int RemoveLines(const char *szPath, std::string_view key) {
         kept = rest;
     }
     strNew.append(kept);
-    return strNew.size() == old.strText.size() ? 0 : Replace(old, strNew);
+    return strNew.size() == old.strText.size() ? Status() : Replace(old, strNew);
 }
 
-int ReadPairs(const char *szPath, YLIBSZHASH **ppHash) {
+Status ReadPairs(const char *szPath, YLIBSZHASH **ppHash, int &keys) {
     std::string strText;
-    if (!Read(szPath, strText)) {
-        return -1;
-    }
+    HOST_TRY(Read(szPath, strText));
     // Of several lines with a key the first one holds: what it has set is not set again.
     YLIBSZHASH &hash = **ppHash;
     std::vector<bool> blOldSet(static_cast<std::size_t>(hash.nItem), false);
-    int keys = 0;
     Line line;
     for (std::string_view rest = strText; TakeLine(rest, line);) {
         if (line.key.empty()) {
@@ -235,107 +212,106 @@ int ReadPairs(const char *szPath, YLIBSZHASH **ppHash) {
             blOldSet[place.index] = true;
         }
     }
-    return keys;
+    return {};
+}
+
+Status NoSuchKey(const char *szPath, const char *szKey) {
+    return HOST_ERROR(YLIBC_ERR_NOT_FOUND,
+                      std::string("'") + szPath + "' does not have the key '" + szKey + '\'');
 }
 
 }  // namespace
 
-host::LookUp host::LookUpKey(const char *szPath, const char *szKey, std::string &strValue) {
+Status host::LookUpKey(const char *szPath, const char *szKey, std::optional<std::string> &value) {
     std::string strText;
-    if (!Read(szPath, strText)) {
-        return LookUp::kUnreadable;
-    }
+    HOST_TRY(Read(szPath, strText));
     Line line;
     std::string_view rest = strText;
-    if (!TakeLineWithKey(rest, szKey, line)) {
-        return LookUp::kAbsent;
+    value.reset();
+    if (TakeLineWithKey(rest, szKey, line)) {
+        value = ValueOf(line.value);
     }
-    strValue = ValueOf(line.value);
-    return LookUp::kFound;
+    return {};
 }
 
 bool host::LookUpSetting(const char *szKey, std::string &strValue) {
-    const LastError before;
-    const bool blFound = LookUpKey(kConfigFile, szKey, strValue) == LookUp::kFound;
-    before.Restore();
+    std::optional<std::string> value;
+    const bool blFound = !LookUpKey(kConfigFile, szKey, value).Failed() && value;
+    if (blFound) {
+        strValue = *value;
+    }
     return blFound;
+}
+
+Status host::SetSetting(const char *szKey, const char *szValue) {
+    // What is refused does not leave a lock file behind.
+    HOST_REQUIRE(CanHold(szKey, szValue));
+    HeldLock lock;
+    HOST_TRY(lock.Take(kConfigLock));
+    return SetValue(kConfigFile, szKey, szValue);
 }
 
 int YLIBCFileGetKeyValue(const char *szPath, const char *szKey, char *szValue, int cbValue,
                          int /*flags*/) {
-    if (szValue == nullptr || cbValue <= 0) {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    szValue[0] = '\0';
-    if (szPath == nullptr || szKey == nullptr) {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    return Guarded([&] {
-        std::string strValue;
-        switch (host::LookUpKey(szPath, szKey, strValue)) {
-            case host::LookUp::kFound:
-                return CopyToFit(szValue, cbValue, strValue);
-            case host::LookUp::kAbsent:
-                HOST_FAIL(YLIBC_ERR_NOT_FOUND);
-                return 0;
-            default:
-                return -1;
+    int cb = 0;
+    return HOST_OPERATION(-1, cb, [&]() -> Status {
+        HOST_REQUIRE(szValue != nullptr && cbValue > 0);
+        szValue[0] = '\0';
+        HOST_REQUIRE(szPath != nullptr && szKey != nullptr);
+        std::optional<std::string> value;
+        HOST_TRY(host::LookUpKey(szPath, szKey, value));
+        if (value) {
+            cb = CopyToFit(szValue, cbValue, *value);
+        } else {
+            NoSuchKey(szPath, szKey).Publish();
         }
+        return {};
     });
 }
 
 int YLIBCFileCheckKeyValue(const char *szPath, const char *szKey, const char *szExpected,
                            int /*flags*/) {
-    if (szPath == nullptr || szKey == nullptr || szExpected == nullptr) {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    return Guarded([&] {
-        std::string strValue;
-        switch (host::LookUpKey(szPath, szKey, strValue)) {
-            case host::LookUp::kFound:
-                return strValue == szExpected ? 1 : 0;
-            case host::LookUp::kAbsent:
-                HOST_FAIL(YLIBC_ERR_NOT_FOUND);
-                return 0;
-            default:
-                return -1;
+    int same = 0;
+    return HOST_OPERATION(-1, same, [&]() -> Status {
+        HOST_REQUIRE(szPath != nullptr && szKey != nullptr && szExpected != nullptr);
+        std::optional<std::string> value;
+        HOST_TRY(host::LookUpKey(szPath, szKey, value));
+        if (value) {
+            same = *value == szExpected ? 1 : 0;
+        } else {
+            NoSuchKey(szPath, szKey).Publish();
         }
+        return {};
     });
 }
 
 int YLIBCFileSetKeyValue(const char *szPath, const char *szKey, const char *szValue,
                          int /*flags*/) {
-    if (szPath == nullptr || szPath[0] == '\0' || szKey == nullptr || szValue == nullptr ||
-        !CanHold(szKey, szValue)) {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    return Guarded([&] { return SetValue(szPath, szKey, szValue); });
+    return HOST_OPERATION([&]() -> Status {
+        HOST_REQUIRE(szPath != nullptr && szPath[0] != '\0');
+        HOST_REQUIRE(szKey != nullptr && szValue != nullptr && CanHold(szKey, szValue));
+        return SetValue(szPath, szKey, szValue);
+    });
 }
 
 int YLIBCFileRemoveKey(const char *szPath, const char *szKey) {
-    if (szPath == nullptr || szPath[0] == '\0' || szKey == nullptr) {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    return Guarded([&] { return RemoveLines(szPath, szKey); });
+    return HOST_OPERATION([&]() -> Status {
+        HOST_REQUIRE(szPath != nullptr && szPath[0] != '\0' && szKey != nullptr);
+        return RemoveLines(szPath, szKey);
+    });
 }
 
 int YLIBCFileGetPair(const char *szPath, YLIBSZHASH **ppHash) {
-    if (szPath == nullptr || ppHash == nullptr || *ppHash == nullptr) {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    return Guarded([&] { return ReadPairs(szPath, ppHash); });
+    int keys = 0;
+    return HOST_OPERATION(-1, keys, [&]() -> Status {
+        HOST_REQUIRE(szPath != nullptr && ppHash != nullptr && *ppHash != nullptr);
+        return ReadPairs(szPath, ppHash, keys);
+    });
 }
 
 int YLIBCINFOSetKeyValue(const char *szKey, const char *szValue) {
-    // What is refused does not leave a lock file behind.
-    if (szKey == nullptr || szValue == nullptr || !CanHold(szKey, szValue)) {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    int lock = -1;
-    if (YLIBCFileLockByFile(kConfigLock, 0, &lock) < 0) {
-        return -1;
-    }
-    const int result = YLIBCFileSetKeyValue(host::kConfigFile, szKey, szValue, 0);
-    YLIBCFileUnlockByFile(lock);
-    return result;
+    return HOST_OPERATION([&]() -> Status {
+        HOST_REQUIRE(szKey != nullptr && szValue != nullptr);
+        return host::SetSetting(szKey, szValue);
+    });
 }

@@ -1,24 +1,27 @@
-// Key-value look-up for the host platform's own settings.
+// Key-value files for the rooms of the host platform, and its own settings in one.
 
 #ifndef ZELO_HOST_KEY_VALUE_LOOKUP_H
 #define ZELO_HOST_KEY_VALUE_LOOKUP_H
 
+#include <optional>
 #include <string>
+
+#include "status.h"
 
 namespace host {
 
 // The host platform's own settings stand beside the appliance's.
 constexpr const char *kConfigFile = "/etc/zeloinfo.conf";
 
-enum class LookUp { kFound, kAbsent, kUnreadable };
-
-// Looks the key up in the file; strValue is set, whole, when it is found. Only a file that cannot
-// be read sets the last error: a setting that is absent has its default.
-LookUp LookUpKey(const char *szPath, const char *szKey, std::string &strValue);
+// Looks the key up in the file. A key that is absent is no failure: there is no value then.
+Status LookUpKey(const char *szPath, const char *szKey, std::optional<std::string> &value);
 
 // Looks up a setting of the host platform's that has a default. False where that serves: a file
-// that cannot be read is no failure of the caller's operation, and the last error stays as it was.
+// that cannot be read is no failure of the caller's operation.
 bool LookUpSetting(const char *szKey, std::string &strValue);
+
+// What YLIBCINFOSetKeyValue (key_value_file.h) does.
+Status SetSetting(const char *szKey, const char *szValue);
 
 }  // namespace host
 

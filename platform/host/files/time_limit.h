@@ -8,7 +8,7 @@
 namespace host {
 
 // The limit that the key names in "/etc/zeloinfo.conf", in whole seconds, 1 or more. One that is
-// not set, or not like this, is `standard`. The last error stays as it was.
+// not set, or not like this, is `standard`.
 std::chrono::seconds TimeLimit(const char *szKey, std::chrono::seconds standard);
 
 }  // namespace host

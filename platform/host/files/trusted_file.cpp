@@ -2,124 +2,88 @@
 
 #include "trusted_file.h"
 
-#include <fcntl.h>
-
 #include <algorithm>
 #include <array>
 #include <cerrno>
 #include <climits>
+#include <cstring>
 
-#include "foreign_file.h"
-#include "status.h"
+#include "own_file.h"
+#include "shared_folder.h"
 
 namespace host {
 namespace {
-
-constexpr const char *kFile = "trusted_file";
 
 // As many as the kernel follows.
 constexpr int kMaxLinks = 40;
 
 constexpr std::size_t kMaxContent = std::size_t{64} * 1024 * 1024;
 
-void SetPath(FoundFile &found, const std::string &strPath) {
-    const std::size_t cbFolder = strPath.rfind('/') + 1;  // npos + 1 is 0
-    found.strFolder = strPath.substr(0, cbFolder);
-    found.strName = strPath.substr(cbFolder);
+Status CannotOpen(const std::string &strPath, int error) {
+    return HOST_ERROR(YLIBC_ERR_FILE, "cannot open '" + strPath + "': " + std::strerror(error));
 }
 
-Find Failed(unsigned int code, int line) {
-    Fail(code, kFile, line);
-    return Find::kFailed;
-}
-
-Find LookAtOpened(FoundFile &found) {
-    if (fstat(found.file.Get(), &found.status) != 0) {
-        return Failed(YLIBC_ERR_FILE, __LINE__);
-    }
-    if (IsOwnFile(found.status)) {
-        return Find::kFile;
-    }
-    bool blShared = false;
-    if (!ReadShared(found.strFolder, blShared)) {
-        return Find::kFailed;
-    }
-    if (blShared) {
-        return Failed(YLIBC_ERR_UNSAFE_FILE, __LINE__);
-    }
-    return S_ISREG(found.status.st_mode) ? Find::kFile : Failed(YLIBC_ERR_FILE, __LINE__);
-}
-
-// Why there is a file that cannot be opened. In a shared folder the reason is whose it is.
-Find FailToOpen(const FoundFile &found) {
-    struct stat status = {};
-    bool blShared = false;
-    const bool blUnsafe = lstat(found.Path().c_str(), &status) == 0 && !IsOwnFile(status) &&
-                          ReadShared(found.strFolder, blShared) && blShared;
-    return Failed(blUnsafe ? YLIBC_ERR_UNSAFE_FILE : YLIBC_ERR_FILE, __LINE__);
-}
-
-bool FollowLink(FoundFile &found) {
-    bool blShared = false;
-    if (!ReadShared(found.strFolder, blShared)) {
-        return false;
-    }
-    if (blShared) {
-        HOST_FAIL(YLIBC_ERR_UNSAFE_FILE);
-        return false;
-    }
+Status FollowLink(FoundFile &found) {
     std::array<char, PATH_MAX> target;
-    const ssize_t cb = readlink(found.Path().c_str(), target.data(), target.size());
+    const ssize_t cb = readlink(found.strPath.c_str(), target.data(), target.size());
     if (cb <= 0) {
-        HOST_FAIL(YLIBC_ERR_FILE);
-        return false;
+        return CannotOpen(found.strPath, errno);
     }
     const std::string strTarget(target.data(), static_cast<std::size_t>(cb));
-    SetPath(found, strTarget.front() == '/' ? strTarget : found.strFolder + strTarget);
-    return true;
+    found.strPath = strTarget.front() == '/' ? strTarget : FolderOf(found.strPath) + strTarget;
+    return {};
+}
+
+// One step towards the file: opens what stands at the path, follows it when it is a link, or takes
+// the name back. Sets blDone when there is no other step.
+Status TakeStep(FoundFile &found, bool &blDone) {
+    const char *const szPath = found.strPath.c_str();
+    found.file = Descriptor(open(szPath, O_RDONLY | own_file::kFlags));
+    found.blThere = found.file.IsOpen();
+    const int error = errno;
+    blDone = true;
+    if (!found.blThere && error == ENOENT) {
+        return {};
+    }
+    if ((found.blThere ? fstat(found.file.Get(), &found.status) : lstat(szPath, &found.status)) !=
+        0) {
+        blDone = errno != ENOENT;  // gone meanwhile
+        return blDone ? CannotOpen(found.strPath, errno) : Status();
+    }
+    if (found.blThere && own_file::IsOwn(found.status)) {
+        return {};
+    }
+    bool blShared = false;
+    HOST_TRY(ReadShared(FolderOf(found.strPath), blShared));
+    blDone = false;
+    if (blShared && IsForeignToRoot(found.strPath, found.status)) {
+        RemoveForeign(found.strPath);
+        return {};
+    }
+    if (blShared && !own_file::IsOwn(found.status)) {
+        return Refusal(found.strPath, found.status);
+    }
+    if (!found.blThere) {
+        return error == ELOOP ? FollowLink(found) : CannotOpen(found.strPath, error);
+    }
+    blDone = true;
+    return S_ISREG(found.status.st_mode)
+               ? Status()
+               : HOST_ERROR(YLIBC_ERR_FILE, '\'' + found.strPath + "' is no file");
 }
 
 }  // namespace
 
-bool IsOwnFile(const struct stat &status) {
-    return S_ISREG(status.st_mode) && status.st_nlink <= 1 &&
-           (status.st_uid == 0 || status.st_uid == geteuid());
-}
-
-bool ReadShared(const std::string &strFolder, bool &blShared) {
-    struct stat status = {};
-    if (stat(strFolder.empty() ? "." : strFolder.c_str(), &status) != 0) {
-        HOST_FAIL(YLIBC_ERR_FILE);
-        return false;
+Status FindFile(const char *szPath, FoundFile &found) {
+    found.strPath = szPath;
+    bool blDone = false;
+    for (int steps = 0; steps <= kMaxLinks && !blDone; ++steps) {
+        HOST_TRY(TakeStep(found, blDone));
     }
-    blShared = (status.st_mode & S_IWOTH) != 0;
-    return true;
+    return blDone ? Status() : CannotOpen(szPath, ELOOP);
 }
 
-Find FindFile(const char *szPath, FoundFile &found) {
-    SetPath(found, szPath);
-    for (int links = 0; links <= kMaxLinks; ++links) {
-        RemoveForeignFile(found.Path());
-        found.file = Descriptor(
-            open(found.Path().c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
-        found.blThere = found.file.IsOpen();
-        if (found.blThere) {
-            return LookAtOpened(found);
-        }
-        if (errno == ENOENT) {
-            return Find::kNoFile;
-        }
-        if (errno != ELOOP) {
-            return FailToOpen(found);
-        }
-        if (!FollowLink(found)) {
-            return Find::kFailed;
-        }
-    }
-    return Failed(YLIBC_ERR_FILE, __LINE__);
-}
-
-bool ReadContent(const FoundFile &found, std::string &strContent) {
+Status ReadContent(const FoundFile &found, std::string &strContent) {
     const auto cbExpected = static_cast<std::size_t>(found.status.st_size);
     std::size_t cb = 0;
     // With a byte more than expected, the first read mostly shows that there is no more to come.
@@ -130,16 +94,16 @@ bool ReadContent(const FoundFile &found, std::string &strContent) {
         }
         const ssize_t cbRead = read(found.file.Get(), &strContent[cb], strContent.size() - cb);
         if (cbRead < 0) {
-            break;
+            return HOST_ERROR(YLIBC_ERR_FILE,
+                              "cannot read '" + found.strPath + "': " + std::strerror(errno));
         }
         cb += static_cast<std::size_t>(cbRead);
         if (cbRead == 0 || (cb == cbExpected && cb < strContent.size())) {
             strContent.resize(cb);
-            return true;
+            return {};
         }
     }
-    HOST_FAIL(YLIBC_ERR_FILE);
-    return false;
+    return HOST_ERROR(YLIBC_ERR_FILE, '\'' + found.strPath + "' is larger than 64 MiB");
 }
 
 }  // namespace host

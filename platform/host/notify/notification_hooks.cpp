@@ -9,10 +9,10 @@
 #include <new>
 
 #include "programs/program_folder.h"
+#include "system_log.h"
 
 namespace {
 
-constexpr const char *kFile = "notification_hooks";
 constexpr const char *kFolder = "/usr/zelo/etc/notify.d";
 constexpr std::chrono::seconds kLimit(10);
 
@@ -46,12 +46,13 @@ std::vector<std::string> Environment(const host::Notification &notification) {
 
 void host::RunHooks(const Notification &notification) {
     try {
-        ProgramEnd first;
-        static_cast<void>(RunProgramFolder(
+        int status = 0;
+        RunProgramFolder(
             kFolder, {"notification hook", notification.strTag, Environment(notification), kLimit},
-            first));
+            status)
+            .Log();
     } catch (const std::bad_alloc &) {
-        syslog(LOG_ERR, "%s:%d out of memory: not all notification hooks were run", kFile,
-               __LINE__);
+        system_log::Write(LOG_ERR, ZELO_SOURCE_STEM, __LINE__,
+                          "out of memory: not all notification hooks were run");
     }
 }

@@ -4,8 +4,8 @@
 // takes away what is known of the end of its children. So a child process, the warden, starts the
 // program, waits for it and ends it when its time is over. The warden has no exit signal: its own
 // end sends no SIGCHLD, an ignored SIGCHLD does not lose it, and a wait for any child passes it
-// over. What it saw of the program stands in a page that it shares with the caller, which may ask
-// it there to end the program at once.
+// over. What it saw of the program stands in a page that it shares with the caller, which asks it
+// there to end the program when the process's deadline comes.
 //
 // The warden is a copy of a process that may have other threads, and their locks stay locked in the
 // copy for ever: it calls only functions that take no lock, and everything that needs memory is
@@ -14,6 +14,7 @@
 #include "program.h"
 
 #include <fcntl.h>
+#include <linux/futex.h>
 #include <pthread.h>
 #include <spawn.h>
 #include <sys/mman.h>
@@ -22,22 +23,27 @@
 #include <unistd.h>
 
 #include <algorithm>
-#include <array>
 #include <atomic>
 #include <cerrno>
 #include <csignal>
+#include <cstdint>
+#include <cstring>
 #include <ctime>
 #include <memory>
 #include <new>
 #include <string_view>
 
-#include "wait.h"
+#include "deadline.h"
+#include "diagnosis.h"
 #include "waiting.h"
 
 namespace {
 
-using host::ProgramEnd;
-using Clock = std::chrono::steady_clock;
+using Clock = host::Wait::Clock;
+
+constexpr int kTimedOutStatus = 124;
+constexpr int kNotRunStatus = 126;
+constexpr int kSignalledBase = 128;
 
 // How long a killed program may take to disappear. One that hangs inside the kernel takes longer;
 // it is left to end by itself.
@@ -131,10 +137,11 @@ class Start {
 
 // What the caller and the warden share.
 struct Page {
-    ProgramEnd end;
-    pid_t warden = -1;  // the caller's alone
+    enum class End { kUnknown, kNotRun, kTimedOut, kHasStatus };
+    End end = End::kUnknown;
+    int value = 0;  // the errno of a start that failed, or the status
     std::atomic<bool> blEndAsked{false};
-    std::atomic<bool> blEnded{false};
+    std::atomic<std::uint32_t> ended{0};
 };
 
 struct Unmap {
@@ -152,60 +159,60 @@ SharedPage NewSharedPage() {
 
 // --- In the warden ------------------------------------------------------------------------------
 
-timespec Until(Clock::time_point deadline) {
-    const std::chrono::nanoseconds left = std::max(deadline - Clock::now(), Clock::duration(0));
-    const auto left_s = std::chrono::duration_cast<std::chrono::seconds>(left);
-    return {static_cast<time_t>(left_s.count()), static_cast<long>((left - left_s).count())};
+timespec Timespec(Clock::duration time) {
+    const auto time_s = std::chrono::duration_cast<std::chrono::seconds>(time);
+    return {static_cast<time_t>(time_s.count()),
+            static_cast<long>(std::chrono::nanoseconds(time - time_s).count())};
 }
 
-// Waits for the child's end; false when it has not come by the deadline, or is asked for. SIGCHLD
+// Waits for the child's end; false when it has not come in time, or is asked for. SIGCHLD
 // is blocked, so one that comes between the look and the wait is not missed; the caller sends it
 // too.
-bool AwaitEnd(pid_t pid, Clock::time_point deadline, const std::atomic<bool> &blAsked,
-              int &status) {
+bool AwaitEnd(pid_t pid, Clock::time_point end, const std::atomic<bool> &blAsked, int &status) {
     sigset_t childSignal;
     sigemptyset(&childSignal);
     sigaddset(&childSignal, SIGCHLD);
     while (waitpid(pid, &status, WNOHANG) != pid) {
-        const timespec left = Until(deadline);
-        if (blAsked || (left.tv_sec == 0 && left.tv_nsec == 0)) {
+        const Clock::duration left = end - Clock::now();
+        if (blAsked || left <= Clock::duration::zero()) {
             return false;
         }
-        sigtimedwait(&childSignal, nullptr, &left);
+        const timespec time = Timespec(left);
+        sigtimedwait(&childSignal, nullptr, &time);
     }
     return true;
 }
 
-ProgramEnd Describe(int status) {
-    return WIFEXITED(status) ? ProgramEnd{ProgramEnd::Kind::kExited, WEXITSTATUS(status)}
-                             : ProgramEnd{ProgramEnd::Kind::kSignalled, WTERMSIG(status)};
-}
-
-ProgramEnd Watch(const Start &start, std::chrono::milliseconds limit,
-                 const std::atomic<bool> &blEndAsked) {
-    const Clock::time_point deadline = Clock::now() + limit;
+// Starts the program and waits for it.
+void Watch(const Start &start, std::chrono::seconds limit, Page &page) {
+    const Clock::time_point end = Clock::now() + limit;
     pid_t pid = -1;
-    if (const int error = start(pid); error != 0) {
-        return {ProgramEnd::Kind::kNotRun, error};
+    page.value = start(pid);
+    if (page.value != 0) {
+        page.end = Page::End::kNotRun;
+        return;
     }
     int status = 0;
-    if (AwaitEnd(pid, deadline, blEndAsked, status)) {
-        return Describe(status);
+    if (AwaitEnd(pid, end, page.blEndAsked, status)) {
+        page.end = Page::End::kHasStatus;
+        page.value = WIFEXITED(status) ? WEXITSTATUS(status) : kSignalledBase + WTERMSIG(status);
+        return;
     }
+    page.end = Page::End::kTimedOut;
     // The program itself may have moved to another group.
     kill(-pid, SIGKILL);
     kill(pid, SIGKILL);
     AwaitEnd(pid, Clock::now() + kLongestDying, false, status);
-    return {ProgramEnd::Kind::kTimedOut, 0};
 }
 
-[[noreturn]] void BeWarden(const Start &start, std::chrono::milliseconds limit, Page &page) {
+[[noreturn]] void BeWarden(const Start &start, std::chrono::seconds limit, Page &page) {
     closefrom(0);
     struct sigaction byDefault = {};
     byDefault.sa_handler = SIG_DFL;
     sigaction(SIGCHLD, &byDefault, nullptr);
-    page.end = Watch(start, limit, page.blEndAsked);
-    page.blEnded = true;
+    Watch(start, limit, page);
+    page.ended = 1;
+    syscall(SYS_futex, &page.ended, FUTEX_WAKE, 1, nullptr, nullptr, 0);
     // Not _exit: before it, the runtime of a sanitizer waits for locks of the other threads.
     for (;;) {
         syscall(SYS_exit_group, 0);
@@ -217,7 +224,7 @@ ProgramEnd Watch(const Start &start, std::chrono::milliseconds limit,
 // Makes the warden: a fork without exit signal, and without the handlers that a fork runs. It must
 // run nothing of the caller's, so it starts, and stays, with all signals blocked. Returns its id,
 // or -1 with errno.
-pid_t StartWarden(const Start &start, std::chrono::milliseconds limit, Page &page) {
+pid_t StartWarden(const Start &start, std::chrono::seconds limit, Page &page) {
     sigset_t all;
     sigset_t before;
     sigfillset(&all);
@@ -232,101 +239,64 @@ pid_t StartWarden(const Start &start, std::chrono::milliseconds limit, Page &pag
     return static_cast<pid_t>(pid);
 }
 
-// The pages of the programs that run. Whoever takes a page out of its place owns it: the one who
-// ran the program, or the one who ends it. Of more programs than places the last are not ended.
-constexpr std::size_t kMaxRunning = 32;
-std::array<std::atomic<Page *>, kMaxRunning> g_running = {};
-std::atomic<bool> g_blGivenUp{false};
-
-// A child process has the pages of its parent's programs, which are none of its business.
-void ForgetInChild() {
-    for (std::atomic<Page *> &place : g_running) {
-        place = nullptr;
-    }
-}
-
-const int g_forkHandlers = pthread_atfork(nullptr, nullptr, ForgetInChild);
-
-[[noreturn]] void WaitForTheEnd() {
-    for (;;) {
-        pause();
-    }
-}
-
-bool PutInPlace(Page *pPage, std::size_t &place) {
-    for (place = 0; place < kMaxRunning; ++place) {
-        Page *pNone = nullptr;
-        if (g_running[place].compare_exchange_strong(pNone, pPage)) {
-            return true;
+// Waits for the warden's end. One that was killed wakes nobody, which the next look shows.
+void AwaitWarden(pid_t warden, host::Wait &wait, Page &page) {
+    while (waitpid(warden, nullptr, __WALL | WNOHANG) == 0) {
+        const timespec slice = Timespec(wait.Slice());
+        if (slice.tv_sec == 0 && slice.tv_nsec == 0) {
+            page.blEndAsked = true;
+            kill(warden, SIGCHLD);
+            while (waitpid(warden, nullptr, __WALL) < 0 && errno == EINTR) {
+            }
+            return;
         }
+        syscall(SYS_futex, &page.ended, FUTEX_WAIT, 0, &slice, nullptr, 0);
     }
-    return false;
 }
-
-void AskForEnd(Page &page) {
-    page.blEndAsked = true;
-    kill(page.warden, SIGCHLD);
-}
-
-ProgramEnd RunWithWarden(const Start &start, std::chrono::milliseconds limit) {
-    SharedPage pPage = NewSharedPage();
-    const pid_t pid = pPage == nullptr ? -1 : StartWarden(start, limit, *pPage);
-    if (pid < 0) {
-        return {ProgramEnd::Kind::kNotRun, errno};
-    }
-    pPage->warden = pid;
-    std::size_t place = 0;
-    const bool blPlaced = PutInPlace(pPage.get(), place);
-    // Who gives up looks through the places after saying so: the page is found there, or this is.
-    if (g_blGivenUp) {
-        AskForEnd(*pPage);
-    }
-    while (waitpid(pid, nullptr, __WALL) < 0 && errno == EINTR) {
-    }
-    const bool blMine = !blPlaced || g_running[place].exchange(nullptr) != nullptr;
-    if (!blMine || g_blGivenUp) {
-        static_cast<void>(pPage.release());
-        WaitForTheEnd();
-    }
-    return pPage->end;
-}
-
-constexpr timespec kLookPause = {0, 1'000'000};
-constexpr std::chrono::milliseconds kLongestGivingUp(500);
 
 }  // namespace
 
-ProgramEnd host::RunProgram(const std::vector<std::string> &arguments,
-                            const std::vector<std::string> &environment,
-                            std::chrono::milliseconds limit) {
+host::Status host::RunProgram(const std::vector<std::string> &arguments,
+                              const std::vector<std::string> &environment,
+                              std::chrono::seconds limit, int &status) {
+    status = kNotRunStatus;
+    const std::string strCommand =
+        '\'' + arguments[0] + (arguments.size() > 1 ? ' ' + arguments[1] : "") + '\'';
+    Wait wait("the program " + strCommand, limit);
+    if (Wait::IsPastDeadline()) {
+        return wait.TimeUp(YLIBC_ERR_DEADLINE);
+    }
     const Start start(arguments, environment);
-    const bool blBare = arguments.size() == 1;
-    const Waiting waiting(
-        {"running '", arguments[0], blBare ? "" : " ", blBare ? "" : arguments[1], "'"});
+    const SharedPage pPage = NewSharedPage();
     // A cancelled thread ends after the program: an unwinding here would lose the warden, and one
     // in the warden would run the caller's handlers.
     int cancelState = 0;
     pthread_setcancelstate(PTHREAD_CANCEL_DISABLE, &cancelState);
-    if (g_blGivenUp) {
-        WaitForTheEnd();
+    const pid_t warden = pPage == nullptr ? -1 : StartWarden(start, limit, *pPage);
+    const int error = errno;
+    if (warden >= 0) {
+        AwaitWarden(warden, wait, *pPage);
     }
-    const ProgramEnd end = RunWithWarden(start, limit);
     pthread_setcancelstate(cancelState, nullptr);
-    return end;
+    if (warden < 0 || pPage->end == Page::End::kNotRun) {
+        return HOST_ERROR(YLIBC_ERR_EXEC, "cannot run " + strCommand + ": " +
+                                              std::strerror(warden < 0 ? error : pPage->value));
+    }
+    switch (pPage->end) {
+        case Page::End::kHasStatus:
+            status = pPage->value;
+            return {};
+        case Page::End::kTimedOut:
+            status = kTimedOutStatus;
+            return wait.TimeUp(YLIBC_ERR_EXEC_TIME);
+        default:
+            return HOST_ERROR(YLIBC_ERR_EXEC, "nothing is known of the end of " + strCommand);
+    }
 }
 
+// Until no program asks for it: those who wait notice the deadline within a slice.
 void ZELOWaitingGiveUp() {
-    g_blGivenUp = true;
-    std::array<Page *, kMaxRunning> asked = {};
-    for (std::size_t i = 0; i < kMaxRunning; ++i) {
-        asked[i] = g_running[i].exchange(nullptr);
-        if (asked[i] != nullptr) {
-            AskForEnd(*asked[i]);
-        }
-    }
-    const auto isOver = [](const Page *pPage) { return pPage == nullptr || pPage->blEnded; };
-    const Clock::time_point end = Clock::now() + kLongestGivingUp;
-    while (!std::all_of(asked.begin(), asked.end(), isOver) && Clock::now() < end) {
-        nanosleep(&kLookPause, nullptr);
-    }
+    ZELODeadlineSet(0);
+    const timespec pause = {0, 300'000'000};
+    nanosleep(&pause, nullptr);
 }
