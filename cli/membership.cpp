@@ -8,6 +8,7 @@
 #include <filesystem>
 
 #include "credential_store.h"
+#include "diagnosis.h"
 #include "file_lock.h"
 #include "fixed_text.h"
 #include "json.h"
@@ -148,7 +149,8 @@ std::vector<std::string> StoresSetAside() {
     constexpr int kListSize = 1024;
     std::vector<std::string> paths;
     ListHandle list(YLIBCSzListAlloc(kListSize));
-    if (list.Get() == nullptr || ZELOCredStoreListSetAside(list.Address()) < 0) {
+    if (ZELOCredStoreListSetAside == nullptr || list.Get() == nullptr ||
+        ZELOCredStoreListSetAside(list.Address()) < 0) {
         return paths;
     }
     for (int i = 0; i < list.Get()->nItem; ++i) {
