@@ -33,8 +33,6 @@
 #include <string_view>
 
 #include "deadline.h"
-#include "diagnosis.h"
-#include "waiting.h"
 
 namespace {
 
@@ -271,11 +269,4 @@ host::Status host::RunProgram(const std::vector<std::string> &arguments,
     const bool blTimedOut = pPage->end == Page::End::kTimedOut;
     status = blTimedOut ? kTimedOutStatus : pPage->status;
     return blTimedOut ? wait.TimeUp(YLIBC_ERR_EXEC_TIME) : Status();
-}
-
-// Until no program asks for it: those who wait notice the deadline within a slice.
-void ZELOWaitingGiveUp() {
-    ZELODeadlineSet(0);
-    const timespec pause = {0, 300'000'000};
-    nanosleep(&pause, nullptr);
 }
