@@ -3,9 +3,12 @@
 #ifndef QRMCTL_CHECK_H
 #define QRMCTL_CHECK_H
 
+#include <algorithm>
 #include <chrono>
 #include <string>
 #include <vector>
+
+#include "deadline.h"
 
 namespace qrmctl {
 
@@ -36,10 +39,14 @@ inline const char *OutcomeName(Outcome outcome) {
     return "skipped";
 }
 
-// The moment at which checking gives up, whatever is still to do.
+// The moment at which checking gives up, whatever is still to do; the run's deadline at the latest.
 class TimeLimit {
   public:
-    explicit TimeLimit(std::chrono::milliseconds limit) : m_end(Clock::now() + limit) {}
+    // A step that the deadline cuts ends a little after it, so that it is told as struck.
+    explicit TimeLimit(std::chrono::milliseconds limit)
+        : m_end(Clock::now() +
+                std::min(limit, kAfter + std::chrono::milliseconds(
+                                             static_cast<long long>(DeadlineLeft_s() * 1000)))) {}
 
     // What is left for one step, and never more than the step's own limit. 0: nothing.
     long Left_ms(long step_ms) const {
@@ -51,6 +58,7 @@ class TimeLimit {
 
   private:
     using Clock = std::chrono::steady_clock;
+    static constexpr std::chrono::milliseconds kAfter{5};
     Clock::time_point m_end;
 };
 

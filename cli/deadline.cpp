@@ -1,69 +1,43 @@
 #include "deadline.h"
 
-#include <json/value.h>
-#include <pthread.h>
+#include <poll.h>
 #include <unistd.h>
 
-#include <array>
+#include <algorithm>
 #include <chrono>
-#include <condition_variable>
-#include <csignal>
-#include <cstddef>
-#include <exception>
-#include <mutex>
-#include <new>
+#include <ctime>
+#include <iterator>
 #include <sstream>
 #include <string_view>
-#include <thread>
-#include <utility>
+#include <system_error>
 
-#include "fixed_text.h"
-#include "json.h"
-#include "output.h"
-#include "printable.h"
-#include "report.h"
-#include "waiting.h"
+#include "diagnosis.h"
+#include "error_ids.h"
 
 namespace qrmctl {
 namespace {
 
 using Clock = std::chrono::steady_clock;
 
-constexpr std::chrono::milliseconds kLongestCleanup(500);
-constexpr std::chrono::milliseconds kLongestTelling(250);
 constexpr const char *kRemedy = "mend what it waited for, or give it more time with --deadline";
 
 struct Stage {
     std::string strName;
-    Clock::duration time;
+    Clock::duration time = Clock::duration::zero();
 };
 
-// Its members take no memory before they are set: output needs it when memory is short.
-struct Watch {
-    std::mutex mutex;
-    std::condition_variable wake;
-    bool blStopped = false;
-    bool blJson = false;
-    bool blOutput = false;
-    double limit_s = 0;
-    Stage longest = {"", Clock::duration::zero()};  // of those that are over
+struct Run {
+    double limit_s = kMaxDeadline_s;
+    Clock::time_point end = Clock::time_point::max();
+    Stage longest;  // of those that are over
     std::string strStage = "starting";
     Clock::time_point begin = Clock::now();
-    Clock::time_point end = Clock::time_point::max();
-    std::string strRemedy;  // "" for kRemedy
-    std::function<void()> cleanup;
-    std::mutex cleanupMutex;
-    std::condition_variable cleanupWake;
-    bool blCleanupAsked = false;
-    bool blCleaned = false;
+    std::string strRemedy = kRemedy;
+    std::string strWaitsFor;  // when the deadline came; "" for nothing that the platform knows
+    timer_t timer = {};
+    bool blTimer = false;
 };
-
-// Never destroyed: the thread that keeps the time waits on it while the process ends.
-Watch &TheWatch() {
-    alignas(Watch) static std::array<std::byte, sizeof(Watch)> place;
-    static Watch *const pWatch = new (place.data()) Watch;
-    return *pWatch;
-}
+Run g_run;
 
 std::string Seconds(double seconds) {
     std::ostringstream text;
@@ -77,188 +51,154 @@ std::string Seconds(Clock::duration time) {
         1000);
 }
 
-// A text for a message that is to fit into a pipe at once; cut between characters.
-std::string Short(const std::string &strText) {
-    constexpr std::size_t kMost = 300;
-    if (strText.size() <= kMost) {
-        return strText;
-    }
-    std::size_t cb = kMost;
-    while (cb > 0 && (static_cast<unsigned char>(strText[cb]) & 0xC0U) == 0x80U) {
-        --cb;
-    }
-    return strText.substr(0, cb) + "...";
-}
-
-// --- The strike ---------------------------------------------------------------------------------
-
-// The stage in force, with what the platform waits for in it.
-std::string StageNow(const Watch &watch) {
-    FixedText<1024> waiting;
-    return ZELOWaitingFor(waiting.Buffer(), FixedText<1024>::Size()) > 0
-               ? Short(watch.strStage) + ", " + Short(waiting.sz())
-               : Short(watch.strStage);
-}
-
-// A thread that was there before, since starting one may fail.
-void RunCleanup() {
-    Watch &watch = TheWatch();
-    std::unique_lock<std::mutex> lock(watch.cleanupMutex);
-    watch.cleanupWake.wait(lock, [&watch] { return watch.blCleanupAsked; });
-    try {
-        watch.cleanup();
-    } catch (const std::exception &) {
-        // What is left over stays; there is nobody to tell.
-    }
-    watch.blCleaned = true;
-    watch.cleanupWake.notify_all();
-}
-
-void CleanUp(Watch &watch) {
-    if (!watch.cleanup) {
-        return;
-    }
-    std::unique_lock<std::mutex> lock(watch.cleanupMutex);
-    watch.blCleanupAsked = true;
-    watch.cleanupWake.notify_all();
-    watch.cleanupWake.wait_for(lock, kLongestCleanup, [&watch] { return watch.blCleaned; });
-}
-
-// A reader that has stopped reading must not keep the program from ending.
-void WriteSoon(int fd, std::string_view text) {
-    const Clock::time_point end = Clock::now() + kLongestTelling;
-    while (!text.empty()) {
-        const ssize_t cb = WriteNow(fd, text);
-        const auto left = std::chrono::duration_cast<std::chrono::milliseconds>(end - Clock::now());
-        if (cb < 0 || (cb == 0 && (left.count() <= 0 || !AwaitRoom(fd, left)))) {
-            return;
+void NoteWait(void * /*pContext*/, const char *szWaitsFor, double /*waited_s*/) {
+    if (IsDeadlineOver() && g_run.strWaitsFor.empty()) {
+        try {
+            g_run.strWaitsFor = szWaitsFor;
+        } catch (const std::bad_alloc &) {
+            // The stage alone is named.
         }
-        text.remove_prefix(static_cast<std::size_t>(cb));
     }
 }
 
-void Tell(const Watch &watch, const std::string &strStage, Clock::duration time) {
-    const bool blEarlier = watch.longest.time > time;
-    const std::string strLongest = Short(watch.longest.strName);
-    std::string strError = "the deadline of " + Seconds(watch.limit_s) + " struck while '" +
-                           strStage + "' (" + Seconds(time) + ')';
-    if (blEarlier) {
-        strError += ", after '" + strLongest + "' had taken " + Seconds(watch.longest.time);
+// A reader who has stopped reading keeps no line of this length out of a pipe that has room.
+void EndAtOnce(int /*signal*/) {
+    constexpr std::string_view kLine =
+        "qrmctl: the deadline struck a second ago, and what the program is blocked in does not "
+        "end\n";
+    pollfd output = {STDERR_FILENO, POLLOUT, 0};
+    if (poll(&output, 1, 0) == 1) {
+        static_cast<void>(write(STDERR_FILENO, kLine.data(), kLine.size()) == 0);
     }
-    strError += "; " + (watch.strRemedy.empty() ? kRemedy : watch.strRemedy);
-    if (watch.blJson && !watch.blOutput) {
-        Json::Value result;
-        result["schema"] = kSchema;
-        result["success"] = false;
-        result["error"] = strError;
-        result["error_id"] = ErrorOf(ErrorId::kDeadline).szId;
-        result["deadline_s"] = watch.limit_s;
-        result["stage"] = strStage;
-        result["longest_stage"] = blEarlier ? strLongest : strStage;
-        WriteSoon(STDOUT_FILENO, json::ToLogText(result) + '\n');
-    }
-    WriteSoon(STDERR_FILENO, "qrmctl: " + printable::Line(strError) + '\n');
+    _exit(kDeadline);
 }
 
-// The mutex is held to the end: the main thread enters no other stage and prints nothing more.
-[[noreturn]] void Strike(Watch &watch) {
-    try {
-        const Clock::duration time = Clock::now() - watch.begin;
-        const std::string strStage = StageNow(watch);
-        ZELOWaitingGiveUp();
-        CleanUp(watch);
-        Tell(watch, strStage, time);
-    } catch (const std::exception &) {
-        // Without memory there is no message; the exit status tells enough.
-    }
-    _exit(ErrorOf(ErrorId::kDeadline).exitCode);
-}
-
-void KeepTime(Clock::time_point end) {
-    Watch &watch = TheWatch();
-    std::unique_lock<std::mutex> lock(watch.mutex);
-    if (!watch.wake.wait_until(lock, end, [&watch] { return watch.blStopped; })) {
-        Strike(watch);
+// A second after the deadline, and again each second: somebody else may have taken the signal.
+void StartTimer(double limit_s) {
+    struct sigaction action = {};
+    action.sa_handler = EndAtOnce;
+    sigaction(SIGALRM, &action, nullptr);
+    sigset_t alarm;
+    sigemptyset(&alarm);
+    sigaddset(&alarm, SIGALRM);
+    pthread_sigmask(SIG_UNBLOCK, &alarm, nullptr);
+    const auto whole_s = static_cast<time_t>(limit_s);
+    constexpr double kNsPerS = 1e9;
+    struct itimerspec times = {};
+    times.it_value.tv_sec = whole_s + 1;
+    times.it_value.tv_nsec = static_cast<long>((limit_s - static_cast<double>(whole_s)) * kNsPerS);
+    times.it_interval.tv_sec = 1;
+    struct sigevent event = {};
+    event.sigev_notify = SIGEV_SIGNAL;
+    event.sigev_signo = SIGALRM;
+    g_run.blTimer = timer_create(CLOCK_MONOTONIC, &event, &g_run.timer) == 0 &&
+                    timer_settime(g_run.timer, 0, &times, nullptr) == 0;
+    if (!g_run.blTimer) {
+        throw std::system_error(errno, std::generic_category(), "timer_create");
     }
 }
 
 }  // namespace
 
-void StartDeadline(double limit_s, bool blJson) {
-    Watch &watch = TheWatch();
-    watch.limit_s = limit_s;
-    watch.blJson = blJson;
-    const Clock::time_point end = watch.begin + std::chrono::duration_cast<Clock::duration>(
-                                                    std::chrono::duration<double>(limit_s));
-    watch.end = end;
-    sigset_t all;
-    sigset_t before;
-    sigfillset(&all);
-    pthread_sigmask(SIG_SETMASK, &all, &before);
-    std::thread(RunCleanup).detach();
-    std::thread(KeepTime, end).detach();
-    pthread_sigmask(SIG_SETMASK, &before, nullptr);
+void StartDeadline(double limit_s) {
+    constexpr double kMsPerS = 1000;
+    const auto limit_ms = static_cast<long long>(limit_s * kMsPerS);
+    StartTimer(limit_s);
+    g_run.limit_s = limit_s;
+    // Not after the platform's own: what has given up there finds the deadline over here.
+    g_run.end = Clock::now() + std::chrono::milliseconds(limit_ms);
+    if (ZELODeadlineSet != nullptr) {
+        ZELODeadlineSet(limit_ms);
+    }
+    if (ZELOWaitObserverSet != nullptr) {
+        ZELOWaitObserverSet(NoteWait, nullptr);
+    }
 }
 
 void EnterStage(const std::string &strName) {
-    Watch &watch = TheWatch();
-    const std::lock_guard<std::mutex> lock(watch.mutex);
-    const Clock::time_point now = Clock::now();
-    if (now - watch.begin > watch.longest.time) {
-        watch.longest = {watch.strStage, now - watch.begin};
+    if (IsDeadlineOver()) {
+        return;
     }
-    watch.strStage = strName;
-    watch.begin = now;
+    const Clock::time_point now = Clock::now();
+    if (now - g_run.begin > g_run.longest.time) {
+        g_run.longest = {g_run.strStage, now - g_run.begin};
+    }
+    g_run.strStage = strName;
+    g_run.begin = now;
 }
 
 void SetDeadlineRemedy(const std::string &strRemedy) {
-    Watch &watch = TheWatch();
-    const std::lock_guard<std::mutex> lock(watch.mutex);
-    watch.strRemedy = strRemedy;
-}
-
-// Each piece is written under the mutex: the deadline strikes before the last one or not at all.
-bool Deliver(int fd, std::string_view text, bool blLast) {
-    Watch &watch = TheWatch();
-    for (;;) {
-        {
-            const std::lock_guard<std::mutex> lock(watch.mutex);
-            const ssize_t cb = WriteNow(fd, text);
-            if (cb < 0) {
-                return false;
-            }
-            watch.blOutput = watch.blOutput || (fd == STDOUT_FILENO && cb > 0);
-            text.remove_prefix(static_cast<std::size_t>(cb));
-            if (text.empty()) {
-                watch.blStopped = watch.blStopped || blLast;
-                return true;
-            }
-        }
-        AwaitRoom(fd, std::chrono::milliseconds(-1));
+    if (!IsDeadlineOver()) {
+        g_run.strRemedy = strRemedy;
     }
 }
 
+bool IsDeadlineOver() {
+    return Clock::now() >= g_run.end;
+}
+
 double DeadlineLeft_s() {
-    const Clock::time_point end = TheWatch().end;
-    return end == Clock::time_point::max()
+    return g_run.end == Clock::time_point::max()
                ? kMaxDeadline_s
-               : std::chrono::duration<double>(end - Clock::now()).count();
+               : std::max(0.0, std::chrono::duration<double>(g_run.end - Clock::now()).count());
 }
 
-DeadlineCleanup::DeadlineCleanup(const std::function<void()> &make, std::function<void()> cleanup) {
-    const std::lock_guard<std::mutex> lock(TheWatch().mutex);
-    make();
-    TheWatch().cleanup = std::move(cleanup);
+Strike DescribeStrike() {
+    const Clock::duration time = Clock::now() - g_run.begin;
+    const bool blEarlier = g_run.longest.time > time;
+    Strike strike;
+    strike.limit_s = g_run.limit_s;
+    strike.strStage =
+        g_run.strStage + (g_run.strWaitsFor.empty() ? "" : ", waiting for " + g_run.strWaitsFor);
+    strike.strLongest = blEarlier ? g_run.longest.strName : strike.strStage;
+    strike.strError = "the deadline of " + Seconds(g_run.limit_s) + " struck while '" +
+                      strike.strStage + "' (" + Seconds(time) + ')';
+    if (blEarlier) {
+        strike.strError +=
+            ", after '" + strike.strLongest + "' had taken " + Seconds(g_run.longest.time);
+    }
+    strike.strError += "; " + g_run.strRemedy;
+    return strike;
 }
 
-DeadlineCleanup::DeadlineCleanup(std::function<void()> cleanup) {
-    const std::lock_guard<std::mutex> lock(TheWatch().mutex);
-    TheWatch().cleanup = std::move(cleanup);
+void EndDeadline() {
+    if (g_run.blTimer) {
+        timer_delete(g_run.timer);
+        g_run.blTimer = false;
+    }
 }
 
-DeadlineCleanup::~DeadlineCleanup() {
-    const std::lock_guard<std::mutex> lock(TheWatch().mutex);
-    TheWatch().cleanup = nullptr;
+// --- Interruption -------------------------------------------------------------------------------
+
+namespace {
+
+volatile std::sig_atomic_t g_blInterrupted = 0;
+
+void Interrupt(int /*signal*/) {
+    g_blInterrupted = 1;
+    if (ZELODeadlineSet != nullptr) {
+        ZELODeadlineSet(0);
+    }
+}
+
+}  // namespace
+
+InterruptGuard::InterruptGuard() {
+    struct sigaction action = {};
+    action.sa_handler = Interrupt;
+    for (std::size_t i = 0; i < std::size(kSignals); ++i) {
+        sigaction(kSignals[i], &action, &m_before[i]);
+    }
+}
+
+InterruptGuard::~InterruptGuard() {
+    for (std::size_t i = 0; i < std::size(kSignals); ++i) {
+        sigaction(kSignals[i], &m_before[i], nullptr);
+    }
+}
+
+bool InterruptGuard::IsInterrupted() {
+    return g_blInterrupted != 0;
 }
 
 }  // namespace qrmctl

@@ -1,51 +1,58 @@
-// The deadline of a run: when it strikes, the program ends at once, whatever it is blocked in, and
-// says which stage used the time and what it waited for. A program that it runs meanwhile, such as
-// a plug-in, is ended with it.
-//
-// A thread of its own keeps the time. It blocks all signals, so that none that is meant to
-// interrupt a wait of the main thread is lost to it.
+// The deadline of a run. Every wait of the platform ends there, so the operation comes back with a
+// failure; the report then says which stage used the time and what it waited for. What is blocked
+// inside the kernel is ended by a signal one second later, with a line on standard error alone.
 
 #ifndef QRMCTL_DEADLINE_H
 #define QRMCTL_DEADLINE_H
 
-#include <functional>
+#include <csignal>
 #include <string>
-#include <string_view>
 
 namespace qrmctl {
 
 // The longest deadline that may be asked for, about 31 years.
 constexpr double kMaxDeadline_s = 1e9;
 
-// Starts the clock, once in a process. limit_s is above 0 and at most kMaxDeadline_s. blJson: the
-// end is told on standard output too, as a JSON object.
-void StartDeadline(double limit_s, bool blJson);
+// Starts the clock, once in a process. limit_s is above 0 and at most kMaxDeadline_s.
+void StartDeadline(double limit_s);
 
-// From here on the time counts for the stage with this name, such as "reading the token file".
+// From here on the time counts for the stage with this name, such as "reading the token file". What
+// comes after the deadline is part of the stage in which it struck.
 void EnterStage(const std::string &strName);
 
 // What the operator is told to do when the deadline strikes from here on.
 void SetDeadlineRemedy(const std::string &strRemedy);
 
-// Writes the text to the standard stream. The deadline strikes while it waits for the reader; it is
-// told on standard error alone once standard output has begun. blLast: with the text's last byte,
-// or at once when it has none, the deadline is over. False when the stream cannot be written.
-bool Deliver(int fd, std::string_view text, bool blLast);
+bool IsDeadlineOver();
 
-// The seconds until the deadline strikes; kMaxDeadline_s when none was started.
+// The seconds until the deadline strikes, 0 afterwards; kMaxDeadline_s when none was started.
 double DeadlineLeft_s();
 
-// Something to clear away when the deadline strikes during its life, within half a second; what
-// takes longer is left.
-class DeadlineCleanup {
+// How the deadline struck.
+struct Strike {
+    double limit_s;
+    std::string strStage;
+    std::string strLongest;
+    std::string strError;
+};
+Strike DescribeStrike();
+
+// The result is out: nothing ends the program any more.
+void EndDeadline();
+
+// While it lives, a signal that would end the program ends the platform's waits instead.
+class InterruptGuard {
   public:
-    explicit DeadlineCleanup(std::function<void()> cleanup);
-    // The same for what `make` makes, which is to be short: the deadline strikes before or after
-    // it.
-    DeadlineCleanup(const std::function<void()> &make, std::function<void()> cleanup);
-    ~DeadlineCleanup();
-    DeadlineCleanup(const DeadlineCleanup &) = delete;
-    DeadlineCleanup &operator=(const DeadlineCleanup &) = delete;
+    InterruptGuard();
+    ~InterruptGuard();
+    InterruptGuard(const InterruptGuard &) = delete;
+    InterruptGuard &operator=(const InterruptGuard &) = delete;
+
+    static bool IsInterrupted();
+
+  private:
+    static constexpr int kSignals[] = {SIGINT, SIGTERM, SIGHUP};
+    struct sigaction m_before[3] = {};
 };
 
 }  // namespace qrmctl

@@ -49,6 +49,8 @@ const std::vector<ErrorEntry> &AllErrors() {
          "another server than the one named is joined already; nothing was changed"},
         {ErrorId::kLeaveFailed, "leave-failed", kFailed,
          "a step of leaving failed, or it cannot be told what is left; what came before is done"},
+        {ErrorId::kLockUnavailable, "lock-unavailable", kFailed,
+         "the lock of the programs that join or leave cannot be had; nothing was changed"},
         {ErrorId::kLogNotConfirmed, "log-not-confirmed", kFailed,
          "the server has not confirmed the log entry"},
         {ErrorId::kNoCredential, "no-credential", kFailed, "no server credential is stored"},

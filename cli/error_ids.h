@@ -42,6 +42,7 @@ enum class ErrorId {
     kJoinNotUndone,
     kJoinedElsewhere,
     kLeaveFailed,
+    kLockUnavailable,
     kLogNotConfirmed,
     kNoCredential,
     kNoReply,

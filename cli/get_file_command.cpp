@@ -5,7 +5,6 @@
 #include <unistd.h>
 
 #include <cerrno>
-#include <csignal>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
@@ -13,6 +12,7 @@
 #include <memory>
 
 #include "commands.h"
+#include "deadline.h"
 #include "destination.h"
 #include "file_system.h"
 #include "input_file.h"
@@ -37,38 +37,9 @@ struct Options {
 
 // --- The transfer -------------------------------------------------------------------------------
 
-volatile std::sig_atomic_t g_interrupted = 0;
-
-void Interrupt(int signal) {
-    g_interrupted = signal;
-}
-
-// While it lives, a signal that would end the program ends the transfer.
-class InterruptGuard {
-  public:
-    InterruptGuard() {
-        struct sigaction action = {};
-        action.sa_handler = Interrupt;
-        for (std::size_t i = 0; i < std::size(kSignals); ++i) {
-            sigaction(kSignals[i], &action, &m_before[i]);
-        }
-    }
-    ~InterruptGuard() {
-        for (std::size_t i = 0; i < std::size(kSignals); ++i) {
-            sigaction(kSignals[i], &m_before[i], nullptr);
-        }
-    }
-    InterruptGuard(const InterruptGuard &) = delete;
-    InterruptGuard &operator=(const InterruptGuard &) = delete;
-
-  private:
-    static constexpr int kSignals[] = {SIGINT, SIGTERM, SIGHUP};
-    struct sigaction m_before[std::size(kSignals)] = {};
-};
-
 bool Observe(void *pContext, long long cbWritten, long long cbExpected) {
     static_cast<Progress *>(pContext)->Update(cbWritten, cbExpected);
-    return g_interrupted == 0;
+    return !InterruptGuard::IsInterrupted();
 }
 
 enum class Outcome { kFetched, kUnchanged, kFailed };
@@ -97,7 +68,7 @@ Json::Int64 SizeOf(const std::string &strPath, const Progress &progress) {
 ExitCode Tell(Outcome outcome, const std::string &strPath, const Progress &progress,
               Report &report) {
     if (outcome == Outcome::kFailed) {
-        return g_interrupted != 0
+        return InterruptGuard::IsInterrupted()
                    ? report.Fail(ErrorId::kInterrupted, "interrupted")
                    : FailRequest(ErrorId::kFetchFailed,
                                  "the file could not be fetched from the server",

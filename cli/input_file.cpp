@@ -1,39 +1,60 @@
 #include "input_file.h"
 
+#include <fcntl.h>
 #include <json/reader.h>
+#include <poll.h>
+#include <unistd.h>
 
+#include <array>
 #include <cerrno>
 #include <cstring>
-#include <fstream>
-#include <iostream>
-#include <iterator>
+#include <limits>
 #include <memory>
 
+#include "deadline.h"
+#include "descriptor.h"
 #include "json.h"
 #include "words.h"
 
 namespace qrmctl {
 namespace {
 
-bool ReadAll(const char *szWhat, const std::string &strFile, std::string &strText,
-             std::string &strError, const char *szStandardInput = "-") {
-    std::ifstream file;
-    bool blRead = true;
-    errno = 0;
-    try {
-        if (strFile != "-") {
-            file.open(strFile, std::ios::binary);
-            blRead = file.is_open();
-        }
-        std::istream &input = strFile == "-" ? std::cin : file;
-        strText.assign(std::istreambuf_iterator<char>(input), {});
-    } catch (const std::ios_base::failure &) {
-        blRead = false;
+// Waits for input until the deadline. False, with errno, when none has come.
+bool AwaitInput(int fd) {
+    constexpr double kMsPerS = 1000;
+    pollfd input = {fd, POLLIN, 0};
+    int ready = -1;
+    do {
+        const double left_ms = DeadlineLeft_s() * kMsPerS;
+        ready =
+            poll(&input, 1,
+                 left_ms < std::numeric_limits<int>::max() ? static_cast<int>(left_ms) + 1 : -1);
+    } while (ready < 0 && errno == EINTR);
+    errno = ready == 0 ? ETIME : errno;
+    return ready > 0;
+}
+
+// False with errno.
+bool ReadAll(const std::string &strFile, std::string &strText) {
+    const Descriptor file(strFile == "-"
+                              ? dup(STDIN_FILENO)
+                              : open(strFile.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC));
+    std::array<char, 4096> piece;
+    ssize_t cb = file.IsOpen() ? 1 : -1;
+    while (cb > 0) {
+        cb = AwaitInput(file.Get()) ? read(file.Get(), piece.data(), piece.size()) : -1;
+        strText.append(piece.data(), cb > 0 ? static_cast<std::size_t>(cb) : 0);
     }
+    return cb == 0;
+}
+
+bool ReadInput(const char *szWhat, const std::string &strFile, std::string &strText,
+               std::string &strError, const char *szStandardInput = "-") {
+    const bool blRead = ReadAll(strFile, strText);
     if (!blRead) {
         strError = std::string("cannot read ") + szWhat + " '" + strFile +
-                   "': " + std::strerror(errno == 0 ? EIO : errno) +
-                   "; name a file that can be read, or " + szStandardInput + " for standard input";
+                   "': " + std::strerror(errno) + "; name a file that can be read, or " +
+                   szStandardInput + " for standard input";
     }
     return blRead;
 }
@@ -71,7 +92,7 @@ bool ReadJson(const std::string &strText, Json::Value &value, std::string &strRe
 bool ReadJsonFile(const char *szWhat, const std::string &strFile, Json::Value &value,
                   std::string &strError, const char *szStandardInput) {
     std::string strText;
-    if (!ReadAll(szWhat, strFile, strText, strError, szStandardInput)) {
+    if (!ReadInput(szWhat, strFile, strText, strError, szStandardInput)) {
         return false;
     }
     std::string strReason;
@@ -105,7 +126,7 @@ bool ReadParams(const std::string &strText, Json::Value &params, std::string &st
 
 bool ReadTokenFile(const std::string &strFile, std::string &strToken, std::string &strError) {
     std::string strText;
-    if (!ReadAll("token file", strFile, strText, strError)) {
+    if (!ReadInput("token file", strFile, strText, strError)) {
         return false;
     }
     for (char c : {'\n', '\r'}) {

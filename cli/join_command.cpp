@@ -12,6 +12,7 @@
 #include "appliance.h"
 #include "candidates.h"
 #include "commands.h"
+#include "deadline.h"
 #include "input_file.h"
 #include "joined_server.h"
 #include "json.h"
@@ -23,6 +24,10 @@
 
 namespace qrmctl {
 namespace {
+
+constexpr const char *kClearRemains =
+    "run 'qrmctl leave', which removes what was begun, or 'qrmctl join' again, which removes it "
+    "first";
 
 struct Options {
     std::string strServer;
@@ -155,6 +160,9 @@ bool Undo() {
 
 ExitCode FailAndUndo(const char *szFailed, bool blJoined, Report &report) {
     std::string strError = szFailed;
+    if (IsDeadlineOver()) {
+        return report.Fail(ErrorId::kJoinNotUndone, strError);  // which tells of the deadline
+    }
     std::string strAnswer;
     // The join itself is the one step that asks the server.
     if (FindRefusal(report, strAnswer)) {
@@ -186,9 +194,7 @@ void TellServer(const Json::Value &sn, Report &report) {
 // stored already would hide the new one.
 ExitCode Enrol(const Json::Value &joinInfo, bool blJoined, Report &report) {
     Report::Stage("removing what is left of a membership before");
-    Report::Remedy(
-        "run 'qrmctl leave', which removes what was begun, or 'qrmctl join' again, which removes "
-        "it first");
+    Report::Remedy(kClearRemains);
     LeaveRequest before;
     before.blRejoin = true;
     if (!LeaveWholly(before)) {
@@ -197,11 +203,14 @@ ExitCode Enrol(const Json::Value &joinInfo, bool blJoined, Report &report) {
             "what is left of a membership before could not be removed, no join was begun: -v shows "
             "the reason; run 'qrmctl leave' when its cause is mended");
     }
+    std::string strDone;
     for (const Step &step : Steps(joinInfo)) {
         Report::Stage(step.szStage);
         if (!step.Take()) {
             return FailAndUndo(step.szFailed, blJoined, report);
         }
+        strDone += (strDone.empty() ? "" : ", ") + std::string(step.szStage);
+        Report::Remedy("this remains of the join: " + strDone + "; " + kClearRemains);
     }
     TellServer(joinInfo["sn"], report);
     report.Say("Joined. The server's address and the access token are stored.");
@@ -281,8 +290,7 @@ ExitCode Join(const Options &options, Report &report) {
     Report::Stage(kTurnStage);
     const MembershipTurn turn;
     if (!turn.IsTaken()) {
-        return report.Fail(ErrorId::kBusy,
-                           "another program is joining or leaving: try again when it is done");
+        return report.Fail(turn.Flaw(), turn.Reason());
     }
     Report::Stage("looking for damage in the stores");
     bool blServerLost = false;

@@ -13,7 +13,6 @@
 
 #include "command_line.h"
 #include "deadline.h"
-#include "output.h"
 #include "printable.h"
 
 namespace {
@@ -49,7 +48,7 @@ int Run(int argc, char **argv) {
     openlog("qrmctl", options.blVerbose ? LOG_PERROR : 0, LOG_USER);
     const double deadline_s = qrmctl::DeadlineOf(program.Root(), options);
     if (deadline_s > 0) {
-        qrmctl::StartDeadline(deadline_s, options.blJson);
+        qrmctl::StartDeadline(deadline_s);
     }
     qrmctl::Report report(options.blJson);
     return action(report);
@@ -78,7 +77,6 @@ int FailUnexpectedly(const std::exception &error, bool blJson) {
 }  // namespace
 
 int main(int argc, char **argv) {
-    const qrmctl::GuardedOutput output;
     try {
         return Run(argc, argv);
     } catch (const std::exception &error) {

@@ -23,6 +23,10 @@
 namespace qrmctl {
 namespace {
 
+// In a folder that only root can write to, so that nobody else can stand in the way.
+constexpr const char *kTurnLock = "/var/run/qrmctl.membership.lock";
+constexpr int kTurnTimeout_s = 120;
+
 // More credentials of one application than this are no accident.
 constexpr int kMaxLeaves = 100;
 
@@ -119,16 +123,31 @@ bool StoreSerial(const std::string &strSerial) {
 }
 
 MembershipTurn::MembershipTurn() {
-    constexpr const char *kLock = "/tmp/qrmctl.membership.lock";
-    constexpr int kTimeout_s = 120;
     // Waiting can be interrupted; only the change itself cannot.
-    static_cast<void>(YLIBCFileLockTimeByFile(kLock, 1, kTimeout_s, &m_handle));
+    if (YLIBCFileLockTimeByFile(kTurnLock, 1, kTurnTimeout_s, &m_handle) < 0) {
+        ExplainRefusal();
+    }
     sigset_t ends;
     sigemptyset(&ends);
     for (int signal : {SIGINT, SIGTERM, SIGHUP}) {
         sigaddset(&ends, signal);
     }
     pthread_sigmask(SIG_BLOCK, &ends, &m_before);
+}
+
+void MembershipTurn::ExplainRefusal() {
+    m_flaw = YLIBCErrGet() == YLIBC_ERR_BUSY ? ErrorId::kBusy : ErrorId::kLockUnavailable;
+    if (m_flaw == ErrorId::kBusy) {
+        m_strReason = "another program is joining or leaving: try again when it is done";
+        return;
+    }
+    FixedText<1024> reason;
+    if (ZELODiagnosisReason != nullptr) {
+        ZELODiagnosisReason(reason.Buffer(), FixedText<1024>::Size());
+    }
+    m_strReason = std::string("nothing was changed, since the lock '") + kTurnLock +
+                  "' cannot be taken" + (reason.Empty() ? "" : ": ") + reason.sz() +
+                  "; run this as root, and remove what stands there when it is not root's own file";
 }
 
 MembershipTurn::~MembershipTurn() {

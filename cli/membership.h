@@ -9,6 +9,7 @@
 #include <vector>
 
 #include "appliance.h"
+#include "error_ids.h"
 
 namespace qrmctl {
 
@@ -53,11 +54,18 @@ class MembershipTurn {
     MembershipTurn(const MembershipTurn &) = delete;
     MembershipTurn &operator=(const MembershipTurn &) = delete;
 
-    // False when another program has kept its turn for too long.
     bool IsTaken() const { return m_handle >= 0; }
 
+    // Why it is not: another program has kept its turn for too long, or the lock cannot be had.
+    ErrorId Flaw() const { return m_flaw; }
+    const std::string &Reason() const { return m_strReason; }
+
   private:
+    void ExplainRefusal();
+
     int m_handle = -1;
+    ErrorId m_flaw = ErrorId::kBusy;
+    std::string m_strReason;
     sigset_t m_before = {};
 };
 

@@ -12,7 +12,6 @@
 #include "certificate_authorities.h"
 #include "deadline.h"
 #include "json.h"
-#include "output.h"
 #include "printable.h"
 
 namespace qrmctl {
@@ -58,45 +57,53 @@ void Report::Remedy(const std::string &strRemedy) {
 }
 
 ExitCode Report::Done(ExitCode code) {
+    if (IsDeadlineOver()) {
+        return FailAtDeadline();
+    }
     m_result["success"] = true;
     Stage(kOutputStage);
     if (!PutOutResult()) {
         std::cerr << "qrmctl: cannot write to standard output\n";
-        static_cast<void>(PutOutLast(std::cerr));
         return ErrorOf(ErrorId::kOutput).exitCode;
     }
     return code;
 }
 
 ExitCode Report::Fail(ErrorId id, const std::string &strError) {
+    return IsDeadlineOver() && id != ErrorId::kInterrupted ? FailAtDeadline()
+                                                           : PutOutFailure(id, strError);
+}
+
+// What else the command had for programs would be half of a result.
+ExitCode Report::FailAtDeadline() {
+    const Strike strike = DescribeStrike();
+    m_result = Json::Value(Json::objectValue);
+    m_result["schema"] = kSchema;
+    m_result["deadline_s"] = strike.limit_s;
+    m_result["stage"] = strike.strStage;
+    m_result["longest_stage"] = strike.strLongest;
+    return PutOutFailure(ErrorId::kDeadline, strike.strError);
+}
+
+ExitCode Report::PutOutFailure(ErrorId id, const std::string &strError) {
     m_result["success"] = false;
     m_result["error"] = strError;
     m_result["error_id"] = ErrorOf(id).szId;
     Stage(kOutputStage);
-    const std::string strLine = "qrmctl: " + printable::Line(strError) + '\n';
-    // What comes last decides: until it is out the deadline may strike.
-    if (m_blJson) {
-        std::cerr << strLine;
-        static_cast<void>(PutOutResult());
-    } else {
-        std::cout.flush();
-        std::cerr << std::nounitbuf << strLine;
-        static_cast<void>(PutOutLast(std::cerr));
-    }
+    std::cout.flush();
+    std::cerr << "qrmctl: " + printable::Line(strError) + '\n';
+    static_cast<void>(PutOutResult());
     return ErrorOf(id).exitCode;
 }
 
 ExitCode FailShortOfMemory(bool blJson) noexcept {
-    constexpr const char *kLine = "qrmctl: memory is short\n";
+    std::cout.flush();
+    std::cerr << "qrmctl: memory is short\n";
     if (blJson) {
-        std::cerr << kLine;
         std::cout << R"({"error":"memory is short","error_id":"out-of-memory",)"
-                  << R"("schema":"qrmctl/1","success":false})" << '\n';
-        static_cast<void>(PutOutLast(std::cout));
-    } else {
+                     R"("schema":"qrmctl/1","success":false})"
+                     "\n";
         std::cout.flush();
-        std::cerr << std::nounitbuf << kLine;
-        static_cast<void>(PutOutLast(std::cerr));
     }
     return kFailed;
 }
@@ -126,12 +133,15 @@ ExitCode Report::FailExchange(ErrorId id, const std::string &strError) {
     return strFlaw.empty() ? Fail(id, strError) : Fail(ErrorId::kCaUnreadable, strFlaw);
 }
 
-// Puts everything out that is meant for standard output; the deadline is over when it is.
+// Puts everything out that is meant for standard output. A reader who takes it has all the time
+// that is left.
 bool Report::PutOutResult() {
     if (m_blJson) {
         std::cout << json::ToLogText(m_result) + '\n';
     }
-    return PutOutLast(std::cout);
+    const bool blOut = static_cast<bool>(std::cout.flush());
+    EndDeadline();
+    return blOut;
 }
 
 }  // namespace qrmctl

@@ -44,6 +44,7 @@ class Report {
     static void Remedy(const std::string &strRemedy);
 
     // Ends the command: prints the JSON object, when one is asked for, and gives the exit code.
+    // After the deadline both say that it struck; only an interruption is told as one.
     ExitCode Done(ExitCode code = kDone);
     ExitCode Fail(ErrorId id, const std::string &strError);
 
@@ -54,6 +55,8 @@ class Report {
     ExitCode FailExchange(ErrorId id, const std::string &strError);
 
   private:
+    ExitCode FailAtDeadline();
+    ExitCode PutOutFailure(ErrorId id, const std::string &strError);
     bool PutOutResult();
 
     bool m_blJson;

@@ -112,8 +112,7 @@ ExitCode Leave(const LeaveRequest &request, Report &report) {
     Report::Remedy("run 'qrmctl leave' again: what was removed stays removed");
     const MembershipTurn turn;
     if (!turn.IsTaken()) {
-        return report.Fail(ErrorId::kBusy,
-                           "another program is joining or leaving: try again when it is done");
+        return report.Fail(turn.Flaw(), turn.Reason());
     }
     Report::Stage("looking up the joined server in the credential store");
     const std::optional<JoinedServer> server = FindStoredServer();

@@ -133,7 +133,7 @@ int RunAgain(std::vector<std::string> words, const NamelessFile &out, const Name
 }
 
 // What a command prints, as if it had been typed. A process of its own has a deadline of its own,
-// which ends it also when this program's deadline strikes meanwhile.
+// which comes no later than this program's.
 std::string OutputOf(std::vector<std::string> words, bool blJson, double limit_s) {
     constexpr double kLeast_s = 0.01;
     Report::Stage("running qrmctl " + words.front());
@@ -285,7 +285,7 @@ std::string Files() {
                                                      "/tmp/qrm_client.info",
                                                      "/tmp/qrm_client.info.lock",
                                                      "/tmp/qrmclientconnectfailed",
-                                                     "/tmp/qrmctl.membership.lock",
+                                                     "/var/run/qrmctl.membership.lock",
                                                      "/tmp/qrm_idle_time",
                                                      "/tmp/qrm_idle_time.lock",
                                                      "/tmp/userlock",

@@ -7,18 +7,14 @@
 namespace qrmctl {
 
 WorkFolder::WorkFolder(const std::filesystem::path &file)
-    : m_strFolder(file.parent_path() / ('.' + file.filename().string() + ".XXXXXX")),
-      m_cleanup([this] { Make(); }, [this] { Remove(); }) {}
-
-void WorkFolder::Make() {
+    : m_strFolder(file.parent_path() / ('.' + file.filename().string() + ".XXXXXX")) {
     if (mkdtemp(m_strFolder.data()) == nullptr) {
         m_error = errno;
         m_strFolder.clear();
     }
 }
 
-// Also while it is being filled.
-void WorkFolder::Remove() const {
+WorkFolder::~WorkFolder() {
     std::error_code ignored;
     if (!m_strFolder.empty()) {
         std::filesystem::remove_all(m_strFolder, ignored);

@@ -6,15 +6,13 @@
 #include <filesystem>
 #include <string>
 
-#include "deadline.h"
-
 namespace qrmctl {
 
-// Removed with what is left in it, also when the deadline strikes.
+// Removed with what is left in it.
 class WorkFolder {
   public:
     explicit WorkFolder(const std::filesystem::path &file);
-    ~WorkFolder() { Remove(); }
+    ~WorkFolder();
     WorkFolder(const WorkFolder &) = delete;
     WorkFolder &operator=(const WorkFolder &) = delete;
 
@@ -26,12 +24,8 @@ class WorkFolder {
     int Error() const { return m_error; }
 
   private:
-    void Make();
-    void Remove() const;
-
     std::string m_strFolder;
     int m_error = 0;
-    DeadlineCleanup m_cleanup;
 };
 
 }  // namespace qrmctl

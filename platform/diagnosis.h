@@ -64,8 +64,9 @@ ZELO_DIAGNOSIS_API void ZELODeadlineSet(long long left_ms);
 // The milliseconds until the deadline, 0 when it is over; -1 when there is none.
 ZELO_DIAGNOSIS_API long long ZELODeadlineLeft(void);
 
-// Called in the waiting thread, about once a second while an operation waits: what for, such as
-// "the lock '/tmp/userlock'", and for how long already. It must not throw.
+// Called in the waiting thread, about once a second while an operation waits, and when the deadline
+// ends the wait: what for, such as "the lock '/tmp/userlock'", and for how long already. It must not
+// throw.
 typedef void (*ZELO_WAIT_OBSERVER)(void *pContext, const char *szWaitsFor, double waited_s);
 
 // Sets the observer of all waits of the process; null for none, as at the start. Set it while no

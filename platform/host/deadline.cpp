@@ -83,6 +83,10 @@ Wait::Clock::duration Wait::Slice() {
 
 Status Wait::TimeUp(unsigned int code) const {
     if (IsPastDeadline()) {
+        if (g_observer.pfn != nullptr) {
+            g_observer.pfn(g_observer.pContext, m_strWaitsFor.c_str(),
+                           std::chrono::duration<double>(Clock::now() - m_begin).count());
+        }
         return HOST_ERROR(YLIBC_ERR_DEADLINE,
                           "the deadline came while waiting for " + m_strWaitsFor);
     }

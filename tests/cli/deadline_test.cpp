@@ -1,9 +1,12 @@
 // The deadline of qrmctl: what the program may be blocked in, and what it leaves when it strikes.
 
+#include <arpa/inet.h>
 #include <fcntl.h>
 #include <shadow.h>
 #include <sqlite3.h>
+#include <sys/socket.h>
 
+#include "children.h"
 #include "file_lock.h"
 #include "joined.h"
 #include "json.h"
@@ -19,6 +22,8 @@ constexpr const char *kDaemonScript = "/usr/zelo/etc/rc.d/S99zelocache.sh";
 constexpr const char *kPlugin = "/usr/zelo/etc/plugins/qrm_client/disjoin/hanging";
 constexpr const char *kHook = "/usr/zelo/etc/notify.d/hanging";
 constexpr const char *kPath = "/tmp/files/file";
+
+constexpr double kBusy_s = 3;
 
 // What a command may wait for, held until this is gone.
 using Held = std::shared_ptr<void>;
@@ -67,6 +72,46 @@ Held HangProgram(const char *szPath) {
             }};
 }
 
+// A relay that goes on answering for ever, one header after the other.
+Held HangRelay() {
+    const int fd = socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
+    sockaddr_in address = {};
+    address.sin_family = AF_INET;
+    address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+    socklen_t cb = sizeof(address);
+    auto *const pAddress = reinterpret_cast<sockaddr *>(&address);
+    EXPECT_EQ(bind(fd, pAddress, cb), 0);
+    EXPECT_EQ(listen(fd, 8), 0);
+    getsockname(fd, pAddress, &cb);
+    const std::string strBefore = FileText(kConfig);
+    WriteFile(kConfig, strBefore + "farlink_relay=\"127.0.0.1:" +
+                           std::to_string(ntohs(address.sin_port)) + "\"\n");
+    const pid_t relay = children::Start([fd] {
+        signal(SIGPIPE, SIG_IGN);
+        for (;;) {
+            const int client = accept(fd, nullptr, nullptr);
+            std::string strPiece = "HTTP/1.1 200 OK\r\n";
+            while (write(client, strPiece.data(), strPiece.size()) > 0) {
+                strPiece = "X-More: yes\r\n";
+                std::this_thread::sleep_for(std::chrono::milliseconds(5));
+            }
+            close(client);
+        }
+        return true;
+    });
+    close(fd);
+    return {nullptr, [relay, strBefore](void *) {
+                children::Kill(relay);
+                WriteFile(kConfig, strBefore);
+            }};
+}
+
+// Looking up a name then takes ten minutes.
+Held SilenceNameServer() {
+    setenv("LD_PRELOAD", SILENT_NAMES, 1);
+    return {nullptr, [](void *) { unsetenv("LD_PRELOAD"); }};
+}
+
 // Whether one has been started that has not come to telling its process id.
 bool IsProgramAwaited() {
     return fs::exists("/tmp/pid") && fs::file_size("/tmp/pid") == 0;
@@ -109,96 +154,169 @@ class Deadline : public joined::Joined {
         fs::create_directories("/tmp/files");
         std::ofstream(kPath) << "old";
         std::ofstream("/tmp/token") << joined::kToken;
-        std::ofstream("/tmp/list") << R"([{"host":"localhost","http_port":0,"https_port":)"
-                                   << s_pServer->HttpsPort() << "}]";
+        const std::string strLocal = R"([{"host":"localhost","http_port":0,"https_port":)" +
+                                     std::to_string(s_pServer->HttpsPort());
+        std::ofstream("/tmp/list") << strLocal << "}]";
+        std::ofstream("/tmp/relayed") << strLocal << R"(,"farlink_direct":true}])";
+        std::ofstream("/tmp/unknown")
+            << R"([{"host":"qrm.example","http_port":0,"https_port":443}])";
     }
 };
 
-TEST_F(Deadline, EndsWhateverACommandIsBlockedInAndNamesIt) {
-    // How it is held, and what is said of it.
-    using Block = std::pair<std::function<Held()>, std::string>;
-    const std::string strPort = std::to_string(s_pServer->HttpsPort());
-    const Block silence = {[] { return Silence(*s_pServer); }, "localhost:" + strPort};
-    const Block store = {
-        HoldStore, std::string("waiting for the credential store '") + stored::kDatabase + '\''};
-    const Block accounts = {HoldAccounts, "waiting for the lock '/etc/.pwd.lock'"};
-    const auto lock = [](const char *szPath) -> Block {
-        return {[szPath] { return HoldLock(szPath); },
-                std::string("waiting for the lock '") + szPath + '\''};
-    };
-    const auto program = [](const char *szPath, const char *szArguments) -> Block {
-        return {[szPath] { return HangProgram(szPath); },
-                std::string("running '") + szPath + ' ' + szArguments + '\''};
-    };
-    const Block daemon = program(kDaemonScript, "status");
+// How it is held, and what is said of it.
+struct Block {
+    std::function<Held()> Hold;
+    std::string strSaid;
+};
+
+// What is run, what it is blocked in, and what the operator is told to do.
+struct Row {
+    Arguments arguments;
+    Block block;
+    const char *szRemedy;
+};
+
+void ExpectEnd(const Row &row) {
+    const auto &[arguments, block, szRemedy] = row;
+    SCOPED_TRACE(testing::PrintToString(arguments));
+    const Held held = block.Hold();
+    Arguments command = arguments;
+    command.insert(command.begin(), QRMCTL);
+    run_program::Outcome outcome;
+    Json::Value result;
+    std::string strStage;
+    // On a busy machine a command may not have come there in the first time.
+    for (const double deadline_s : {0.4, 5.0}) {
+        Arguments limited = command;
+        limited.insert(limited.end(), {"--deadline", std::to_string(deadline_s), "--json"});
+        const auto begin = std::chrono::steady_clock::now();
+        outcome = run_program::Run(limited);
+        // A second, and what a busy machine takes to start a program.
+        EXPECT_LT(std::chrono::steady_clock::now() - begin,
+                  std::chrono::duration<double>(deadline_s + 1 + kBusy_s));
+        EXPECT_EQ(outcome.status, 5) << outcome.strErr;
+        EXPECT_TRUE(json::FromString(outcome.strOut, result)) << outcome.strOut;
+        EXPECT_EQ(result["error_id"], "deadline");
+        strStage = result["stage"].asString();
+        if (Holds(strStage, block.strSaid) && !IsProgramAwaited()) {
+            break;
+        }
+    }
+    EXPECT_TRUE(Holds(strStage, block.strSaid)) << strStage;
+    EXPECT_EQ(outcome.strErr, "qrmctl: " + result["error"].asString() + '\n');
+    EXPECT_NE(outcome.strErr.find('\'' + strStage + '\''), std::string::npos);
+    EXPECT_NE(outcome.strErr.find(szRemedy), std::string::npos) << outcome.strErr;
+}
+
+Block Lock(const char *szPath) {
+    return {[szPath] { return HoldLock(szPath); },
+            std::string("waiting for the lock '") + szPath + '\''};
+}
+
+Block Program(const char *szPath) {
+    return {[szPath] { return HangProgram(szPath); }, szPath};
+}
+
+TEST_F(Deadline, EndsTheWaitForALock) {
+    for (const Row &row : std::initializer_list<Row>{
+             {{"leave"}, Lock("/var/run/qrmctl.membership.lock"), "qrmctl leave"},
+             {{"info", "set", "key", "value"}, Lock("/tmp/qrm_client.info.lock"), ""},
+             {{"idle", "get"}, Lock("/tmp/qrm_idle_time.lock"), ""},
+             {{"idle", "set", "5"}, Lock("/tmp/qrm_idle_time.lock"), "idle get"}}) {
+        ExpectEnd(row);
+    }
+}
+
+TEST_F(Deadline, EndsTheWaitForTheAccounts) {
+    ASSERT_EQ(run_program::Run({QRMCTL, "account", "create"}).status, 0);
+    const Block accounts = {HoldAccounts, "/etc/.pwd.lock"};
+    ExpectEnd({{"account", "create"}, accounts, "qrmctl leave"});
+    ExpectEnd({{"account", "delete"}, accounts, "qrmctl leave"});
+}
+
+TEST_F(Deadline, EndsTheWaitForAStore) {
     std::ofstream("/tmp/credential") << R"({"protocol":"https","host":"h","port":1,)"
                                      << R"("application":"ZELO.QRM","access_token":"t"})";
-    const std::tuple<Arguments, Block, const char *> rows[] = {
-        {{"test-connection", "--api", "ZELO.QRM.RPC", "/tmp/list"}, silence, ""},
-        {{"join", "--server", "localhost", "--http-port", "0", "--https-port", strPort,
-          "--token-file", "/tmp/token"},
-         silence,
-         "nothing was changed"},
-        {{"call", "ZELO.QRM.RPC", "info"}, silence, ""},
-        {{"update"}, silence, ""},
-        {{"log", "err", "-", "text"}, silence, ""},
-        {{"get-file", kPath, "ZELO.QRM.RPC.File", "get", "--params", R"({"name":"f","size":9})"},
-         silence,
-         "is as it was"},
-        {{"status"}, store, ""},
-        {{"status", "--explain"}, store, ""},
-        {{"status", "--explain"}, daemon, ""},
-        {{"doctor"}, silence, ""},
-        {{"doctor"}, {store.first, ""}, ""},
-        {{"support", "/tmp/files/archive"}, {silence.first, "qrmctl doctor"}, ""},
-        {{"support", "/tmp/files/archive"}, {daemon.first, "qrmctl status"}, ""},
-        {{"account", "create"}, accounts, "qrmctl leave"},
-        {{"account", "delete"}, accounts, "qrmctl leave"},
-        {{"leave"}, lock("/tmp/qrmctl.membership.lock"), "qrmctl leave"},
-        {{"leave"}, store, "qrmctl leave"},
-        {{"leave"}, program(kPlugin, "pre"), "qrmctl leave"},
-        {{"plugins", "run", "disjoin", "POST"}, program(kPlugin, "post"), ""},
-        {{"notify", "QRMClientConnectFailed"}, program(kHook, "QRMClientConnectFailed"), ""},
-        {{"info", "set", "key", "value"}, lock("/tmp/qrm_client.info.lock"), ""},
-        {{"idle", "get"}, lock("/tmp/qrm_idle_time.lock"), ""},
-        {{"idle", "set", "5"}, lock("/tmp/qrm_idle_time.lock"), "idle get"},
-        {{"credential", "create", "/tmp/credential"}, store, "credential show"},
-        {{"credential", "update", "/tmp/credential"}, store, "credential show"},
-        {{"credential", "delete"}, store, "credential delete"},
-        {{"credential", "show"}, store, ""}};
-    ASSERT_EQ(run_program::Run({QRMCTL, "account", "create"}).status, 0);
-    for (const auto &[arguments, block, szRemedy] : rows) {
-        SCOPED_TRACE(testing::PrintToString(arguments));
-        const Held held = block.first();
-        Arguments command = arguments;
-        command.insert(command.begin(), QRMCTL);
-        run_program::Outcome outcome;
-        Json::Value result;
-        std::string strStage;
-        // On a busy machine a command may not have come there in the first time.
-        for (const double deadline_s : {0.4, 5.0}) {
-            Arguments limited = command;
-            limited.insert(limited.end(), {"--deadline", std::to_string(deadline_s), "--json"});
-            const auto begin = std::chrono::steady_clock::now();
-            outcome = run_program::Run(limited);
-            EXPECT_LT(std::chrono::steady_clock::now() - begin,
-                      std::chrono::duration<double>(deadline_s + 8));
-            EXPECT_EQ(outcome.status, 5) << outcome.strErr;
-            EXPECT_TRUE(json::FromString(outcome.strOut, result)) << outcome.strOut;
-            EXPECT_EQ(result["error_id"], "deadline");
-            strStage = result["stage"].asString();
-            if (Holds(strStage, block.second) && !IsProgramAwaited()) {
-                break;
-            }
-        }
-        EXPECT_TRUE(Holds(strStage, block.second)) << strStage;
-        EXPECT_EQ(outcome.strErr, "qrmctl: " + result["error"].asString() + '\n');
-        EXPECT_NE(outcome.strErr.find('\'' + strStage + '\''), std::string::npos);
-        EXPECT_NE(outcome.strErr.find(szRemedy), std::string::npos) << outcome.strErr;
+    const Block store = {HoldStore, stored::kDatabase};
+    for (const Row &row : std::initializer_list<Row>{
+             {{"status"}, store, ""},
+             {{"status", "--explain"}, store, ""},
+             {{"doctor"}, {HoldStore, ""}, ""},
+             {{"leave"}, store, "qrmctl leave"},
+             {{"credential", "create", "/tmp/credential"}, store, "credential show"},
+             {{"credential", "update", "/tmp/credential"}, store, "credential show"},
+             {{"credential", "delete"}, store, "credential delete"},
+             {{"credential", "show"}, store, ""}}) {
+        ExpectEnd(row);
+    }
+}
+
+TEST_F(Deadline, EndsTheWaitForAServerARelayAndANameServer) {
+    const std::string strPort = std::to_string(s_pServer->HttpsPort());
+    const auto silent = [] { return Silence(*s_pServer); };
+    const Block silence = {silent, "localhost:" + strPort};
+    const Block relay = {HangRelay, "localhost:" + strPort};
+    for (const Row &row : std::initializer_list<Row>{
+             {{"test-connection", "--api", "ZELO.QRM.RPC", "/tmp/list"}, silence, ""},
+             {{"test-connection", "--api", "ZELO.QRM.RPC", "/tmp/relayed"}, relay, ""},
+             {{"test-connection", "--api", "ZELO.QRM.RPC", "/tmp/unknown"},
+              {SilenceNameServer, "qrm.example:443"},
+              ""},
+             {{"join", "--server", "localhost", "--http-port", "0", "--https-port", strPort,
+               "--token-file", "/tmp/token"},
+              silence,
+              "nothing was changed"},
+             {{"call", "ZELO.QRM.RPC", "info"}, silence, ""},
+             {{"update"}, silence, ""},
+             {{"log", "err", "-", "text"}, silence, ""},
+             {{"get-file", kPath, "ZELO.QRM.RPC.File", "get", "--params",
+               R"({"name":"f","size":9})"},
+              silence,
+              "is as it was"},
+             {{"support", "/tmp/files/archive"}, {silent, "qrmctl doctor"}, ""}}) {
+        ExpectEnd(row);
     }
     EXPECT_EQ(FileText(kPath), "old");
     EXPECT_EQ(std::distance(fs::directory_iterator("/tmp/files"), fs::directory_iterator()), 1)
         << "nothing stays beside the file";
+}
+
+TEST_F(Deadline, EndsWhatTheDoctorLooksAt) {
+    const std::string strPort = std::to_string(s_pServer->HttpsPort());
+    for (const Row &row : std::initializer_list<Row>{
+             {{"doctor"}, {[] { return Silence(*s_pServer); }, "https://localhost:" + strPort}, ""},
+             {{"doctor", "--candidates", "/tmp/relayed"}, {HangRelay, "fld://localhost"}, ""},
+             {{"doctor", "--candidates", "/tmp/unknown"},
+              {SilenceNameServer, "https://qrm.example"},
+              ""}}) {
+        ExpectEnd(row);
+    }
+}
+
+TEST_F(Deadline, EndsAProgramThatHangs) {
+    ASSERT_EQ(run_program::Run({QRMCTL, "account", "create"}).status, 0);
+    const Block daemon = Program(kDaemonScript);
+    for (const Row &row : std::initializer_list<Row>{
+             {{"status", "--explain"}, daemon, ""},
+             {{"support", "/tmp/files/archive"}, {daemon.Hold, "qrmctl status"}, ""},
+             {{"leave"}, Program(kPlugin), "qrmctl leave"},
+             {{"plugins", "run", "disjoin", "POST"}, Program(kPlugin), ""},
+             {{"notify", "QRMClientConnectFailed"}, Program(kHook), ""}}) {
+        ExpectEnd(row);
+    }
+}
+
+// Like one that is killed: the next leave clears what it left.
+TEST_F(Deadline, AJoinSaysWhatRemains) {
+    const std::string strPort = std::to_string(s_pServer->HttpsPort());
+    ASSERT_EQ(run_program::Run({QRMCTL, "leave"}).status, 0);
+    ExpectEnd({{"join", "--server", "localhost", "--http-port", "0", "--https-port", strPort,
+                "--token-file", "/tmp/token", "--sn", "S"},
+               Program(kDaemonScript),
+               "this remains of the join: "});
+    EXPECT_EQ(run_program::Run({QRMCTL, "status"}).status, 4);
+    EXPECT_EQ(run_program::Run({QRMCTL, "leave"}).status, 0);
+    EXPECT_EQ(run_program::Run({QRMCTL, "status"}).status, 3);
 }
 
 TEST_F(Deadline, IsANumberOfSecondsAboveZeroAndStatusHasOne) {
@@ -224,24 +342,33 @@ TEST_F(Deadline, EndsThoughNobodyReadsItsOutputAndNeverContradictsIt) {
     constexpr std::size_t kPage = 4096;
     const std::string strLong(2 * kPage, 'k');
     ASSERT_EQ(run_program::Run({QRMCTL, "info", "set", "key", "value"}).status, 0);
-    // At last, whether the JSON object tells of the deadline.
-    const std::tuple<char, std::size_t, std::string, bool> rows[] = {
-        {'2', 0, "none", true}, {'2', kPage, strLong, true}, {'1', 0, "key", false}};
-    for (const auto &[fd, cbFree, strKey, blJson] : rows) {
+    const std::tuple<char, std::size_t, std::string> rows[] = {
+        {'2', 0, "none"}, {'2', kPage, strLong}, {'1', 0, "key"}};
+    for (const auto &[fd, cbFree, strKey] : rows) {
         SCOPED_TRACE(strKey.substr(0, 4) + fd);
         const FullPipe full(cbFree);
         const std::string strCommand =
             std::string(R"(exec "$0" "$@" )") + fd + ">" + FullPipe::kPipe;
+        const auto begin = std::chrono::steady_clock::now();
         const run_program::Outcome outcome =
             run_program::Run({"/bin/sh", "-c", strCommand, QRMCTL, "info", "get", strKey, "--json",
                               "--deadline", "0.4"});
+        EXPECT_LT(std::chrono::steady_clock::now() - begin,
+                  std::chrono::duration<double>(1.4 + kBusy_s));
         EXPECT_EQ(outcome.status, 5);
-        Json::Value result;
-        EXPECT_EQ(json::FromString(outcome.strOut, result), blJson) << outcome.strOut;
-        EXPECT_EQ(result["error_id"] == "deadline", blJson);
-        EXPECT_EQ(outcome.strErr.find("qrmctl: the deadline") == 0, !blJson) << outcome.strErr;
-        EXPECT_EQ(full.Text().find("deadline"), std::string::npos);
+        EXPECT_EQ(outcome.strOut, "") << "the failure comes first, and did not come through";
+        EXPECT_EQ(Holds(outcome.strErr, "qrmctl: the deadline struck"), fd == '1');
     }
+}
+
+TEST_F(Deadline, EndsThoughAnInputDoesNotCome) {
+    ASSERT_EQ(mkfifo("/tmp/silent", 0600), 0);
+    const run_program::Outcome outcome = run_program::Run(
+        {QRMCTL, "credential", "create", "/tmp/silent", "--json", "--deadline", "0.4"});
+    EXPECT_EQ(outcome.status, 5);
+    Json::Value result;
+    EXPECT_TRUE(json::FromString(outcome.strOut, result)) << outcome.strOut;
+    EXPECT_EQ(result["error_id"], "deadline");
 }
 
 TEST_F(Deadline, LeavesAloneWhatItDidNotStart) {

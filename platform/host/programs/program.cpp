@@ -16,7 +16,6 @@
 #include <fcntl.h>
 #include <linux/futex.h>
 #include <pthread.h>
-#include <spawn.h>
 #include <sys/mman.h>
 #include <sys/syscall.h>
 #include <sys/wait.h>
@@ -34,8 +33,6 @@
 #include <string_view>
 
 #include "deadline.h"
-#include "diagnosis.h"
-#include "waiting.h"
 
 namespace {
 
@@ -48,29 +45,6 @@ constexpr int kSignalledBase = 128;
 // How long a killed program may take to disappear. One that hangs inside the kernel takes longer;
 // it is left to end by itself.
 constexpr std::chrono::seconds kLongestDying(2);
-
-// The functions that prepare a start fail for want of memory only.
-void Prepared(int error) {
-    if (error != 0) {
-        throw std::bad_alloc();
-    }
-}
-
-struct Attributes {
-    posix_spawnattr_t value = {};
-    Attributes() { Prepared(posix_spawnattr_init(&value)); }
-    Attributes(const Attributes &) = delete;
-    Attributes &operator=(const Attributes &) = delete;
-    ~Attributes() { posix_spawnattr_destroy(&value); }
-};
-
-struct FileActions {
-    posix_spawn_file_actions_t value = {};
-    FileActions() { Prepared(posix_spawn_file_actions_init(&value)); }
-    FileActions(const FileActions &) = delete;
-    FileActions &operator=(const FileActions &) = delete;
-    ~FileActions() { posix_spawn_file_actions_destroy(&value); }
-};
 
 std::string_view NameOf(std::string_view variable) {
     return variable.substr(0, variable.find('='));
@@ -101,45 +75,19 @@ std::vector<char *> Environment(const std::vector<std::string> &added) {
     return variables;
 }
 
-// Everything that starting a program takes, ready to be used without memory or locks.
-class Start {
-  public:
-    Start(const std::vector<std::string> &arguments, const std::vector<std::string> &environment)
-        : m_arguments(Pointers(arguments)), m_environment(Environment(environment)) {
-        sigset_t all;
-        sigfillset(&all);
-        sigset_t none;
-        sigemptyset(&none);
-        posix_spawnattr_setsigdefault(&m_attributes.value, &all);
-        posix_spawnattr_setsigmask(&m_attributes.value, &none);
-        posix_spawnattr_setpgroup(&m_attributes.value, 0);
-        posix_spawnattr_setflags(&m_attributes.value, POSIX_SPAWN_SETSIGDEF |
-                                                          POSIX_SPAWN_SETSIGMASK |
-                                                          POSIX_SPAWN_SETPGROUP);
-        for (const int fd : {STDIN_FILENO, STDOUT_FILENO, STDERR_FILENO}) {
-            Prepared(posix_spawn_file_actions_addopen(&m_actions.value, fd, "/dev/null",
-                                                      fd == STDIN_FILENO ? O_RDONLY : O_WRONLY, 0));
-        }
-    }
-
-    // Returns 0 or an errno.
-    int operator()(pid_t &pid) const {
-        return posix_spawn(&pid, m_arguments[0], &m_actions.value, &m_attributes.value,
-                           m_arguments.data(), m_environment.data());
-    }
-
-  private:
-    std::vector<char *> m_arguments;
-    std::vector<char *> m_environment;
-    Attributes m_attributes;
-    FileActions m_actions;
+// What the program is started with, made before the warden exists.
+struct Start {
+    std::vector<char *> arguments;
+    std::vector<char *> environment;
+    std::chrono::seconds limit;
 };
 
 // What the caller and the warden share.
 struct Page {
-    enum class End { kUnknown, kNotRun, kTimedOut, kHasStatus };
+    enum class End { kUnknown, kTimedOut, kHasStatus };
     End end = End::kUnknown;
-    int value = 0;  // the errno of a start that failed, or the status
+    int status = 0;
+    int startError = 0;  // the errno of a start that failed
     std::atomic<bool> blEndAsked{false};
     std::atomic<std::uint32_t> ended{0};
 };
@@ -165,9 +113,39 @@ timespec Timespec(Clock::duration time) {
             static_cast<long>(std::chrono::nanoseconds(time - time_s).count())};
 }
 
-// Waits for the child's end; false when it has not come in time, or is asked for. SIGCHLD
-// is blocked, so one that comes between the look and the wait is not missed; the caller sends it
-// too.
+// A fork that runs none of the caller's handlers. Returns as fork does.
+pid_t Fork(int exitSignal) {
+    return static_cast<pid_t>(syscall(SYS_clone, exitSignal, 0UL, 0UL, 0UL, 0UL));
+}
+
+// Not _exit: before it, the runtime of a sanitizer waits for locks of the other threads.
+[[noreturn]] void End() {
+    for (;;) {
+        syscall(SYS_exit_group, 0);
+    }
+}
+
+// In the warden's child, where nothing is open.
+[[noreturn]] void BeProgram(const Start &start, Page &page) {
+    setpgid(0, 0);
+    for (const int flags : {O_RDONLY, O_WRONLY, O_WRONLY}) {
+        static_cast<void>(open("/dev/null", flags));
+    }
+    struct sigaction byDefault = {};
+    byDefault.sa_handler = SIG_DFL;
+    for (int signal = 1; signal < NSIG; ++signal) {
+        sigaction(signal, &byDefault, nullptr);
+    }
+    sigset_t none;
+    sigemptyset(&none);
+    sigprocmask(SIG_SETMASK, &none, nullptr);
+    execve(start.arguments[0], start.arguments.data(), start.environment.data());
+    page.startError = errno;
+    End();
+}
+
+// Waits for the child's end; false when it has not come in time, or is asked for. SIGCHLD is
+// blocked, so one that comes between the look and the wait is not missed; the caller sends it too.
 bool AwaitEnd(pid_t pid, Clock::time_point end, const std::atomic<bool> &blAsked, int &status) {
     sigset_t childSignal;
     sigemptyset(&childSignal);
@@ -184,18 +162,22 @@ bool AwaitEnd(pid_t pid, Clock::time_point end, const std::atomic<bool> &blAsked
 }
 
 // Starts the program and waits for it.
-void Watch(const Start &start, std::chrono::seconds limit, Page &page) {
-    const Clock::time_point end = Clock::now() + limit;
-    pid_t pid = -1;
-    page.value = start(pid);
-    if (page.value != 0) {
-        page.end = Page::End::kNotRun;
+void Watch(const Start &start, Page &page) {
+    const Clock::time_point end = Clock::now() + start.limit;
+    const pid_t pid = Fork(SIGCHLD);
+    if (pid == 0) {
+        BeProgram(start, page);
+    }
+    if (pid < 0) {
+        page.startError = errno;
         return;
     }
+    // Here as well: the group has to be there when it is to be ended.
+    setpgid(pid, pid);
     int status = 0;
     if (AwaitEnd(pid, end, page.blEndAsked, status)) {
         page.end = Page::End::kHasStatus;
-        page.value = WIFEXITED(status) ? WEXITSTATUS(status) : kSignalledBase + WTERMSIG(status);
+        page.status = WIFEXITED(status) ? WEXITSTATUS(status) : kSignalledBase + WTERMSIG(status);
         return;
     }
     page.end = Page::End::kTimedOut;
@@ -205,52 +187,51 @@ void Watch(const Start &start, std::chrono::seconds limit, Page &page) {
     AwaitEnd(pid, Clock::now() + kLongestDying, false, status);
 }
 
-[[noreturn]] void BeWarden(const Start &start, std::chrono::seconds limit, Page &page) {
+[[noreturn]] void BeWarden(const Start &start, Page &page) {
     closefrom(0);
     struct sigaction byDefault = {};
     byDefault.sa_handler = SIG_DFL;
     sigaction(SIGCHLD, &byDefault, nullptr);
-    Watch(start, limit, page);
+    Watch(start, page);
     page.ended = 1;
     syscall(SYS_futex, &page.ended, FUTEX_WAKE, 1, nullptr, nullptr, 0);
-    // Not _exit: before it, the runtime of a sanitizer waits for locks of the other threads.
-    for (;;) {
-        syscall(SYS_exit_group, 0);
-    }
+    End();
 }
 
 // --- In the caller ------------------------------------------------------------------------------
 
-// Makes the warden: a fork without exit signal, and without the handlers that a fork runs. It must
-// run nothing of the caller's, so it starts, and stays, with all signals blocked. Returns its id,
-// or -1 with errno.
-pid_t StartWarden(const Start &start, std::chrono::seconds limit, Page &page) {
+// Makes the warden: a fork without exit signal. It must run nothing of the caller's, so it starts,
+// and stays, with all signals blocked. Returns its id, or -1 with errno.
+pid_t StartWarden(const Start &start, Page &page) {
     sigset_t all;
     sigset_t before;
     sigfillset(&all);
     pthread_sigmask(SIG_SETMASK, &all, &before);
-    const long pid = syscall(SYS_clone, 0UL, 0UL, 0UL, 0UL, 0UL);
+    const pid_t pid = Fork(0);
     if (pid == 0) {
-        BeWarden(start, limit, page);
+        BeWarden(start, page);
     }
     const int error = errno;
     pthread_sigmask(SIG_SETMASK, &before, nullptr);
     errno = error;
-    return static_cast<pid_t>(pid);
+    return pid;
 }
 
-// Waits for the warden's end. One that was killed wakes nobody, which the next look shows.
+// Waits for the warden's end, and asks for it when time is up. One that was killed wakes nobody,
+// which the next look shows.
 void AwaitWarden(pid_t warden, host::Wait &wait, Page &page) {
-    while (waitpid(warden, nullptr, __WALL | WNOHANG) == 0) {
-        const timespec slice = Timespec(wait.Slice());
-        if (slice.tv_sec == 0 && slice.tv_nsec == 0) {
+    pid_t gone = 0;
+    while (page.ended == 0 && (gone = waitpid(warden, nullptr, __WALL | WNOHANG)) == 0) {
+        const Clock::duration slice = wait.Slice();
+        if (slice <= Clock::duration::zero()) {
             page.blEndAsked = true;
             kill(warden, SIGCHLD);
-            while (waitpid(warden, nullptr, __WALL) < 0 && errno == EINTR) {
-            }
-            return;
+            break;
         }
-        syscall(SYS_futex, &page.ended, FUTEX_WAIT, 0, &slice, nullptr, 0);
+        const timespec time = Timespec(slice);
+        syscall(SYS_futex, &page.ended, FUTEX_WAIT, 0, &time, nullptr, 0);
+    }
+    while (gone == 0 && waitpid(warden, nullptr, __WALL) < 0 && errno == EINTR) {
     }
 }
 
@@ -266,37 +247,26 @@ host::Status host::RunProgram(const std::vector<std::string> &arguments,
     if (Wait::IsPastDeadline()) {
         return wait.TimeUp(YLIBC_ERR_DEADLINE);
     }
-    const Start start(arguments, environment);
+    const Start start = {Pointers(arguments), Environment(environment), limit};
     const SharedPage pPage = NewSharedPage();
     // A cancelled thread ends after the program: an unwinding here would lose the warden, and one
     // in the warden would run the caller's handlers.
     int cancelState = 0;
     pthread_setcancelstate(PTHREAD_CANCEL_DISABLE, &cancelState);
-    const pid_t warden = pPage == nullptr ? -1 : StartWarden(start, limit, *pPage);
+    const pid_t warden = pPage == nullptr ? -1 : StartWarden(start, *pPage);
     const int error = errno;
     if (warden >= 0) {
         AwaitWarden(warden, wait, *pPage);
     }
     pthread_setcancelstate(cancelState, nullptr);
-    if (warden < 0 || pPage->end == Page::End::kNotRun) {
-        return HOST_ERROR(YLIBC_ERR_EXEC, "cannot run " + strCommand + ": " +
-                                              std::strerror(warden < 0 ? error : pPage->value));
+    if (const int startError = warden < 0 ? error : pPage->startError; startError != 0) {
+        return HOST_ERROR(YLIBC_ERR_EXEC,
+                          "cannot run " + strCommand + ": " + std::strerror(startError));
     }
-    switch (pPage->end) {
-        case Page::End::kHasStatus:
-            status = pPage->value;
-            return {};
-        case Page::End::kTimedOut:
-            status = kTimedOutStatus;
-            return wait.TimeUp(YLIBC_ERR_EXEC_TIME);
-        default:
-            return HOST_ERROR(YLIBC_ERR_EXEC, "nothing is known of the end of " + strCommand);
+    if (pPage->end == Page::End::kUnknown) {
+        return HOST_ERROR(YLIBC_ERR_EXEC, "nothing is known of the end of " + strCommand);
     }
-}
-
-// Until no program asks for it: those who wait notice the deadline within a slice.
-void ZELOWaitingGiveUp() {
-    ZELODeadlineSet(0);
-    const timespec pause = {0, 300'000'000};
-    nanosleep(&pause, nullptr);
+    const bool blTimedOut = pPage->end == Page::End::kTimedOut;
+    status = blTimedOut ? kTimedOutStatus : pPage->status;
+    return blTimedOut ? wait.TimeUp(YLIBC_ERR_EXEC_TIME) : Status();
 }
