@@ -18,8 +18,9 @@
 //     caller may rely on "0 or not" as well as on "negative or not". Every failure sets the last
 //     error (last_error.h). A null record fails.
 //   - The store is shared by all processes. An operation that meets another process's write waits
-//     for it, within a bound, and fails with YLIBC_ERR_STORE_BUSY past it. It works in a child
-//     process after fork as it did in the parent.
+//     for it, within a bound, and fails with YLIBC_ERR_STORE_BUSY past it, or with
+//     YLIBC_ERR_DEADLINE at the process's deadline (diagnosis.h). It works in a child process after
+//     fork as it did in the parent.
 //   - Operations on different records may run in different threads at once; one record belongs to
 //     one thread at a time.
 //   - Neither token ever appears in a log line, and the store is readable for its owner alone. One
@@ -27,9 +28,9 @@
 //     is next used, be it for a look. Where they cannot be taken away, or the store, or its folder,
 //     belongs to somebody else (root excepted), operations fail with YLIBC_ERR_UNSAFE_FILE.
 //   - A store whose file is damaged or of another format is left as it is: operations on it fail
-//     with YLIBC_ERR_STORE_DAMAGED until somebody restores a copy or sets it aside (diagnosis.h). No
-//     other failure (a busy store, missing rights, a full disk, a disk that cannot read) counts as
-//     damage.
+//     with YLIBC_ERR_STORE_DAMAGED until somebody restores a copy or sets it aside (diagnosis.h).
+//     No other failure (a busy store, missing rights, a full disk, a disk that cannot read) counts
+//     as damage.
 
 #ifndef ZELO_PLATFORM_CREDENTIAL_STORE_H
 #define ZELO_PLATFORM_CREDENTIAL_STORE_H
@@ -112,8 +113,8 @@ ZELO_PLATFORM_API void ZELOCredListFree(ZELO_CRED **ppList);
 ZELO_PLATFORM_API long ZELOCredIDGetByApplication(const char *szApplication);
 
 // Removes the record with this id and its session, durably and as a whole: no token outlives the
-// record that it belongs to. A record that is not there counts as removed, and a session that stands
-// under its id goes all the same. Removing the session first is allowed.
+// record that it belongs to. A record that is not there counts as removed, and a session that
+// stands under its id goes all the same. Removing the session first is allowed.
 ZELO_PLATFORM_API int ZELOCredRemoveByID(long id);
 
 // --- Sessions -----------------------------------------------------------------------------------

@@ -2,6 +2,8 @@
 
 #include "credential_record.h"
 
+#include <new>
+
 #include "fixed_text.h"
 #include "status.h"
 
@@ -11,11 +13,11 @@ using host::Status;
 
 template <typename Record>
 Record *Alloc() {
-    Record *pRecord = nullptr;
-    return HOST_OPERATION(pRecord, pRecord, [&]() -> Status {
-        pRecord = new Record;
-        return {};
-    });
+    auto *const pRecord = new (std::nothrow) Record;
+    if (pRecord == nullptr) {
+        host::PublishShortMemory(ZELO_SOURCE_STEM, __LINE__);
+    }
+    return pRecord;
 }
 
 template <typename Record>

@@ -182,7 +182,7 @@ Status Move(const Store &store, std::string &strPath) {
 // While the process has no connection.
 Status MoveIfDamaged(const Store &store, const struct stat &judged, const Wait &wait,
                      std::string &strPath) {
-    const Status found = FindDamage(store, wait);
+    Status found = FindDamage(store, wait);
     if (found.Code() != YLIBC_ERR_STORE_DAMAGED) {
         return found;
     }
