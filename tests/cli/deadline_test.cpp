@@ -57,10 +57,10 @@ Held HoldAccounts() {
 }
 
 // A program at the path, which does not come back and tells its process id.
-Held HangProgram(const char *szPath) {
+Held HangProgram(const char *szPath, const std::string &strFirst = "") {
     const std::string strBefore = FileText(szPath);
     fs::create_directories(fs::path(szPath).parent_path());
-    WriteProgram(szPath, "echo $$ > /tmp/pid\nexec sleep 600");
+    WriteProgram(szPath, strFirst + "echo $$ > /tmp/pid\nexec sleep 600");
     WriteFile("/tmp/pid", "");
     return {nullptr, [szPath, strBefore](void *) {
                 strBefore.empty() ? void(fs::remove(szPath)) : WriteFile(szPath, strBefore);
@@ -312,7 +312,8 @@ TEST_F(Deadline, AJoinSaysWhatRemains) {
     ASSERT_EQ(run_program::Run({QRMCTL, "leave"}).status, 0);
     ExpectEnd({{"join", "--server", "localhost", "--http-port", "0", "--https-port", strPort,
                 "--token-file", "/tmp/token", "--sn", "S"},
-               Program(kDaemonScript),
+               {[] { return HangProgram(kDaemonScript, "[ \"$1\" = start ] || exit 1\n"); },
+                kDaemonScript},
                "this remains of the join: "});
     EXPECT_EQ(run_program::Run({QRMCTL, "status"}).status, 4);
     EXPECT_EQ(run_program::Run({QRMCTL, "leave"}).status, 0);
