@@ -338,6 +338,27 @@ TEST_F(Deadline, IsANumberOfSecondsAboveZeroAndStatusHasOne) {
     EXPECT_GE(std::chrono::steady_clock::now() - begin, std::chrono::seconds(10));
 }
 
+// A signal moves the deadline to now; it is told as what it is.
+TEST_F(Deadline, AnInterruptionEndsAFetchThatWaits) {
+    const Held silence = Silence(*s_pServer);
+    run_program::Program fetch(
+        {QRMCTL, "get-file", kPath, "ZELO.QRM.RPC.File", "get", "--json", "--deadline", "60"});
+    const auto files = [] {
+        return std::distance(fs::directory_iterator("/tmp/files"), fs::directory_iterator());
+    };
+    ASSERT_TRUE(run_program::Until([&] { return files() == 2; })) << "it is made beside the file";
+    const auto begin = std::chrono::steady_clock::now();
+    fetch.Signal(SIGTERM);
+    const run_program::Outcome outcome = fetch.Wait();
+    EXPECT_LT(std::chrono::steady_clock::now() - begin, std::chrono::duration<double>(1 + kBusy_s));
+    EXPECT_EQ(outcome.status, 1);
+    Json::Value result;
+    EXPECT_TRUE(json::FromString(outcome.strOut, result)) << outcome.strOut;
+    EXPECT_EQ(result["error_id"], "interrupted");
+    EXPECT_EQ(files(), 1);
+    EXPECT_EQ(FileText(kPath), "old");
+}
+
 // A reader that has stopped reading, on one of the streams; the other one is read.
 TEST_F(Deadline, EndsThoughNobodyReadsItsOutputAndNeverContradictsIt) {
     constexpr std::size_t kPage = 4096;
