@@ -1,12 +1,11 @@
 #include "joined_server.h"
 
-#include "credential_store.h"
+#include "diagnosis.h"
 #include "fixed_text.h"
 #include "json.h"
 #include "last_error.h"
 #include "membership.h"
 #include "serial_number.h"
-#include "web_session.h"
 #include "zeloqrmclient.h"
 
 namespace qrmctl {
@@ -70,6 +69,13 @@ std::optional<ExitCode> ClearDamaged(const StoreOfMembership &store, Report &rep
 
 std::optional<ExitCode> ClearDamagedStores(Report &report, bool &blServerLost) {
     bool blSessionsLost = false;
+    if (ZELOCredStoreSetAside == nullptr || ZeloCgiStoreSetAside == nullptr) {
+        // A platform that sets nothing aside.
+        const std::optional<ErrorId> flaw = StoreFlaw();
+        return flaw ? std::optional(report.Fail(
+                          *flaw, "the credential store can neither be used nor set aside"))
+                    : std::nullopt;
+    }
     const auto code = ClearDamaged(kCredentials, report, blServerLost);
     return code ? code : ClearDamaged(kSessions, report, blSessionsLost);
 }

@@ -23,9 +23,6 @@
 namespace qrmctl {
 namespace {
 
-constexpr int kOwner = 1024;
-constexpr const char *kAccountFolder = "/usr/zelo/etc/QRM";
-
 // In a folder that only root can write to, so that nobody else can stand in the way.
 constexpr const char *kTurnLock = "/var/run/qrmctl.membership.lock";
 constexpr int kTurnTimeout_s = 120;
@@ -70,7 +67,7 @@ bool RemoveRemains(bool blRejoin) {
     if (!ZELOQRMClientDeleteServerUser()) {
         return false;
     }
-    std::filesystem::remove_all(kAccountFolder, error);
+    std::filesystem::remove_all(appliance::kAccountFolder, error);
     if (error || blRejoin) {
         return !error;
     }
@@ -83,7 +80,7 @@ bool RemoveRemains(bool blRejoin) {
 // --- What is gone for certain: what cannot be read may be there ---------------------------------
 
 bool AreCredentialsGone() {
-    for (const char *szApplication : {kServerApplication, kNotificationCenter}) {
+    for (const char *szApplication : {kQrmServer, kNotificationCenter}) {
         ZELO_CRED *pList = nullptr;
         const int count = ZELOCredListGet(&pList, ZELOCredKeepByApplication, szApplication);
         const CredListHandle list(pList);
@@ -118,7 +115,7 @@ bool StoreSerial(const std::string &strSerial) {
     extraInfo["sn"] = strSerial;
     std::string strText;
     const CredHandle pCred(ZELOCredAlloc());
-    const long id = ZELOCredIDGetByApplication(kServerApplication);
+    const long id = ZELOCredIDGetByApplication(kQrmServer);
     return pCred != nullptr && id >= 0 && json::ToString(extraInfo, strText) &&
            ZELOCredLoad(id, pCred.get()) >= 0 &&
            ZELOCredItemSetExtraInfo(pCred.get(), strText.c_str()) >= 0 &&
@@ -162,7 +159,7 @@ MembershipTurn::~MembershipTurn() {
 
 bool IsStoreReadable() {
     ZELO_CRED *pList = nullptr;
-    const int count = ZELOCredListGet(&pList, ZELOCredKeepByApplication, kServerApplication);
+    const int count = ZELOCredListGet(&pList, ZELOCredKeepByApplication, kQrmServer);
     const CredListHandle list(pList);
     return count >= 0;
 }
@@ -171,7 +168,8 @@ std::vector<std::string> StoresSetAside() {
     constexpr int kListSize = 1024;
     std::vector<std::string> paths;
     ListHandle list(YLIBCSzListAlloc(kListSize));
-    if (list.Get() == nullptr || ZELOCredStoreListSetAside(list.Address()) < 0) {
+    if (ZELOCredStoreListSetAside == nullptr || list.Get() == nullptr ||
+        ZELOCredStoreListSetAside(list.Address()) < 0) {
         return paths;
     }
     for (int i = 0; i < list.Get()->nItem; ++i) {
@@ -181,19 +179,19 @@ std::vector<std::string> StoresSetAside() {
 }
 
 bool StoreServerSession(const std::string &strToken) {
-    return StoreSession(ZELOCredIDGetByApplication(kServerApplication), strToken);
+    return StoreSession(ZELOCredIDGetByApplication(kQrmServer), strToken);
 }
 
 bool StoreNotificationCenter(const std::string &strToken) {
     const CredHandle pServer(ZELOCredAlloc());
     const CredHandle pCred(ZELOCredAlloc());
-    const long serverId = ZELOCredIDGetByApplication(kServerApplication);
+    const long serverId = ZELOCredIDGetByApplication(kQrmServer);
     const long now_s = std::time(nullptr);
     long id = -1;
     return pServer != nullptr && pCred != nullptr && serverId >= 0 &&
            ZELOCredLoad(serverId, pServer.get()) >= 0 && CopyServer(pServer.get(), pCred.get()) &&
            ZELOCredItemSetApplication(pCred.get(), kNotificationCenter) >= 0 &&
-           ZELOCredItemSetOwner(pCred.get(), kOwner) >= 0 &&
+           ZELOCredItemSetOwner(pCred.get(), appliance::kCredentialOwner) >= 0 &&
            ZELOCredItemSetCreateTime(pCred.get(), now_s) >= 0 &&
            ZELOCredItemSetModifyTime(pCred.get(), now_s) >= 0 && ZELOCredSave(pCred.get()) >= 0 &&
            ZELOCredItemGetID(&id, pCred.get()) >= 0 && StoreSession(id, strToken);

@@ -20,6 +20,7 @@
 
 #include "connection_checks.h"
 #include "deadline.h"
+#include "diagnosis.h"
 #include "fixed_text.h"
 #include "key_value_file.h"
 #include "membership.h"
@@ -338,7 +339,11 @@ constexpr const char *kSetAside =
 std::string WhyLeftOut(bool blKnown) {
     constexpr int kListSize = 16;
     ListHandle list(YLIBCSzListAlloc(kListSize));
-    const int count = list.Get() == nullptr ? -1 : ZELOCredStoreListSetAside(list.Address());
+    int count = list.Get() == nullptr ? -1 : 0;
+    // A platform may set nothing aside.
+    if (count == 0 && ZELOCredStoreListSetAside != nullptr) {
+        count = ZELOCredStoreListSetAside(list.Address());
+    }
     if (!blKnown || count < 0) {
         return kUnreadable;
     }

@@ -26,12 +26,15 @@
 //     that others have rights over, as a copy that was put back may be, loses those rights when it
 //     is next used, be it for a look. Where they cannot be taken away, or the store, or its folder,
 //     belongs to somebody else (root excepted), operations fail with YLIBC_ERR_UNSAFE_FILE.
+//   - A store whose file is damaged or of another format is left as it is: operations on it fail
+//     with YLIBC_ERR_STORE_DAMAGED until somebody restores a copy or sets it aside (diagnosis.h). No
+//     other failure (a busy store, missing rights, a full disk, a disk that cannot read) counts as
+//     damage.
 
 #ifndef ZELO_PLATFORM_CREDENTIAL_STORE_H
 #define ZELO_PLATFORM_CREDENTIAL_STORE_H
 
 #include "api.h"
-#include "text_containers.h"
 
 // Both records are opaque; each port lays them out as it likes.
 struct ZELO_CRED;
@@ -108,28 +111,10 @@ ZELO_PLATFORM_API void ZELOCredListFree(ZELO_CRED **ppList);
 // or the store cannot be read.
 ZELO_PLATFORM_API long ZELOCredIDGetByApplication(const char *szApplication);
 
-// Removes the record with this id, durably. One that is not there counts as removed.
+// Removes the record with this id and its session, durably and as a whole: no token outlives the
+// record that it belongs to. A record that is not there counts as removed, and a session that stands
+// under its id goes all the same. Removing the session first is allowed.
 ZELO_PLATFORM_API int ZELOCredRemoveByID(long id);
-
-// --- A damaged store ----------------------------------------------------------------------------
-//
-// A store whose file is damaged or of another format is left as it is: operations on it fail with
-// YLIBC_ERR_STORE_DAMAGED until somebody restores a copy or sets it aside. Nothing but the
-// following operation sets it aside, and no other failure (a busy store, missing rights, a full
-// disk, a disk that cannot read) counts as damage.
-
-// Looks through the whole store; where its file could be read whole, and is damaged, renames it to
-// one in the same folder whose name says when, and never replaces another. The store is empty then,
-// and ids count from the beginning.
-//
-// Returns 1 when it was set aside, 0 when nothing is damaged, a negative value when that could not
-// be found out or done; the operation may be called again then. szPath, a buffer of cbPath bytes,
-// gets the path at which the file is now, moved or not.
-ZELO_PLATFORM_API int ZELOCredStoreSetAside(char *szPath, int cbPath);
-
-// Appends the paths of all files that were set aside and are still there, the oldest first. Returns
-// their number, negative on failure.
-ZELO_PLATFORM_API int ZELOCredStoreListSetAside(YLIBSZLIST **ppslPaths);
 
 // --- Sessions -----------------------------------------------------------------------------------
 

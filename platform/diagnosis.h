@@ -27,6 +27,28 @@ extern "C" {
 // nothing has failed yet; -1 for no buffer.
 ZELO_DIAGNOSIS_API int ZELODiagnosisReason(char *szReason, int cbReason);
 
+// --- Damaged stores -----------------------------------------------------------------------------
+//
+// Nothing but these operations sets the file of a damaged store aside, and they do it for nothing but
+// damage: not where the store is busy, out of reach, or cannot be read whole.
+
+// Looks through the whole credential store (credential_store.h); where its file could be read whole,
+// and is damaged or of another format, renames it to one in the same folder whose name says when,
+// and never replaces another. The store is empty then, and ids count from the beginning.
+//
+// Returns 1 when it was set aside, 0 when nothing is damaged, a negative value when that could not
+// be found out or done; the operation may be called again then. szPath, a buffer of cbPath bytes,
+// gets the path at which the file is now, moved or not.
+ZELO_DIAGNOSIS_API int ZELOCredStoreSetAside(char *szPath, int cbPath);
+
+// Appends the paths of all files of the credential store that were set aside and are still there,
+// the oldest first. Returns their number, negative on failure.
+ZELO_DIAGNOSIS_API int ZELOCredStoreListSetAside(YLIBSZLIST **ppslPaths);
+
+// The same as ZELOCredStoreSetAside for the store of the web sessions (web_session.h); it needs no
+// context. The store is empty then: who had a session signs in again.
+ZELO_DIAGNOSIS_API int ZeloCgiStoreSetAside(char *szPath, int cbPath);
+
 // --- The deadline
 // ---------------------------------------------------------------------------------
 //

@@ -16,14 +16,18 @@ extern "C" {
 // standard streams lead to the null device), no blocked or ignored signals, and a process group of
 // its own. What it leaves running behind it runs on.
 //
+// A program that others than root and the caller can write to, or that stands in a folder that they
+// can write to, is refused (YLIBC_ERR_UNSAFE_FILE); links to it are as good as their folders.
+//
 // The operation waits for the program's end. A program that runs for longer than the platform's
-// limit is ended with its whole process group. Whatever the caller does with SIGCHLD, with other
+// limit, or past the process's deadline (diagnosis.h), is ended with its whole process group. Whatever the caller does with SIGCHLD, with other
 // children of its own or with its standard streams changes nothing, and no ended child is left to
 // it.
 //
 // Returns the program's exit status, 0 to 255, or 128 plus the signal's number for a program that a
 // signal ended. Returns a negative value when the program could not be run (YLIBC_ERR_EXEC; a null
-// path is YLIBC_ERR_INVALID_ARGUMENT) or had to be ended (YLIBC_ERR_EXEC_TIME).
+// path is YLIBC_ERR_INVALID_ARGUMENT) or had to be ended (YLIBC_ERR_EXEC_TIME, YLIBC_ERR_DEADLINE).
+// Past the deadline no program is started.
 ZELO_PLATFORM_API int YLIBCExec(const char *szProgram, const char *szArgument1,
                                 const char *szArgument2, const char *szArgument3,
                                 const char *szArgument4);

@@ -1,5 +1,4 @@
-// What the process waits for, and giving up on it: for a program that ends itself at a deadline,
-// and is to tell what kept it. Both may be called in any thread, and wait for no other.
+// What the process waits for. It may be asked in any thread, and waits for no other.
 
 #ifndef ZELO_PLATFORM_WAITING_H
 #define ZELO_PLATFORM_WAITING_H
@@ -15,12 +14,6 @@ extern "C" {
 // when nothing is waited for; -1 for a null buffer or one without room
 // (YLIBC_ERR_INVALID_ARGUMENT).
 ZELO_PLATFORM_API int ZELOWaitingFor(char *sz, int cb);
-
-// Ends the programs that operations of the platform run at this moment in this process, each with
-// its process group; other children of the process are left alone. The operations that run them do
-// not return any more, and none runs another program: the caller is about to end the process.
-// It comes back when the programs have ended, after half a second at most.
-ZELO_PLATFORM_API void ZELOWaitingGiveUp();
 }
 
 #endif

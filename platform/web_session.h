@@ -12,7 +12,8 @@
 //
 // Results: non-zero for yes or done, 0 for no or failed. A failure sets the last error
 // (last_error.h); a session that is not there is no failure and leaves it as it was. A store that
-// others have rights over, or own, is treated as the credential store is (credential_store.h).
+// others have rights over, or own, or that is damaged, is treated as the credential store is
+// (credential_store.h).
 
 #ifndef ZELO_PLATFORM_WEB_SESSION_H
 #define ZELO_PLATFORM_WEB_SESSION_H
@@ -48,11 +49,6 @@ ZELO_PLATFORM_API int ZeloCgiAddSessionByIndex(ZELO_CGI_CONTEXT *pContext, int i
 // be repaired. Returns non-zero on success.
 ZELO_PLATFORM_API int ZeloCgiRemoveSessionByIndex(ZELO_CGI_CONTEXT *pContext, int index,
                                                   const char *szName);
-
-// Sets a damaged store of the sessions aside, by the rules, with the arguments and the results of
-// ZELOCredStoreSetAside (credential_store.h); it needs no context. The store is empty then: who had
-// a session signs in again.
-ZELO_PLATFORM_API int ZeloCgiStoreSetAside(char *szPath, int cbPath);
 
 // Releases what the context holds and fills it with zeros. A context that was never made ready, or
 // was released before, and null are no errors. The sessions stay.

@@ -2,12 +2,15 @@
 
 #include "notification.h"
 
+#include <fcntl.h>
 #include <gtest/gtest.h>
 #include <json/reader.h>
+#include <sys/file.h>
 #include <syslog.h>
 
 #include <cstdarg>
 #include <cstdio>
+#include <functional>
 #include <set>
 #include <vector>
 
@@ -121,17 +124,45 @@ TEST_F(Notification, HooksRunInTheirOrderWhateverOneOfThemDoes) {
 
     // A journal that cannot be written is a failure, but hooks are told all the same.
     fs::remove(kJournal);
-    std::ofstream("/var/log/elsewhere").flush();
-    fs::create_symlink("elsewhere", kJournal);
+    fs::create_directory(kJournal);
     EXPECT_EQ(FailureOf(Send("Tag")), YLIBC_ERR_UNSAFE_FILE);
-    EXPECT_EQ(fs::file_size("/var/log/elsewhere"), 0U);
     EXPECT_EQ(FileLines(kHookOutput).size(), 2 * expected.size());
 
     chmod(kHooks, 0777);
     EXPECT_LT(Send("Tag"), 0);
-    EXPECT_STREQ(YLIBCErrorGetFile(), "notification_journal");
+    EXPECT_TRUE(Holds(failures::Reason(), kJournal)) << failures::Reason();
     EXPECT_EQ(FileLines(kHookOutput).size(), 2 * expected.size())
         << "anybody could have put a hook there";
+}
+
+TEST_F(Notification, OnlyAFileOfOursIsTheJournal) {
+    WriteFile("/var/log/elsewhere", "");
+    const std::pair<const char *, std::function<void()>> rows[] = {
+        {"is a link", [] { fs::create_symlink("elsewhere", kJournal); }},
+        {"has a second name", [] { fs::create_hard_link("/var/log/elsewhere", kJournal); }},
+        {"is no file", [] { EXPECT_EQ(mkfifo(kJournal, 0600), 0); }},
+        {"is no file", [] { EXPECT_EQ(mknod(kJournal, S_IFSOCK | 0600, 0), 0); }},
+        {"belongs to the user 1000", [] { PutStrangers("file", kJournal); }}};
+    for (const auto &[szReason, put] : rows) {
+        put();
+        // Strangers' files there are where root has made the box.
+        if (fs::exists(fs::symlink_status(kJournal))) {
+            EXPECT_EQ(FailureOf(Send("Tag")), YLIBC_ERR_UNSAFE_FILE) << szReason;
+            EXPECT_EQ(failures::Reason(), '\'' + std::string(kJournal) + "' " + szReason);
+        }
+        EXPECT_EQ(fs::file_size("/var/log/elsewhere"), 0U);
+        fs::remove(kJournal);
+    }
+}
+
+TEST_F(Notification, AJournalThatIsHeldIsWaitedForUntilTheDeadline) {
+    const int fd = open(kJournal, O_RDWR | O_CREAT | O_CLOEXEC, 0600);
+    ASSERT_EQ(flock(fd, LOCK_EX), 0);
+    ZELODeadlineSet(200);
+    EXPECT_EQ(FailureOf(Send("Tag")), YLIBC_ERR_DEADLINE);
+    ZELODeadlineSet(-1);
+    close(fd);
+    EXPECT_EQ(Send("Tag"), 0);
 }
 
 TEST_F(Notification, ProcessesAppendAtOnceAndEveryLineIsWhole) {

@@ -12,6 +12,7 @@
 #include <thread>
 
 #include "children.h"
+#include "diagnosis.h"
 #include "failures.h"
 #include "files.h"
 #include "process.h"
@@ -21,6 +22,7 @@ namespace {
 using namespace files;
 
 constexpr const char *kOut = "/tmp/out";
+constexpr const char *kPrograms = "/tmp/programs";
 
 void Write(const char *szPath, const std::string &strText, int mode = 0755) {
     std::ofstream(szPath) << strText;
@@ -81,6 +83,7 @@ class Exec : public testing::Test {
   protected:
     void SetUp() override {
         std::remove(kOut);
+        fs::create_directory(kPrograms);
         Write("/etc/zeloinfo.conf", "exec_timeout=\"60\"\n");
     }
 };
@@ -125,10 +128,11 @@ TEST_F(Exec, GivesTheProgramsEndWhateverTheCallerDoes) {
 }
 
 TEST_F(Exec, PassesArgumentsOnAsTheyAre) {
-    Write("/tmp/show", "#!/bin/sh\nfor a; do printf '<%s>' \"$a\"; done >/tmp/out\n");
-    EXPECT_EQ(YLIBCExec("/tmp/show", " a b", "it's \"c\"", "", "$(exit) `exit` *;&|\n"), 0);
+    Write("/tmp/programs/show", "#!/bin/sh\nfor a; do printf '<%s>' \"$a\"; done >/tmp/out\n");
+    EXPECT_EQ(YLIBCExec("/tmp/programs/show", " a b", "it's \"c\"", "", "$(exit) `exit` *;&|\n"),
+              0);
     EXPECT_EQ(FileText(kOut), "< a b><it's \"c\"><><$(exit) `exit` *;&|\n>");
-    EXPECT_EQ(YLIBCExec("/tmp/show", "a", nullptr, "b", nullptr), 0);
+    EXPECT_EQ(YLIBCExec("/tmp/programs/show", "a", nullptr, "b", nullptr), 0);
     EXPECT_EQ(FileText(kOut), "<a>");
 }
 
@@ -142,11 +146,12 @@ TEST_F(Exec, GivesTheProgramTheNullDeviceAndNoOtherFiles) {
 }
 
 TEST_F(Exec, SaysWhenAProgramCannotBeRun) {
-    Write("/tmp/plain", "#!/bin/sh\n", 0644);
-    Write("/tmp/interpreter", "#!/tmp/none\n");
-    Write("/tmp/text", "exit 0\n");
-    for (const char *szProgram : {"/tmp/none", "/tmp", "/tmp/plain", "/tmp/interpreter",
-                                  "/tmp/text", "/tmp/text/below", "sh", ""}) {
+    Write("/tmp/programs/plain", "#!/bin/sh\n", 0644);
+    Write("/tmp/programs/interpreter", "#!/tmp/none\n");
+    Write("/tmp/programs/text", "exit 0\n");
+    for (const char *szProgram :
+         {"/tmp/programs/none", "/tmp", "/tmp/programs/plain", "/tmp/programs/interpreter",
+          "/tmp/programs/text", "/tmp/programs/text/below", "sh", ""}) {
         EXPECT_EQ(FailureOf(YLIBCExec(szProgram, nullptr, nullptr, nullptr, nullptr)),
                   YLIBC_ERR_EXEC)
             << szProgram;
@@ -157,18 +162,59 @@ TEST_F(Exec, SaysWhenAProgramCannotBeRun) {
     EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_INVALID_ARGUMENT));
 }
 
+TEST_F(Exec, RunsOnlyWhatNobodyElseCanChange) {
+    fs::create_directory("/tmp/programs/open");
+    for (const char *szProgram : {"good", "changeable", "open/program"}) {
+        Write((std::string(kPrograms) + '/' + szProgram).c_str(), "#!/bin/sh\n");
+    }
+    chmod("/tmp/programs/changeable", 0775);
+    chmod("/tmp/programs/open", 0777);
+    fs::create_symlink("good", "/tmp/programs/link");
+    fs::create_symlink("../good", "/tmp/programs/open/link");
+    const std::pair<const char *, int> rows[] = {{"good", YLIBC_ERR_NONE},
+                                                 {"link", YLIBC_ERR_NONE},
+                                                 {"changeable", YLIBC_ERR_UNSAFE_FILE},
+                                                 {"open/program", YLIBC_ERR_UNSAFE_FILE},
+                                                 {"open/link", YLIBC_ERR_UNSAFE_FILE}};
+    for (const auto &[szName, error] : rows) {
+        const std::string strProgram = std::string(kPrograms) + '/' + szName;
+        EXPECT_EQ(FailureOf(YLIBCExec(strProgram.c_str(), nullptr, nullptr, nullptr, nullptr)),
+                  error)
+            << szName;
+    }
+}
+
 TEST_F(Exec, EndsAHungProgramWithItsProcessGroup) {
-    Write("/etc/zeloinfo.conf", "exec_timeout=2\n");
-    const auto begin = std::chrono::steady_clock::now();
-    EXPECT_EQ(FailureOf(Shell("trap '' TERM; sleep 300 & echo $$ $! >/tmp/out; sleep 300; :")),
-              YLIBC_ERR_EXEC_TIME);
-    const auto duration = std::chrono::steady_clock::now() - begin;
-    EXPECT_GE(duration, std::chrono::seconds(2));
-    EXPECT_LT(duration, std::chrono::seconds(100));
-    int program = 0;
-    int child = 0;
-    std::istringstream(FileText(kOut)) >> program >> child;
-    EXPECT_TRUE(program > 0 && Ends(program) && child > 0 && Ends(child));
+    const std::tuple<const char *, long long, YLIBC_ERROR> rows[] = {
+        {"exec_timeout=2\n", -1, YLIBC_ERR_EXEC_TIME}, {"", 1200, YLIBC_ERR_DEADLINE}};
+    double told_s = 0;
+    ZELOWaitObserverSet(
+        [](void *pTold, const char *szWaitsFor, double waited_s) {
+            EXPECT_STREQ(szWaitsFor, "the program '/bin/sh -c'");
+            *static_cast<double *>(pTold) = waited_s;
+        },
+        &told_s);
+    for (const auto &[szLimit, deadline_ms, error] : rows) {
+        Write("/etc/zeloinfo.conf", szLimit);
+        ZELODeadlineSet(deadline_ms);
+        const auto begin = std::chrono::steady_clock::now();
+        EXPECT_EQ(FailureOf(Shell("trap '' TERM; sleep 300 & echo $$ $! >/tmp/out; sleep 300; :")),
+                  error);
+        const auto duration = std::chrono::steady_clock::now() - begin;
+        EXPECT_GE(duration, std::chrono::milliseconds(1200));
+        EXPECT_LT(duration, std::chrono::seconds(100));
+        EXPECT_GE(told_s, 1);
+        int program = 0;
+        int child = 0;
+        std::istringstream(FileText(kOut)) >> program >> child;
+        EXPECT_TRUE(program > 0 && Ends(program) && child > 0 && Ends(child));
+        told_s = 0;
+    }
+    ZELOWaitObserverSet(nullptr, nullptr);
+    std::remove(kOut);
+    EXPECT_EQ(FailureOf(Shell("echo >/tmp/out")), YLIBC_ERR_DEADLINE);
+    EXPECT_FALSE(fs::exists(kOut)) << "what is started past the deadline could change things";
+    ZELODeadlineSet(-1);
 }
 
 TEST_F(Exec, TakesAnInvalidLimitForTheDefault) {

@@ -161,6 +161,20 @@ TEST(StringsFile, SeesEveryChangeAtOnce) {
     EXPECT_EQ(Get("b", "k"), kNotFound);
 }
 
+TEST(StringsFile, TakesTheMemoryThatTextsNeedAndNoMore) {
+    const std::string strUnread = "-" + std::to_string(YLIBC_ERR_FILE);
+    const std::string strLines = Repeated("#" + std::string(1000, ' ') + '\n', 17U << 20U);
+    Replace("[small]\nk=\"1\"\n[large]\n" + strLines + "[last]\nk=\"2\"\n");
+    EXPECT_EQ(Get("small", "k") + Get("last", "k"), "12");
+    EXPECT_EQ(Get("large", "k"), strUnread);
+    EXPECT_EQ(failures::Reason(),
+              "cannot read '/tmp/strings': a line or section of it is larger than 16 MiB");
+    Replace("[small]\nk=\"1\"\n" + Repeated("[]\n", 400'000));
+    EXPECT_EQ(Get("small", "k"), strUnread);
+    Replace("[small]\nk=\"1\"\n" + std::string(33U << 20U, 'x'));
+    EXPECT_EQ(Get("small", "k"), strUnread);
+}
+
 TEST(StringsFile, IsSafeWhileTheFileIsCutShortAndProcessesFork) {
     std::string strText;
     for (int i = 0; i < 100; ++i) {

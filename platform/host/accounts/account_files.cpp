@@ -1,25 +1,17 @@
 #include "account_files.h"
 
-#include <sys/time.h>
-
 #include <algorithm>
 #include <cerrno>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
-#include <mutex>
 #include <new>
 #include <utility>
 
 #include "files/file_replacement.h"
-#include "fork_safe.h"
-#include "status.h"
-#include "wait.h"
 
 namespace host {
 namespace {
-
-constexpr const char *kFile = "account_files";
 
 using Stream = std::unique_ptr<std::FILE, int (*)(std::FILE *)>;
 using CText = std::unique_ptr<char, void (*)(void *)>;
@@ -72,35 +64,20 @@ void AccountFile<Format>::Parse(Line &line) {
 }
 
 template <typename Format>
-bool AccountFile<Format>::Read() {
-    Status status = FindFile(Format::kPath, m_found);
-    if (!status.Failed() && m_found.blThere) {
-        status = ReadContent(m_found, m_strRead);
-    }
-    if (status.Failed()) {
-        status.Publish();
-        return false;
-    }
+Status AccountFile<Format>::Read() {
+    HOST_TRY(FindFile(Format::kPath, m_found));
     if (!m_found.blThere) {
-        return !Format::kRequired || HOST_FAIL(YLIBC_ERR_FILE) == 0;
+        return Format::kRequired
+                   ? HOST_ERROR(YLIBC_ERR_FILE, std::string("there is no '") + Format::kPath + '\'')
+                   : Status();
     }
+    HOST_TRY(ReadContent(m_found, m_strRead));
     for (std::string &strLine : SplitLines(m_strRead)) {
         m_lines.emplace_back();
         m_lines.back().strText = std::move(strLine);
         Parse(m_lines.back());
     }
-    return true;
-}
-
-template <typename Format>
-const typename AccountFile<Format>::Entry *AccountFile<Format>::Find(
-    const std::string &strName) const {
-    for (const Line &line : m_lines) {
-        if (line.texts != nullptr && line.entry.*kName == strName) {
-            return &line.entry;
-        }
-    }
-    return nullptr;
+    return {};
 }
 
 template <typename Format>
@@ -115,50 +92,56 @@ std::vector<const typename Format::Entry *> AccountFile<Format>::Entries() const
 }
 
 template <typename Format>
-bool AccountFile<Format>::Put(const Entry &entry, const Entry *pPlace) {
+Status AccountFile<Format>::Get(const std::string &strName, const Entry *&pEntry) const {
+    pEntry = Find(strName);
+    return pEntry != nullptr
+               ? Status()
+               : HOST_ERROR(YLIBC_ERR_NOT_FOUND, std::string("there is no '") + strName + "' in '" +
+                                                     Format::kPath + '\'');
+}
+
+template <typename Format>
+Status AccountFile<Format>::Put(const Entry &entry, const Entry *pPlace) {
     Line line;
     line.strText = WriteLine<Format>(entry);
     Parse(line);
     if (line.texts == nullptr || std::strcmp(line.entry.*kName, entry.*kName) != 0) {
-        HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-        return false;
+        return HOST_ERROR(YLIBC_ERR_INVALID_ARGUMENT, std::string("no line of '") + Format::kPath +
+                                                          "' can hold what is to be stored for '" +
+                                                          entry.*kName + '\'');
     }
     const auto place = std::find_if(m_lines.begin(), m_lines.end(),
                                     [&](const Line &old) { return &old.entry == pPlace; });
     if (place != m_lines.end()) {
         *place = std::move(line);
-        return true;
+        return {};
     }
     if (!m_lines.empty() && m_lines.back().strText.back() != '\n') {
         m_lines.back().strText += '\n';
     }
     m_lines.push_back(std::move(line));
-    return true;
+    return {};
 }
 
 template <typename Format>
 void AccountFile<Format>::Remove(const std::string &strName) {
-    const auto blNamed = [&](const Line &line) {
+    const auto isNamed = [&](const Line &line) {
         return line.texts != nullptr && line.entry.*kName == strName;
     };
-    m_lines.erase(std::remove_if(m_lines.begin(), m_lines.end(), blNamed), m_lines.end());
+    m_lines.erase(std::remove_if(m_lines.begin(), m_lines.end(), isNamed), m_lines.end());
 }
 
 template <typename Format>
-bool AccountFile<Format>::Write() {
+Status AccountFile<Format>::Write() {
     std::string strText;
     for (const Line &line : m_lines) {
         strText += line.strText;
     }
     if (strText == m_strRead) {
-        return true;
+        return {};
     }
     m_blWritten = true;
-    Status status = ReplaceFile(m_found, strText);
-    if (status.Failed()) {
-        status.Publish();
-    }
-    return !status.Failed();
+    return ReplaceFile(m_found, strText);
 }
 
 template <typename Format>
@@ -173,37 +156,14 @@ template class AccountFile<ShadowFormat>;
 template class AccountFile<GroupFormat>;
 template class AccountFile<GroupShadowFormat>;
 
-// --- The lock -----------------------------------------------------------------------------------
-
-namespace {
-
-// The C library's lock excludes processes; the threads of one process are kept apart here. A child
-// process could not take the C library's when another thread held it at the fork.
-std::mutex g_threads;
-const int g_forkHandlers = HoldAroundForks<g_threads>();
-
-}  // namespace
-
-AccountLock::AccountLock() {
-    const Waiting waiting({"waiting for the lock '/etc/.pwd.lock'"});
-    g_threads.lock();
-    // lckpwdf limits its wait with the process's alarm, and would leave the caller without its own.
-    struct itimerval callers = {};
-    const struct itimerval none = {};
-    setitimer(ITIMER_REAL, &none, &callers);
-    m_blHeld = lckpwdf() == 0;
-    const int error = errno;
-    setitimer(ITIMER_REAL, &callers, nullptr);
-    if (!m_blHeld) {
-        HOST_FAIL(error == EINTR ? YLIBC_ERR_BUSY : YLIBC_ERR_FILE);
-    }
-}
-
-AccountLock::~AccountLock() {
-    if (m_blHeld) {
-        ulckpwdf();
-    }
-    g_threads.unlock();
+// The C library locks the whole file, which excludes locks on its bytes.
+Status LockAccounts(HeldLock &lock) {
+    constexpr int kLimit_s = 15;
+    const Status status = lock.Take("/etc/.pwd.lock", kLimit_s);
+    return status.Code() == YLIBC_ERR_BUSY
+               ? HOST_ERROR(YLIBC_ERR_BUSY,
+                            "the lock on the account files was held for 15 s by another program")
+               : status;
 }
 
 }  // namespace host

@@ -14,9 +14,12 @@
 
 #include <memory>
 #include <string>
+#include <string_view>
 #include <vector>
 
+#include "files/held_lock.h"
 #include "files/trusted_file.h"
+#include "status.h"
 
 namespace host {
 
@@ -56,17 +59,10 @@ struct GroupShadowFormat {
     static constexpr auto kName = &sgrp::sg_namp;
 };
 
-// The texts of a list that ends with a null, without that null.
-inline std::vector<char *> ListTexts(char **ppszList) {
-    std::vector<char *> texts;
-    for (; *ppszList != nullptr; ++ppszList) {
-        texts.push_back(*ppszList);
-    }
-    return texts;
-}
+// In the password field of the other file: the hash stands in the shadow file.
+constexpr std::string_view kHashInShadow = "x";
 
-// Where an operation can fail it returns false with the error set. Entries that are handed out live
-// until they are replaced or one is removed.
+// Entries that are handed out live until they are replaced or one is removed.
 template <typename Format>
 class AccountFile {
   public:
@@ -74,24 +70,40 @@ class AccountFile {
 
     // Reads the file. A shadow file that is not there has no entries and does not exist; without
     // one of the other two nobody can say which accounts there are.
-    bool Read();
+    Status Read();
     bool Exists() const { return m_found.file.IsOpen(); }
-
-    // The entry of this name, of several the first; null when there is none.
-    const Entry *Find(const std::string &strName) const;
 
     // All entries, in the order of the file.
     std::vector<const Entry *> Entries() const;
 
+    // The first entry that passes the test; null when there is none.
+    template <typename Test>
+    const Entry *FindIf(const Test &passes) const {
+        for (const Line &line : m_lines) {
+            if (line.texts != nullptr && passes(line.entry)) {
+                return &line.entry;
+            }
+        }
+        return nullptr;
+    }
+
+    // The entry of this name, of several the first.
+    const Entry *Find(const std::string &strName) const {
+        return FindIf([&](const Entry &entry) { return entry.*kName == strName; });
+    }
+
+    // The same where it has to be there, else YLIBC_ERR_NOT_FOUND.
+    Status Get(const std::string &strName, const Entry *&pEntry) const;
+
     // Puts the entry in the place of one of the file's own, which it may share texts with; at the
     // file's end when pPlace is null. The other entries that were handed out stay valid.
-    bool Put(const Entry &entry, const Entry *pPlace);
+    Status Put(const Entry &entry, const Entry *pPlace);
 
     // Removes every entry of this name.
     void Remove(const std::string &strName);
 
     // Replaces the file, if anything has changed.
-    bool Write();
+    Status Write();
 
     // Puts the content back that was read, where Write has replaced it; as far as that is possible.
     void PutBack();
@@ -119,32 +131,28 @@ using ShadowFile = AccountFile<ShadowFormat>;
 using GroupFile = AccountFile<GroupFormat>;
 using GroupShadowFile = AccountFile<GroupShadowFormat>;
 
+// Reads the files.
+template <typename... Files>
+Status ReadAll(Files &...files) {
+    Status status;
+    static_cast<void>(((status = files.Read(), !status.Failed()) && ...));
+    return status;
+}
+
 // Replaces the files in this order. When one cannot be written, those before it get their old
 // content back. Readers who look in between see the first files already new: the file that makes an
 // account exist goes last.
 template <typename... Files>
-bool WriteInOrder(Files &...files) {
-    if ((files.Write() && ...)) {
-        return true;
+Status WriteInOrder(Files &...files) {
+    Status status;
+    if (!((status = files.Write(), !status.Failed()) && ...)) {
+        (files.PutBack(), ...);
     }
-    (files.PutBack(), ...);
-    return false;
+    return status;
 }
 
-// The system's lock on its account files, which the shadow suite's programs take too.
-class AccountLock {
-  public:
-    AccountLock();
-    ~AccountLock();
-    AccountLock(const AccountLock &) = delete;
-    AccountLock &operator=(const AccountLock &) = delete;
-
-    // False, with the error set, when the lock could not be had in time.
-    bool IsHeld() const { return m_blHeld; }
-
-  private:
-    bool m_blHeld = false;
-};
+// Takes the system's lock on its account files, which the shadow suite's programs take too.
+Status LockAccounts(HeldLock &lock);
 
 }  // namespace host
 

@@ -2,15 +2,12 @@
 
 #include <crypt.h>
 
+#include <cerrno>
 #include <cstring>
 #include <memory>
 
-#include "status.h"
-
 namespace host {
 namespace {
-
-constexpr const char *kFile = "password_hash";
 
 // yescrypt, libcrypt's strongest method. It reads a password to its end; others stop after 72
 // bytes.
@@ -25,20 +22,21 @@ struct WipeAndDelete {
 
 }  // namespace
 
-bool HashPassword(const char *szPassword, std::string &strHash) {
+Status HashPassword(const char *szPassword, std::string &strHash) {
     char szSetting[CRYPT_GENSALT_OUTPUT_SIZE];
     const std::unique_ptr<crypt_data, WipeAndDelete> pData(new crypt_data());
     if (crypt_gensalt_rn(kMethod, 0, nullptr, 0, szSetting, sizeof(szSetting)) == nullptr) {
-        HOST_FAIL(YLIBC_ERR_NOT_FOUND);
-        return false;
+        return HOST_ERROR(
+            YLIBC_ERR_NOT_FOUND,
+            std::string("cannot hash passwords with yescrypt: ") + std::strerror(errno));
     }
     const char *const szHash = crypt_rn(szPassword, szSetting, pData.get(), sizeof(*pData));
     if (szHash == nullptr) {
-        HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-        return false;
+        return HOST_ERROR(YLIBC_ERR_INVALID_ARGUMENT,
+                          std::string("cannot hash the password: ") + std::strerror(errno));
     }
     strHash = szHash;
-    return true;
+    return {};
 }
 
 }  // namespace host

@@ -5,11 +5,13 @@
 
 #include <string>
 
+#include "status.h"
+
 namespace host {
 
-// Hashes a password whole, with a salt of its own. False, with the error set, when it is too long
-// (more than 511 bytes) or the method is not to be had.
-bool HashPassword(const char *szPassword, std::string &strHash);
+// Hashes a password whole, with a salt of its own. Fails when it is too long (more than 511 bytes)
+// or the method is not to be had.
+Status HashPassword(const char *szPassword, std::string &strHash);
 
 }  // namespace host
 

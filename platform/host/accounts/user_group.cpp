@@ -7,24 +7,22 @@
 #include <cstring>
 #include <memory>
 #include <new>
+#include <optional>
 #include <string>
-#include <utility>
+#include <string_view>
+#include <vector>
 
 #include "account_change.h"
-#include "file_system.h"
+#include "account_rules.h"
 #include "files/key_value_lookup.h"
 #include "fixed_text.h"
-#include "key_value_file.h"
-#include "status.h"
 
 namespace {
 
-constexpr const char *kFile = "user_group";
+using host::Status;
+
 constexpr const char *kAdministrators = "administrators";
-constexpr const char *kPreferenceParent = "/usr/zelo/etc/preference";
 constexpr const char *kExtraAdminKey = "extra_admin_";
-constexpr mode_t kPreferenceMode = 0700;
-constexpr mode_t kPreferenceParentMode = 0755;
 
 template <auto pfnFree>
 struct Release {
@@ -35,16 +33,6 @@ struct Release {
 };
 using UserHandle = std::unique_ptr<ZELO_USER, Release<ZELOUserFree>>;
 using GroupHandle = std::unique_ptr<ZELO_GROUP, Release<ZELOGroupFree>>;
-
-// The operations have C linkage: short memory becomes a failure here.
-template <typename Body>
-int NoThrow(Body &&body) {
-    try {
-        return std::forward<Body>(body)();
-    } catch (const std::bad_alloc &) {
-        return HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
-    }
-}
 
 // --- Records ------------------------------------------------------------------------------------
 
@@ -59,17 +47,25 @@ bool SetText(char (&szField)[cb], const char *szText) {
     return true;
 }
 
-int FillUser(const host::UserFiles &files, const struct passwd &entry, ZELO_USER *pUser) {
-    if (!SetText(pUser->szName, entry.pw_name) || !SetText(pUser->szDescription, entry.pw_gecos) ||
-        !SetText(pUser->szHome, entry.pw_dir) || !SetText(pUser->szShell, entry.pw_shell)) {
-        return HOST_FAIL(YLIBC_ERR_FILE);
+// A record that a field of the account files does not fit into is no user's.
+Status FillUser(const struct passwd &entry, ZELO_USER &user) {
+    if (!SetText(user.szName, entry.pw_name) || !SetText(user.szDescription, entry.pw_gecos) ||
+        !SetText(user.szHome, entry.pw_dir) || !SetText(user.szShell, entry.pw_shell)) {
+        return HOST_ERROR(YLIBC_ERR_FILE, std::string("a field of the user '") + entry.pw_name +
+                                              "' is too long for a record");
     }
-    const spwd *const pShadow = files.shadow.Find(entry.pw_name);
-    pUser->uid = entry.pw_uid;
-    pUser->gid = entry.pw_gid;
-    pUser->nExpireDay = pShadow == nullptr ? -1 : static_cast<int>(pShadow->sp_expire);
-    pUser->blEnabled = host::LetsIn(files.StoredPassword(entry.pw_name)) ? 1 : 0;
-    return 0;
+    user.uid = entry.pw_uid;
+    user.gid = entry.pw_gid;
+    return {};
+}
+
+// What the C library gives when it has memory.
+template <typename T>
+T *NotNull(T *p) {
+    if (p == nullptr) {
+        throw std::bad_alloc();
+    }
+    return p;
 }
 
 // What a record keeps of its group: the members as the store had them when they were read, or when
@@ -79,30 +75,30 @@ struct GotGroup {
     std::vector<std::string> members;
 };
 
-int FillGroup(const struct group &entry, ZELO_GROUP *pGroup) {
-    if (!SetText(pGroup->szName, entry.gr_name)) {
-        return HOST_FAIL(YLIBC_ERR_FILE);
+Status FillGroup(const struct group &entry, ZELO_GROUP &group) {
+    if (!SetText(group.szName, entry.gr_name)) {
+        return HOST_ERROR(YLIBC_ERR_FILE, std::string("the name of the group '") + entry.gr_name +
+                                              "' is too long for a record");
     }
-    pGroup->gid = entry.gr_gid;
-    const std::vector<char *> members = host::ListTexts(entry.gr_mem);
-    pGroup->pPort = new GotGroup{entry.gr_name, host::ListNames(entry.gr_mem)};
-    pGroup->ppszMembers = static_cast<char **>(std::calloc(members.size() + 1, sizeof(char *)));
-    if (pGroup->ppszMembers == nullptr) {
-        return HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
-    }
+    group.gid = entry.gr_gid;
+    const std::vector<std::string> members = host::ListNames(entry.gr_mem);
+    group.pPort = new GotGroup{entry.gr_name, members};
+    group.ppszMembers =
+        NotNull(static_cast<char **>(std::calloc(members.size() + 1, sizeof(char *))));
     for (std::size_t i = 0; i < members.size(); ++i) {
-        pGroup->ppszMembers[i] = strdup(members[i]);
-        if (pGroup->ppszMembers[i] == nullptr) {
-            return HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
-        }
+        group.ppszMembers[i] = NotNull(strdup(members[i].c_str()));
     }
-    return 0;
+    return {};
+}
+
+std::string_view NameIn(const ZELO_USER &user) {
+    return {user.szName, strnlen(user.szName, sizeof(user.szName))};
 }
 
 // Tells the caller, if asked to, what became of these users: all were changed or none.
-int Report(int result, int nUsers, const std::string &strFirst, YLIBCM_RESULT **ppResult) {
+void Report(int result, int nUsers, std::string_view first, YLIBCM_RESULT **ppResult) {
     if (ppResult == nullptr || *ppResult == nullptr) {
-        return result;
+        return;
     }
     YLIBCM_RESULT &record = **ppResult;
     record = {};
@@ -110,9 +106,8 @@ int Report(int result, int nUsers, const std::string &strFirst, YLIBCM_RESULT **
         record.nDone = nUsers;
     } else {
         record.nFailed = nUsers;
-        CopyToFit(record.szFailed, sizeof(record.szFailed), strFirst);
+        CopyToFit(record.szFailed, sizeof(record.szFailed), first);
     }
-    return result;
 }
 
 }  // namespace
@@ -120,28 +115,21 @@ int Report(int result, int nUsers, const std::string &strFirst, YLIBCM_RESULT **
 int ZELOUserAlloc(ZELO_USER **ppUser, const char *szName, const char *szPassword, uid_t uid,
                   gid_t gid, const char *szDescription, const char *szHome, const char *szShell,
                   int nExpireDay, int blEnabled, const void * /*pReserved*/) {
-    if (ppUser == nullptr) {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    *ppUser = nullptr;
-    if (szName == nullptr) {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    UserHandle pUser(new (std::nothrow) ZELO_USER());
-    if (pUser == nullptr) {
-        return HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
-    }
-    if (!SetText(pUser->szName, szName) || !SetText(pUser->szPassword, szPassword) ||
-        !SetText(pUser->szDescription, szDescription) || !SetText(pUser->szHome, szHome) ||
-        !SetText(pUser->szShell, szShell)) {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    pUser->uid = uid;
-    pUser->gid = gid;
-    pUser->nExpireDay = nExpireDay;
-    pUser->blEnabled = blEnabled;
-    *ppUser = pUser.release();
-    return 0;
+    return HOST_OPERATION([&]() -> Status {
+        HOST_REQUIRE(ppUser != nullptr);
+        *ppUser = nullptr;
+        HOST_REQUIRE(szName != nullptr);
+        UserHandle pUser(new ZELO_USER());
+        HOST_REQUIRE(SetText(pUser->szName, szName) && SetText(pUser->szPassword, szPassword));
+        HOST_REQUIRE(SetText(pUser->szDescription, szDescription));
+        HOST_REQUIRE(SetText(pUser->szHome, szHome) && SetText(pUser->szShell, szShell));
+        pUser->uid = uid;
+        pUser->gid = gid;
+        pUser->nExpireDay = nExpireDay;
+        pUser->blEnabled = blEnabled;
+        *ppUser = pUser.release();
+        return {};
+    });
 }
 
 void ZELOUserFree(ZELO_USER *pUser) {
@@ -164,11 +152,13 @@ void ZELOGroupFree(ZELO_GROUP *pGroup) {
 }
 
 YLIBCM_RESULT *YLIBCMResultAlloc() {
-    auto *const pResult = new (std::nothrow) YLIBCM_RESULT();
-    if (pResult == nullptr) {
-        HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
-    }
-    return pResult;
+    std::unique_ptr<YLIBCM_RESULT> pResult;
+    return HOST_OPERATION(decltype(pResult)(), pResult,
+                          [&] {
+                              pResult = std::make_unique<YLIBCM_RESULT>();
+                              return Status();
+                          })
+        .release();
 }
 
 void YLIBCMResultFree(YLIBCM_RESULT *pResult) {
@@ -178,184 +168,140 @@ void YLIBCMResultFree(YLIBCM_RESULT *pResult) {
 // --- Users --------------------------------------------------------------------------------------
 
 int ZELOUserGet(const char *szName, ZELO_USER **ppUser) {
-    if (ppUser == nullptr) {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    *ppUser = nullptr;
-    if (szName == nullptr) {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    return NoThrow([&] {
-        host::UserFiles files;
-        if (!files.Read()) {
-            return -1;
-        }
-        const struct passwd *const pEntry = files.passwd.Find(szName);
-        if (pEntry == nullptr) {
-            return HOST_FAIL(YLIBC_ERR_NOT_FOUND);
-        }
+    return HOST_OPERATION([&]() -> Status {
+        HOST_REQUIRE(ppUser != nullptr);
+        *ppUser = nullptr;
+        HOST_REQUIRE(szName != nullptr);
+        host::PasswdFile passwd;
+        host::ShadowFile shadow;
+        HOST_TRY(host::ReadAll(passwd, shadow));
+        const struct passwd *pEntry = nullptr;
+        HOST_TRY(passwd.Get(szName, pEntry));
         UserHandle pUser(new ZELO_USER());
-        if (FillUser(files, *pEntry, pUser.get()) != 0) {
-            return -1;
-        }
+        HOST_TRY(FillUser(*pEntry, *pUser));
+        const spwd *const pShadow = shadow.Find(szName);
+        pUser->nExpireDay = pShadow == nullptr ? -1 : static_cast<int>(pShadow->sp_expire);
+        pUser->blEnabled = host::LetsIn(host::StoredPassword(passwd, shadow, szName)) ? 1 : 0;
         *ppUser = pUser.release();
-        return 0;
+        return {};
     });
 }
 
 int ZELOUserSetOne(const char *szCurrentName, const ZELO_USER *pUser, YLIBCM_RESULT **ppResult) {
-    if (pUser == nullptr) {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    return NoThrow([&] {
-        const std::string strName(pUser->szName, strnlen(pUser->szName, sizeof(pUser->szName)));
-        const int result = host::StoreUser(szCurrentName, *pUser) ? 0 : -1;
-        return Report(result, 1, strName, ppResult);
+    const int result = HOST_OPERATION([&]() -> Status {
+        HOST_REQUIRE(pUser != nullptr);
+        return host::StoreUser(szCurrentName, *pUser);
     });
+    Report(result, 1, pUser == nullptr ? std::string_view() : NameIn(*pUser), ppResult);
+    return result;
 }
 
 int ZELOUserDelete(const char *const *ppszNames, int nNames, YLIBCM_RESULT **ppResult) {
-    if (ppszNames == nullptr || nNames < 0 ||
-        std::find(ppszNames, ppszNames + nNames, nullptr) != ppszNames + nNames) {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    return NoThrow([&] {
-        const std::vector<std::string> names(ppszNames, ppszNames + nNames);
-        const int result = host::DeleteUsers(names) ? 0 : -1;
-        return Report(result, nNames, nNames > 0 ? names.front() : "", ppResult);
+    const int result = HOST_OPERATION([&]() -> Status {
+        HOST_REQUIRE(ppszNames != nullptr && nNames >= 0);
+        HOST_REQUIRE(std::count(ppszNames, ppszNames + nNames, nullptr) == 0);
+        return host::DeleteUsers({ppszNames, ppszNames + nNames});
     });
+    const bool blNamed = ppszNames != nullptr && nNames > 0 && ppszNames[0] != nullptr;
+    Report(result, std::max(nNames, 0), blNamed ? ppszNames[0] : "", ppResult);
+    return result;
 }
 
 int YLIBUserNumRemained() {
-    return NoThrow([] {
+    int remaining = 0;
+    return HOST_OPERATION(-1, remaining, [&]() -> Status {
         host::PasswdFile passwd;
-        int remaining = 0;
-        return passwd.Read() && host::CountRemaining(passwd, remaining) ? remaining : -1;
+        HOST_TRY(passwd.Read());
+        return host::CountRemaining(passwd, remaining);
     });
 }
 
 int ZELOUserPreferenceDirGet(const char *szName, char *szPath, int cbPath) {
-    if (szName == nullptr || szPath == nullptr || cbPath <= 0) {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    return NoThrow([&] {
+    return HOST_OPERATION([&]() -> Status {
+        HOST_REQUIRE(szName != nullptr && szPath != nullptr && cbPath > 0);
+        const std::string strPath = host::PreferencePath(szName);
+        HOST_REQUIRE(!strPath.empty());
         host::PasswdFile passwd;
-        std::string strPath;
-        if (!host::PreferencePath(szName, strPath)) {
-            return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-        }
-        if (!passwd.Read()) {
-            return -1;
-        }
-        if (passwd.Find(szName) == nullptr) {
-            return HOST_FAIL(YLIBC_ERR_NOT_FOUND);
-        }
-        if (strPath.size() >= static_cast<std::size_t>(cbPath)) {
-            return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-        }
-        if (ZELOFSMkdirP(kPreferenceParent, 0, 0, 0, 0, kPreferenceParentMode) < 0 ||
-            ZELOFSMkdirP(strPath.c_str(), 0, 0, 0, 0, kPreferenceMode) < 0) {
-            return -1;
-        }
+        const struct passwd *pEntry = nullptr;
+        HOST_TRY(passwd.Read());
+        HOST_TRY(passwd.Get(szName, pEntry));
+        HOST_REQUIRE(strPath.size() < static_cast<std::size_t>(cbPath));
+        HOST_TRY(host::MakePrivateDirectory(strPath, {}));
         CopyToFit(szPath, cbPath, strPath);
-        return 0;
+        return {};
     });
 }
 
 // --- Groups -------------------------------------------------------------------------------------
 
 int ZELOGroupGet(const char *szName, ZELO_GROUP **ppGroup) {
-    if (ppGroup == nullptr) {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    *ppGroup = nullptr;
-    if (szName == nullptr) {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    return NoThrow([&] {
-        host::GroupFile file;
-        if (!file.Read()) {
-            return -1;
-        }
-        const struct group *const pEntry = file.Find(szName);
-        if (pEntry == nullptr) {
-            return HOST_FAIL(YLIBC_ERR_NOT_FOUND);
-        }
+    return HOST_OPERATION([&]() -> Status {
+        HOST_REQUIRE(ppGroup != nullptr);
+        *ppGroup = nullptr;
+        HOST_REQUIRE(szName != nullptr);
+        host::GroupFile groups;
+        HOST_TRY(groups.Read());
+        const struct group *pEntry = nullptr;
+        HOST_TRY(groups.Get(szName, pEntry));
         GroupHandle pGroup(new ZELO_GROUP());
-        if (FillGroup(*pEntry, pGroup.get()) != 0) {
-            return -1;
-        }
+        HOST_TRY(FillGroup(*pEntry, *pGroup));
         *ppGroup = pGroup.release();
-        return 0;
+        return {};
     });
 }
 
 int ZELOGroupSet(const char *szName, const ZELO_GROUP *pGroup) {
-    if (szName == nullptr || pGroup == nullptr) {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    char *pNobody = nullptr;
-    char **const ppszMembers = pGroup->ppszMembers == nullptr ? &pNobody : pGroup->ppszMembers;
-    for (char **ppsz = ppszMembers; *ppsz != nullptr; ++ppsz) {
-        if (**ppsz == '\0') {
-            return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
+    return HOST_OPERATION([&]() -> Status {
+        HOST_REQUIRE(szName != nullptr && pGroup != nullptr);
+        std::vector<std::string> members;
+        if (pGroup->ppszMembers != nullptr) {
+            members = host::ListNames(pGroup->ppszMembers);
         }
-    }
-    return NoThrow([&] {
-        std::vector<std::string> members = host::ListNames(ppszMembers);
+        HOST_REQUIRE(std::count(members.begin(), members.end(), "") == 0);
         auto *const pGot = static_cast<GotGroup *>(pGroup->pPort);
         const bool blSame = pGot != nullptr && pGot->strName == szName;
-        if (!host::StoreMembers(szName, blSame ? &pGot->members : nullptr, members)) {
-            return -1;
-        }
+        HOST_TRY(host::StoreMembers(szName, blSame ? &pGot->members : nullptr, members));
         if (blSame) {
             pGot->members.swap(members);
         }
-        return 0;
+        return {};
     });
 }
 
 int YLIBGroupIsAdminGroupMem(const char *szName, int /*flags*/) {
-    if (szName == nullptr) {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    return NoThrow([&] {
+    int isMember = 0;
+    return HOST_OPERATION(-1, isMember, [&]() -> Status {
+        HOST_REQUIRE(szName != nullptr);
         host::PasswdFile passwd;
         host::GroupFile groups;
-        if (!passwd.Read() || !groups.Read()) {
-            return -1;
-        }
+        HOST_TRY(host::ReadAll(passwd, groups));
         const struct passwd *const pUser = passwd.Find(szName);
         const struct group *const pGroup = groups.Find(kAdministrators);
-        if (pUser == nullptr || pGroup == nullptr) {
-            return 0;
+        if (pUser != nullptr && pGroup != nullptr) {
+            const std::vector<std::string> members = host::ListNames(pGroup->gr_mem);
+            const bool blListed = std::count(members.begin(), members.end(), szName) > 0;
+            isMember = blListed || pUser->pw_gid == pGroup->gr_gid ? 1 : 0;
         }
-        const std::vector<char *> members = host::ListTexts(pGroup->gr_mem);
-        const bool blListed = std::any_of(members.begin(), members.end(), [&](const char *sz) {
-            return std::strcmp(sz, szName) == 0;
-        });
-        return static_cast<int>(blListed || pUser->pw_gid == pGroup->gr_gid);
+        return {};
     });
 }
 
 int YLIBGroupExtraAdminSet(const char *szName, int n1, int n2, int n3, int n4) {
-    if (szName == nullptr || *szName == '\0') {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    return NoThrow([&] {
+    return HOST_OPERATION([&]() -> Status {
+        HOST_REQUIRE(szName != nullptr && *szName != '\0');
         const std::string strKey = kExtraAdminKey + std::string(szName);
-        std::optional<std::string> before;
-        const bool blClear = n1 == 0 && n2 == 0 && n3 == 0 && n4 == 0;
-        const bool blRead = !host::LookUpKey(host::kConfigFile, strKey.c_str(), before).Failed();
-        if (blClear && blRead && before.value_or("").empty()) {
-            return 0;
-        }
-        std::string strValue;
-        if (!blClear) {
-            for (const int n : {n1, n2, n3, n4}) {
-                strValue += (strValue.empty() ? "" : " ") + std::to_string(n);
+        if (n1 == 0 && n2 == 0 && n3 == 0 && n4 == 0) {
+            std::optional<std::string> before;
+            Status read = host::LookUpKey(host::kConfigFile, strKey.c_str(), before);
+            if (read.Failed() && read.Code() != YLIBC_ERR_NOT_FOUND) {
+                return read;
             }
+            return before.value_or("").empty() ? Status() : host::SetSetting(strKey.c_str(), "");
         }
-        return YLIBCINFOSetKeyValue(strKey.c_str(), strValue.c_str());
+        std::string strValue = std::to_string(n1);
+        for (const int n : {n2, n3, n4}) {
+            strValue += ' ' + std::to_string(n);
+        }
+        return host::SetSetting(strKey.c_str(), strValue.c_str());
     });
 }

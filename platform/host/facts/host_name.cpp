@@ -4,29 +4,23 @@
 
 #include <unistd.h>
 
+#include <cerrno>
 #include <climits>
-#include <new>
+#include <cstring>
 
 #include "fixed_text.h"
 #include "status.h"
 
-namespace {
-
-constexpr const char *kFile = "host_name";
-
-}  // namespace
-
 int ZELOLnxGetHostname(char *szHostName) {
-    if (szHostName == nullptr) {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    char szWhole[HOST_NAME_MAX + 1] = {};
-    if (gethostname(szWhole, sizeof(szWhole)) != 0) {
-        return HOST_FAIL(YLIBC_ERR_NOT_FOUND);
-    }
-    try {
-        return CopyToFit(szHostName, ZELO_LNX_HOSTNAME_SIZE, szWhole);
-    } catch (const std::bad_alloc &) {
-        return HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
-    }
+    int cb = 0;
+    return HOST_OPERATION(-1, cb, [&]() -> host::Status {
+        HOST_REQUIRE(szHostName != nullptr);
+        char szWhole[HOST_NAME_MAX + 1] = {};
+        if (gethostname(szWhole, sizeof(szWhole)) != 0) {
+            return HOST_ERROR(YLIBC_ERR_NOT_FOUND,
+                              std::string("the system has no host name: ") + std::strerror(errno));
+        }
+        cb = CopyToFit(szHostName, ZELO_LNX_HOSTNAME_SIZE, szWhole);
+        return {};
+    });
 }

@@ -7,13 +7,14 @@
 #include <unistd.h>
 
 #include <algorithm>
-#include <cerrno>
-#include <cstdlib>
+#include <charconv>
 #include <filesystem>
 #include <limits>
 #include <optional>
 #include <string>
+#include <system_error>
 
+#include "descriptor.h"
 #include "files/key_value_lookup.h"
 #include "status.h"
 
@@ -27,31 +28,21 @@ constexpr const char *kDisks = "/sys/block";
 constexpr unsigned long kMsPerMinute = 60'000;
 
 bool ReadNumber(const std::string &strText, unsigned long &number) {
-    char *szEnd = nullptr;
-    errno = 0;
-    number = std::strtoul(strText.c_str(), &szEnd, 10);
-    return !strText.empty() && strText[0] >= '0' && strText[0] <= '9' && *szEnd == '\0' &&
-           errno == 0;
+    const char *const pEnd = strText.data() + strText.size();
+    const auto parsed = std::from_chars(strText.data(), pEnd, number);
+    return parsed.ec == std::errc() && parsed.ptr == pEnd;
 }
 
 bool WriteAttribute(const fs::path &path, const std::string &strText) {
-    const int fd = open(path.c_str(), O_WRONLY | O_CLOEXEC);
-    const bool blWritten = fd >= 0 && write(fd, strText.data(), strText.size()) ==
-                                          static_cast<ssize_t>(strText.size());
-    if (fd >= 0) {
-        close(fd);
-    }
-    return blWritten;
+    const Descriptor file(open(path.c_str(), O_WRONLY | O_CLOEXEC));
+    return write(file.Get(), strText.data(), strText.size()) ==
+           static_cast<ssize_t>(strText.size());
 }
 
 bool Spins(const fs::path &disk) {
-    const int fd = open((disk / "queue/rotational").c_str(), O_RDONLY | O_CLOEXEC);
+    const Descriptor file(open((disk / "queue/rotational").c_str(), O_RDONLY | O_CLOEXEC));
     char c = '0';
-    const bool blRead = fd >= 0 && read(fd, &c, 1) == 1;
-    if (fd >= 0) {
-        close(fd);
-    }
-    return blRead && c == '1';
+    return read(file.Get(), &c, 1) == 1 && c == '1';
 }
 
 void ApplyTo(const fs::path &disk, unsigned long idleTime) {

@@ -4,8 +4,8 @@
 #include "serial_number.h"
 
 #include <cerrno>
+#include <cstring>
 #include <fstream>
-#include <new>
 #include <string>
 
 #include "fixed_text.h"
@@ -13,48 +13,44 @@
 
 namespace {
 
-constexpr const char *kFile = "serial_number";
 constexpr const char *kFlashFile = "/etc.defaults/serial_number";
 constexpr const char *kCustomFile = "/etc/custom_serial_number";
 
-// False when it cannot be read; a file without a line has the empty one.
-bool ReadFirstLine(std::ifstream &file, std::string &strLine) {
+// The first line; a file that is not there, or without a line, has the empty one.
+host::Status ReadFirstLine(const char *szPath, std::string &strLine) {
+    errno = 0;
+    std::ifstream file(szPath);
+    const bool blMissing = !file && errno == ENOENT;
     std::getline(file, strLine);
+    if (!blMissing && (!file.is_open() || file.bad())) {
+        return HOST_ERROR(YLIBC_ERR_FILE,
+                          std::string("cannot read '") + szPath + "': " + std::strerror(errno));
+    }
     strLine.erase(strLine.find_last_not_of(" \t\r") + 1);  // npos + 1 is 0
-    return !file.bad();
+    return {};
+}
+
+int GetSerial(const char *szPath, bool blRequired, char *szSerial, int cbSerial) {
+    int cb = 0;
+    return HOST_OPERATION(-1, cb, [&]() -> host::Status {
+        HOST_REQUIRE(szSerial != nullptr && cbSerial > 0);
+        std::string strSerial;
+        HOST_TRY(ReadFirstLine(szPath, strSerial));
+        if (blRequired && strSerial.empty()) {
+            return HOST_ERROR(YLIBC_ERR_NOT_FOUND,
+                              std::string("there is no serial number in '") + szPath + '\'');
+        }
+        cb = CopyToFit(szSerial, cbSerial, strSerial);
+        return {};
+    });
 }
 
 }  // namespace
 
 int YLIBGetCustomSerialNumber(char *szSerial, int cbSerial) {
-    if (szSerial == nullptr || cbSerial <= 0) {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    try {
-        errno = 0;
-        std::ifstream file(kCustomFile);
-        std::string strSerial;
-        if (file ? !ReadFirstLine(file, strSerial) : errno != ENOENT) {
-            return HOST_FAIL(YLIBC_ERR_FILE);
-        }
-        return CopyToFit(szSerial, cbSerial, strSerial);
-    } catch (const std::bad_alloc &) {
-        return HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
-    }
+    return GetSerial(kCustomFile, false, szSerial, cbSerial);
 }
 
 int YLIBGetSerialNumber(char *szSerial, int cbSerial) {
-    if (szSerial == nullptr || cbSerial <= 0) {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    try {
-        std::ifstream file(kFlashFile);
-        std::string strSerial;
-        if (!file || !ReadFirstLine(file, strSerial) || strSerial.empty()) {
-            return HOST_FAIL(YLIBC_ERR_NOT_FOUND);
-        }
-        return CopyToFit(szSerial, cbSerial, strSerial);
-    } catch (const std::bad_alloc &) {
-        return HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
-    }
+    return GetSerial(kFlashFile, true, szSerial, cbSerial);
 }

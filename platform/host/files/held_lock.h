@@ -23,9 +23,8 @@ class HeldLock {
     HeldLock(const HeldLock &) = delete;
     HeldLock &operator=(const HeldLock &) = delete;
 
-    Status Take(const char *szPath) {
-        constexpr int kTimeout_s = 30;
-        return TakeLock(szPath, kTimeout_s, m_handle);
+    Status Take(const char *szPath, int timeout_s = 30) {
+        return TakeLock(szPath, timeout_s, m_handle);
     }
 
   private:

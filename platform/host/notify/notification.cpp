@@ -2,24 +2,33 @@
 
 #include "notification.h"
 
+#include <syslog.h>
+
 #include <algorithm>
-#include <exception>
+#include <chrono>
+#include <cstring>
+#include <new>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include "files/key_value_lookup.h"
-#include "notification_hooks.h"
+#include "fixed_text.h"
 #include "notification_journal.h"
-#include "notification_record.h"
-#include "status.h"
-#include "strings_file.h"
+#include "programs/program_folder.h"
+#include "strings/strings_lookup.h"
+#include "system_log.h"
 
 namespace {
 
-constexpr const char *kFile = "notification";
-constexpr const char *kSection = "notification";
+using host::Notification;
+
 constexpr const char *kEnglish = "enu";
 constexpr int kMaxText = 4096;
+constexpr const char *kHooks = "/usr/zelo/etc/notify.d";
+constexpr std::chrono::seconds kHookLimit(10);
+
+// --- Texts --------------------------------------------------------------------------------------
 
 // A language names a folder, so it is a code and nothing else.
 std::string Language() {
@@ -32,18 +41,17 @@ std::string Language() {
 
 bool ReadText(const std::string &strLanguage, const std::string &strKey, std::string &strText) {
     const std::string strPath = "/usr/zelo/zeloman/webman/texts/" + strLanguage + "/strings";
-    std::string strBuffer(kMaxText, '\0');
-    const int cb = YLIBCFileGetSectionValue(strPath.c_str(), kSection, strKey.c_str(),
-                                            strBuffer.data(), kMaxText);
-    if (cb < 0) {
+    FixedText<kMaxText> fitting;
+    if (host::ReadSectionValue(strPath, "notification", strKey, strText).Failed()) {
         return false;
     }
-    strText = strBuffer.substr(0, static_cast<std::size_t>(cb));
+    CopyToFit(fitting.Buffer(), kMaxText, strText);
+    strText = fitting.sz();
     return true;
 }
 
 // Title and text of the tag, both in one language.
-void ReadTexts(host::Notification &notification) {
+void ReadTexts(Notification &notification) {
     for (const std::string &strLanguage : {Language(), std::string(kEnglish)}) {
         if (ReadText(strLanguage, notification.strTag + "_title", notification.strTitle) &&
             ReadText(strLanguage, notification.strTag + "_text", notification.strText)) {
@@ -55,7 +63,7 @@ void ReadTexts(host::Notification &notification) {
 }
 
 // Puts values in place of the variables' names, and does not look at a value again.
-std::string FillIn(std::string_view text, const host::Notification &notification) {
+std::string FillIn(std::string_view text, const Notification &notification) {
     std::string strFilled;
     while (!text.empty()) {
         const auto variable = std::find_if(
@@ -69,8 +77,8 @@ std::string FillIn(std::string_view text, const host::Notification &notification
     return strFilled;
 }
 
-host::Notification Compose(const char *szTag, const YLIBSZHASH *pHash) {
-    host::Notification notification;
+Notification Compose(const char *szTag, const YLIBSZHASH *pHash) {
+    Notification notification;
     notification.strTag = szTag;
     for (int i = 0; pHash != nullptr && i < pHash->nItem; ++i) {
         notification.variables.emplace_back(YLIBCSzHashKeyAt(pHash, i),
@@ -82,23 +90,58 @@ host::Notification Compose(const char *szTag, const YLIBSZHASH *pHash) {
     return notification;
 }
 
+// --- Hooks --------------------------------------------------------------------------------------
+
+// "%QRM_SERVER%" as "QRM_SERVER": what is no letter, digit or underscore becomes an underscore.
+std::string VariableName(const std::string &strName) {
+    std::string strPlain = strName;
+    if (strPlain.size() > 2 && strPlain.front() == '%' && strPlain.back() == '%') {
+        strPlain = strPlain.substr(1, strPlain.size() - 2);
+    }
+    constexpr const char *kAllowed =
+        "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789_";
+    for (char &c : strPlain) {
+        c = std::strchr(kAllowed, c) != nullptr ? c : '_';
+    }
+    return strPlain;
+}
+
+std::vector<std::string> Environment(const Notification &notification) {
+    std::vector<std::string> environment = {
+        "ZELO_NOTIFY_TAG=" + notification.strTag,
+        "ZELO_NOTIFY_TITLE=" + notification.strTitle,
+        "ZELO_NOTIFY_TEXT=" + notification.strText,
+    };
+    for (const auto &[strName, strValue] : notification.variables) {
+        environment.push_back("ZELO_NOTIFY_VAR_" + VariableName(strName) + '=' + strValue);
+    }
+    return environment;
+}
+
+// Hooks are executables that an integrator puts into the folder to pass notifications on. What
+// becomes of them does not count, so short memory ends here.
+void RunHooks(const Notification &notification) {
+    try {
+        int status = 0;
+        host::RunProgramFolder(
+            kHooks,
+            {"notification hook", notification.strTag, Environment(notification), kHookLimit},
+            status)
+            .Log();
+    } catch (const std::bad_alloc &) {
+        system_log::Write(LOG_ERR, ZELO_SOURCE_STEM, __LINE__,
+                          "out of memory: not all notification hooks were run");
+    }
+}
+
 }  // namespace
 
 int ZELOSysNotifySendNotifiction(const char *szTag, YLIBSZHASH **ppHash) {
-    if (szTag == nullptr || *szTag == '\0') {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    try {
-        // Texts may be looked for in two places, and what becomes of the hooks does not count.
-        const host::LastError before;
-        const host::Notification notification =
-            Compose(szTag, ppHash == nullptr ? nullptr : *ppHash);
-        const int result = host::AppendToJournal(notification);
-        const host::LastError ofJournal;
-        host::RunHooks(notification);
-        (result == 0 ? before : ofJournal).Restore();
-        return result;
-    } catch (const std::exception &) {
-        return HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
-    }
+    return HOST_OPERATION([&]() -> host::Status {
+        HOST_REQUIRE(szTag != nullptr && *szTag != '\0');
+        const Notification notification = Compose(szTag, ppHash == nullptr ? nullptr : *ppHash);
+        host::Status written = host::AppendToJournal(notification);
+        RunHooks(notification);
+        return written;
+    });
 }

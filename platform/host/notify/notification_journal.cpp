@@ -2,45 +2,45 @@
 
 #include "notification_journal.h"
 
-#include <fcntl.h>
 #include <json/value.h>
 #include <sys/file.h>
-#include <sys/stat.h>
 #include <syslog.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
+#include <chrono>
 #include <cstdio>
 #include <cstring>
 #include <ctime>
 #include <mutex>
-#include <string>
-#include <utility>
+#include <thread>
 
+#include "deadline.h"
 #include "descriptor.h"
+#include "files/shared_folder.h"
 #include "fork_safe.h"
 #include "json.h"
-#include "status.h"
-#include "wait.h"
+#include "own_file.h"
 
 namespace {
 
-constexpr const char *kFile = "notification_journal";
+using host::Status;
+using host::Wait;
+
 constexpr const char *kJournal = "/var/log/notifications.jsonl";
 constexpr const char *kFormerJournal = "/var/log/notifications.jsonl.1";
 
 constexpr off_t kMaxJournal = off_t{1024} * 1024;
 
 // A writer holds the journal for as long as one line takes.
-constexpr int kLockTries = 500;
-constexpr timespec kLockPause = {0, 10'000'000};
+constexpr std::chrono::seconds kLockLimit(5);
+constexpr std::chrono::milliseconds kLockPause(10);
 
-int FailWith(unsigned int code, const char *szReason, int line) {
-    syslog(LOG_ERR, "%s:%d cannot write to the journal '%s': %s", kFile, line, kJournal, szReason);
-    return host::Fail(code, kFile, line);
+Status Failure(int error) {
+    return HOST_ERROR(YLIBC_ERR_FILE, std::string("cannot write to the journal '") + kJournal +
+                                          "': " + std::strerror(error));
 }
-
-#define JOURNAL_FAIL(code, szReason) FailWith(code, szReason, __LINE__)
 
 // The journal, held against other writers. A fork in another thread copies the descriptor, so
 // closing it would not let go.
@@ -51,22 +51,18 @@ class HeldJournal {
     HeldJournal &operator=(const HeldJournal &) = delete;
     ~HeldJournal() { LetGo(); }
 
-    // Opens the file that is the journal now, and holds it. Returns 0 or -1, with a log line.
-    int Take() {
+    // Opens the file that is the journal now, and holds it. A new one may have begun while the
+    // former was waited for.
+    Status Take() {
         do {
             LetGo();
-            m_file = Descriptor(open(
-                kJournal, O_RDWR | O_APPEND | O_CREAT | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC, 0640));
-            if (!m_file.IsOpen()) {
-                return errno == ELOOP    ? JOURNAL_FAIL(YLIBC_ERR_UNSAFE_FILE, "it is a link")
-                       : errno == EISDIR ? JOURNAL_FAIL(YLIBC_ERR_UNSAFE_FILE, "it is a folder")
-                                         : JOURNAL_FAIL(YLIBC_ERR_FILE, std::strerror(errno));
+            HOST_TRY(Open());
+            HOST_TRY(Hold());
+            if (fstat(m_file.Get(), &m_status) != 0) {
+                return Failure(errno);
             }
-            if (Hold() < 0) {
-                return -1;
-            }
-        } while (!IsInPlace());
-        return 0;
+        } while (!own_file::IsNamed(kJournal, m_status));
+        return {};
     }
 
     int Fd() const { return m_file.Get(); }
@@ -79,29 +75,30 @@ class HeldJournal {
         }
     }
 
-    int Hold() {
-        const host::Waiting waiting({"waiting for the journal '", kJournal, "'"});
-        int tries = 0;
-        while (flock(m_file.Get(), LOCK_EX | LOCK_NB) != 0) {
-            if (errno != EWOULDBLOCK && errno != EINTR) {
-                return JOURNAL_FAIL(YLIBC_ERR_FILE, std::strerror(errno));
-            }
-            if (++tries == kLockTries) {
-                return JOURNAL_FAIL(YLIBC_ERR_BUSY, "another process holds it");
-            }
-            nanosleep(&kLockPause, nullptr);
+    Status Open() {
+        m_file = Descriptor(open(kJournal, O_RDWR | O_APPEND | O_CREAT | own_file::kFlags, 0640));
+        const int error = errno;
+        const bool blThere =
+            (m_file.IsOpen() ? fstat(m_file.Get(), &m_status) : lstat(kJournal, &m_status)) == 0;
+        if (blThere && !own_file::IsOwn(m_status)) {
+            return host::Refusal(kJournal, m_status);
         }
-        if (fstat(m_file.Get(), &m_status) != 0 || !S_ISREG(m_status.st_mode)) {
-            return JOURNAL_FAIL(YLIBC_ERR_UNSAFE_FILE, "it is no regular file");
-        }
-        return 0;
+        return m_file.IsOpen() ? Status() : Failure(error);
     }
 
-    // A new journal may have begun while this one was waited for.
-    bool IsInPlace() const {
-        struct stat there = {};
-        return stat(kJournal, &there) == 0 && there.st_ino == m_status.st_ino &&
-               there.st_dev == m_status.st_dev;
+    Status Hold() {
+        Wait wait(std::string("the journal '") + kJournal + '\'', kLockLimit);
+        while (flock(m_file.Get(), LOCK_EX | LOCK_NB) != 0) {
+            if (errno != EWOULDBLOCK && errno != EINTR) {
+                return Failure(errno);
+            }
+            const Wait::Clock::duration slice = wait.Slice();
+            if (slice <= Wait::Clock::duration::zero()) {
+                return wait.TimeUp(YLIBC_ERR_BUSY);
+            }
+            std::this_thread::sleep_for(std::min<Wait::Clock::duration>(slice, kLockPause));
+        }
+        return {};
     }
 
     Descriptor m_file;
@@ -148,33 +145,31 @@ bool EndsInsideALine(const HeldJournal &journal) {
            last != '\n';
 }
 
-}  // namespace
-
-int host::AppendToJournal(const Notification &notification) {
-    std::string strLine = Line(notification);
+Status Append(std::string strLine) {
     HeldJournal journal;
-    if (journal.Take() < 0) {
-        return -1;
-    }
+    HOST_TRY(journal.Take());
     const auto cbLine = static_cast<off_t>(strLine.size());
     if (journal.Size() > 0 && journal.Size() + cbLine > kMaxJournal) {
         if (std::rename(kJournal, kFormerJournal) != 0) {
-            return JOURNAL_FAIL(YLIBC_ERR_FILE, std::strerror(errno));
+            return Failure(errno);
         }
-        if (journal.Take() < 0) {
-            return -1;
-        }
+        HOST_TRY(journal.Take());
     }
     if (EndsInsideALine(journal)) {
         strLine.insert(0, 1, '\n');
     }
     const ssize_t cb = write(journal.Fd(), strLine.data(), strLine.size());
     if (cb == static_cast<ssize_t>(strLine.size())) {
-        return 0;
+        return {};
     }
-    const int error = cb < 0 ? errno : ENOSPC;
-    if (cb > 0 && ftruncate(journal.Fd(), journal.Size()) != 0) {
-        syslog(LOG_ERR, "%s:%d half a line stays in '%s'", kFile, __LINE__, kJournal);
-    }
-    return JOURNAL_FAIL(YLIBC_ERR_FILE, std::strerror(error));
+    Status failure = Failure(cb < 0 ? errno : ENOSPC);
+    const bool blHalfStays = cb > 0 && ftruncate(journal.Fd(), journal.Size()) != 0;
+    return blHalfStays ? HOST_ERROR(YLIBC_ERR_FILE, failure.Words() + "; half a line stays in it")
+                       : failure;
+}
+
+}  // namespace
+
+Status host::AppendToJournal(const Notification &notification) {
+    return Append(Line(notification)).Logged(LOG_ERR);
 }

@@ -6,13 +6,23 @@
 #ifndef ZELO_HOST_NOTIFICATION_JOURNAL_H
 #define ZELO_HOST_NOTIFICATION_JOURNAL_H
 
-#include "notification_record.h"
+#include <string>
+#include <utility>
+#include <vector>
+
+#include "status.h"
 
 namespace host {
 
-// Appends the notification, with the present time. Returns 0, or -1 with the last error set and a
-// log line.
-int AppendToJournal(const Notification &notification);
+struct Notification {
+    std::string strTag;
+    std::string strTitle;
+    std::string strText;
+    std::vector<std::pair<std::string, std::string>> variables;  // names as in "%QRM_SERVER%"
+};
+
+// Appends the notification, with the present time.
+Status AppendToJournal(const Notification &notification);
 
 }  // namespace host
 

@@ -5,7 +5,6 @@
 #include <algorithm>
 #include <chrono>
 #include <map>
-#include <new>
 #include <string>
 #include <string_view>
 #include <utility>
@@ -23,26 +22,10 @@ struct YLIBPLUGIN {
 
 namespace {
 
-constexpr const char *kFile = "plugin_sdk";
 constexpr const char *kRoot = "/usr/zelo/etc/plugins/";
 
 constexpr const char *kLimitKey = "plugin_timeout";
 constexpr std::chrono::seconds kDefaultLimit(60);
-
-// What a program's end counts as when it has no status of its own: the numbers that shells use.
-constexpr int kTimedOutStatus = 124;
-constexpr int kNotRunStatus = 126;
-constexpr int kSignalledBase = 128;
-
-// The operations have C linkage: short memory becomes a failure here.
-template <typename Body>
-int NoThrow(Body &&body) {
-    try {
-        return std::forward<Body>(body)();
-    } catch (const std::bad_alloc &) {
-        return HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
-    }
-}
 
 // --- Names --------------------------------------------------------------------------------------
 
@@ -92,55 +75,25 @@ std::vector<std::string> EnvironmentOf(const YLIBPLUGIN &plugin) {
     return environment;
 }
 
-int StatusOf(const host::ProgramEnd &end) {
-    switch (end.kind) {
-        case host::ProgramEnd::Kind::kExited:
-            return end.value;
-        case host::ProgramEnd::Kind::kSignalled:
-            return kSignalledBase + end.value;
-        case host::ProgramEnd::Kind::kTimedOut:
-            return kTimedOutStatus;
-        default:
-            return kNotRunStatus;
-    }
-}
-
-// The first failure is the result.
-int RunAll(const YLIBPLUGIN &plugin, const char *szAction) {
-    host::ProgramEnd first;
-    if (!host::RunProgramFolder(plugin.strFolder,
-                                {"plug-in program", szAction, EnvironmentOf(plugin),
-                                 host::TimeLimit(kLimitKey, kDefaultLimit)},
-                                first)) {
-        return -1;
-    }
-    const int status = StatusOf(first);
-    if (status != 0) {
-        HOST_FAIL(host::LastErrorOf(first));
-    }
-    return -status;
+const char *NameOf(_tag_sdk_plugin_action_ action) {
+    return action == SDK_PLUGIN_ACTION_PRE    ? "pre"
+           : action == SDK_PLUGIN_ACTION_POST ? "post"
+                                              : nullptr;
 }
 
 }  // namespace
 
 int YLIBPluginSDKInit(const char *szFamily, const char *szPlugin, YLIBPLUGIN **ppHandle) {
-    if (ppHandle == nullptr) {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    *ppHandle = nullptr;
-    if (szFamily == nullptr || szPlugin == nullptr || !IsFamily(szFamily) ||
-        !IsPluginName(szPlugin)) {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    return NoThrow([&] {
-        YLIBPLUGIN plugin;
-        plugin.strFolder = std::string(kRoot) + szPlugin;
-        plugin.strPrefix = PrefixOf(szFamily);
-        if (host::CheckProgramFolder(plugin.strFolder) == host::ProgramFolder::kRefused) {
-            return -1;
-        }
+    return HOST_OPERATION([&]() -> host::Status {
+        HOST_REQUIRE(ppHandle != nullptr);
+        *ppHandle = nullptr;
+        HOST_REQUIRE(szFamily != nullptr && IsFamily(szFamily));
+        HOST_REQUIRE(szPlugin != nullptr && IsPluginName(szPlugin));
+        YLIBPLUGIN plugin = {std::string(kRoot) + szPlugin, PrefixOf(szFamily), {}};
+        bool blThere = false;
+        HOST_TRY(host::CheckProgramFolder(plugin.strFolder, blThere));
         *ppHandle = new YLIBPLUGIN(std::move(plugin));
-        return 0;
+        return {};
     });
 }
 
@@ -149,32 +102,30 @@ int YLIBPluginHasInit(const YLIBPLUGIN *pHandle) {
 }
 
 int YLIBPluginSetArgByInt(YLIBPLUGIN *pHandle, const char *szName, int value) {
-    return NoThrow(
-        [&] { return YLIBPluginSetArg(pHandle, szName, std::to_string(value).c_str()); });
+    return YLIBPluginSetArg(pHandle, szName, std::to_string(value).c_str());
 }
 
 int YLIBPluginSetArg(YLIBPLUGIN *pHandle, const char *szName, const char *szValue) {
-    if (pHandle == nullptr || szName == nullptr || !IsWord(szName) || szValue == nullptr) {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    return NoThrow([&] {
+    return HOST_OPERATION([&]() -> host::Status {
+        HOST_REQUIRE(pHandle != nullptr && szValue != nullptr);
+        HOST_REQUIRE(szName != nullptr && IsWord(szName));
         pHandle->arguments.insert_or_assign(szName, std::string(szValue));
-        return 0;
+        return {};
     });
 }
 
 int YLIBPluginAction(_tag_sdk_plugin_action_ action, YLIBPLUGIN *pHandle) {
-    if (pHandle == nullptr) {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    switch (action) {
-        case SDK_PLUGIN_ACTION_PRE:
-            return NoThrow([&] { return RunAll(*pHandle, "pre"); });
-        case SDK_PLUGIN_ACTION_POST:
-            return NoThrow([&] { return RunAll(*pHandle, "post"); });
-        default:
-            return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
+    int status = 1;  // of what is no program's failure
+    const int result = HOST_OPERATION([&]() -> host::Status {
+        HOST_REQUIRE(pHandle != nullptr);
+        const char *const szAction = NameOf(action);
+        HOST_REQUIRE(szAction != nullptr);
+        return host::RunProgramFolder(pHandle->strFolder,
+                                      {"plug-in program", szAction, EnvironmentOf(*pHandle),
+                                       host::TimeLimit(kLimitKey, kDefaultLimit)},
+                                      status);
+    });
+    return result == 0 ? 0 : -status;
 }
 
 int YLIBPluginExit(YLIBPLUGIN *pHandle) {

@@ -9,29 +9,26 @@
 #include <cerrno>
 #include <chrono>
 #include <csignal>
-#include <new>
 #include <string>
 #include <vector>
 
 #include "files/time_limit.h"
 #include "program.h"
+#include "program_folder.h"
 #include "status.h"
 
 namespace {
 
-constexpr const char *kFile = "process";
 constexpr const char *kLimitKey = "exec_timeout";
 constexpr std::chrono::seconds kDefaultLimit(60);
-constexpr int kSignalledBase = 128;
 
 }  // namespace
 
 int YLIBCExec(const char *szProgram, const char *szArgument1, const char *szArgument2,
               const char *szArgument3, const char *szArgument4) {
-    if (szProgram == nullptr) {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    try {
+    int status = 0;
+    return HOST_OPERATION(-1, status, [&]() -> host::Status {
+        HOST_REQUIRE(szProgram != nullptr);
         std::vector<std::string> arguments = {szProgram};
         for (const char *szArgument : {szArgument1, szArgument2, szArgument3, szArgument4}) {
             if (szArgument == nullptr) {
@@ -39,21 +36,9 @@ int YLIBCExec(const char *szProgram, const char *szArgument1, const char *szArgu
             }
             arguments.emplace_back(szArgument);
         }
-        const host::ProgramEnd end =
-            host::RunProgram(arguments, {}, host::TimeLimit(kLimitKey, kDefaultLimit));
-        switch (end.kind) {
-            case host::ProgramEnd::Kind::kExited:
-                return end.value;
-            case host::ProgramEnd::Kind::kSignalled:
-                return kSignalledBase + end.value;
-            case host::ProgramEnd::Kind::kTimedOut:
-                return HOST_FAIL(YLIBC_ERR_EXEC_TIME);
-            default:
-                return HOST_FAIL(YLIBC_ERR_EXEC);
-        }
-    } catch (const std::bad_alloc &) {
-        return HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
-    }
+        HOST_TRY(host::CheckProgram(szProgram));
+        return host::RunProgram(arguments, {}, host::TimeLimit(kLimitKey, kDefaultLimit), status);
+    });
 }
 
 int YLIBCProcAlive(int pid) {

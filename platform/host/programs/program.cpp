@@ -4,8 +4,8 @@
 // takes away what is known of the end of its children. So a child process, the warden, starts the
 // program, waits for it and ends it when its time is over. The warden has no exit signal: its own
 // end sends no SIGCHLD, an ignored SIGCHLD does not lose it, and a wait for any child passes it
-// over. What it saw of the program stands in a page that it shares with the caller, which may ask
-// it there to end the program at once.
+// over. What it saw of the program stands in a page that it shares with the caller, which asks it
+// there to end the program when the process's deadline comes.
 //
 // The warden is a copy of a process that may have other threads, and their locks stay locked in the
 // copy for ever: it calls only functions that take no lock, and everything that needs memory is
@@ -14,57 +14,37 @@
 #include "program.h"
 
 #include <fcntl.h>
+#include <linux/futex.h>
 #include <pthread.h>
-#include <spawn.h>
 #include <sys/mman.h>
 #include <sys/syscall.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <algorithm>
-#include <array>
 #include <atomic>
 #include <cerrno>
 #include <csignal>
+#include <cstdint>
+#include <cstring>
 #include <ctime>
 #include <memory>
 #include <new>
 #include <string_view>
 
-#include "wait.h"
-#include "waiting.h"
+#include "deadline.h"
 
 namespace {
 
-using host::ProgramEnd;
-using Clock = std::chrono::steady_clock;
+using Clock = host::Wait::Clock;
+
+constexpr int kTimedOutStatus = 124;
+constexpr int kNotRunStatus = 126;
+constexpr int kSignalledBase = 128;
 
 // How long a killed program may take to disappear. One that hangs inside the kernel takes longer;
 // it is left to end by itself.
 constexpr std::chrono::seconds kLongestDying(2);
-
-// The functions that prepare a start fail for want of memory only.
-void Prepared(int error) {
-    if (error != 0) {
-        throw std::bad_alloc();
-    }
-}
-
-struct Attributes {
-    posix_spawnattr_t value = {};
-    Attributes() { Prepared(posix_spawnattr_init(&value)); }
-    Attributes(const Attributes &) = delete;
-    Attributes &operator=(const Attributes &) = delete;
-    ~Attributes() { posix_spawnattr_destroy(&value); }
-};
-
-struct FileActions {
-    posix_spawn_file_actions_t value = {};
-    FileActions() { Prepared(posix_spawn_file_actions_init(&value)); }
-    FileActions(const FileActions &) = delete;
-    FileActions &operator=(const FileActions &) = delete;
-    ~FileActions() { posix_spawn_file_actions_destroy(&value); }
-};
 
 std::string_view NameOf(std::string_view variable) {
     return variable.substr(0, variable.find('='));
@@ -95,46 +75,21 @@ std::vector<char *> Environment(const std::vector<std::string> &added) {
     return variables;
 }
 
-// Everything that starting a program takes, ready to be used without memory or locks.
-class Start {
-  public:
-    Start(const std::vector<std::string> &arguments, const std::vector<std::string> &environment)
-        : m_arguments(Pointers(arguments)), m_environment(Environment(environment)) {
-        sigset_t all;
-        sigfillset(&all);
-        sigset_t none;
-        sigemptyset(&none);
-        posix_spawnattr_setsigdefault(&m_attributes.value, &all);
-        posix_spawnattr_setsigmask(&m_attributes.value, &none);
-        posix_spawnattr_setpgroup(&m_attributes.value, 0);
-        posix_spawnattr_setflags(&m_attributes.value, POSIX_SPAWN_SETSIGDEF |
-                                                          POSIX_SPAWN_SETSIGMASK |
-                                                          POSIX_SPAWN_SETPGROUP);
-        for (const int fd : {STDIN_FILENO, STDOUT_FILENO, STDERR_FILENO}) {
-            Prepared(posix_spawn_file_actions_addopen(&m_actions.value, fd, "/dev/null",
-                                                      fd == STDIN_FILENO ? O_RDONLY : O_WRONLY, 0));
-        }
-    }
-
-    // Returns 0 or an errno.
-    int operator()(pid_t &pid) const {
-        return posix_spawn(&pid, m_arguments[0], &m_actions.value, &m_attributes.value,
-                           m_arguments.data(), m_environment.data());
-    }
-
-  private:
-    std::vector<char *> m_arguments;
-    std::vector<char *> m_environment;
-    Attributes m_attributes;
-    FileActions m_actions;
+// What the program is started with, made before the warden exists.
+struct Start {
+    std::vector<char *> arguments;
+    std::vector<char *> environment;
+    std::chrono::seconds limit;
 };
 
 // What the caller and the warden share.
 struct Page {
-    ProgramEnd end;
-    pid_t warden = -1;  // the caller's alone
+    enum class End { kUnknown, kTimedOut, kHasStatus };
+    End end = End::kUnknown;
+    int status = 0;
+    int startError = 0;  // the errno of a start that failed
     std::atomic<bool> blEndAsked{false};
-    std::atomic<bool> blEnded{false};
+    std::atomic<std::uint32_t> ended{0};
 };
 
 struct Unmap {
@@ -152,181 +107,166 @@ SharedPage NewSharedPage() {
 
 // --- In the warden ------------------------------------------------------------------------------
 
-timespec Until(Clock::time_point deadline) {
-    const std::chrono::nanoseconds left = std::max(deadline - Clock::now(), Clock::duration(0));
-    const auto left_s = std::chrono::duration_cast<std::chrono::seconds>(left);
-    return {static_cast<time_t>(left_s.count()), static_cast<long>((left - left_s).count())};
+timespec Timespec(Clock::duration time) {
+    const auto time_s = std::chrono::duration_cast<std::chrono::seconds>(time);
+    return {static_cast<time_t>(time_s.count()),
+            static_cast<long>(std::chrono::nanoseconds(time - time_s).count())};
 }
 
-// Waits for the child's end; false when it has not come by the deadline, or is asked for. SIGCHLD
-// is blocked, so one that comes between the look and the wait is not missed; the caller sends it
-// too.
-bool AwaitEnd(pid_t pid, Clock::time_point deadline, const std::atomic<bool> &blAsked,
-              int &status) {
-    sigset_t childSignal;
-    sigemptyset(&childSignal);
-    sigaddset(&childSignal, SIGCHLD);
-    while (waitpid(pid, &status, WNOHANG) != pid) {
-        const timespec left = Until(deadline);
-        if (blAsked || (left.tv_sec == 0 && left.tv_nsec == 0)) {
-            return false;
-        }
-        sigtimedwait(&childSignal, nullptr, &left);
-    }
-    return true;
+// A fork that runs none of the caller's handlers. Returns as fork does.
+pid_t Fork(int exitSignal) {
+    return static_cast<pid_t>(syscall(SYS_clone, exitSignal, 0UL, 0UL, 0UL, 0UL));
 }
 
-ProgramEnd Describe(int status) {
-    return WIFEXITED(status) ? ProgramEnd{ProgramEnd::Kind::kExited, WEXITSTATUS(status)}
-                             : ProgramEnd{ProgramEnd::Kind::kSignalled, WTERMSIG(status)};
-}
-
-ProgramEnd Watch(const Start &start, std::chrono::milliseconds limit,
-                 const std::atomic<bool> &blEndAsked) {
-    const Clock::time_point deadline = Clock::now() + limit;
-    pid_t pid = -1;
-    if (const int error = start(pid); error != 0) {
-        return {ProgramEnd::Kind::kNotRun, error};
-    }
-    int status = 0;
-    if (AwaitEnd(pid, deadline, blEndAsked, status)) {
-        return Describe(status);
-    }
-    // The program itself may have moved to another group.
-    kill(-pid, SIGKILL);
-    kill(pid, SIGKILL);
-    AwaitEnd(pid, Clock::now() + kLongestDying, false, status);
-    return {ProgramEnd::Kind::kTimedOut, 0};
-}
-
-[[noreturn]] void BeWarden(const Start &start, std::chrono::milliseconds limit, Page &page) {
-    closefrom(0);
-    struct sigaction byDefault = {};
-    byDefault.sa_handler = SIG_DFL;
-    sigaction(SIGCHLD, &byDefault, nullptr);
-    page.end = Watch(start, limit, page.blEndAsked);
-    page.blEnded = true;
-    // Not _exit: before it, the runtime of a sanitizer waits for locks of the other threads.
+// Not _exit: before it, the runtime of a sanitizer waits for locks of the other threads.
+[[noreturn]] void End() {
     for (;;) {
         syscall(SYS_exit_group, 0);
     }
 }
 
+// In the warden's child, where nothing is open.
+[[noreturn]] void BeProgram(const Start &start, Page &page) {
+    setpgid(0, 0);
+    for (const int flags : {O_RDONLY, O_WRONLY, O_WRONLY}) {
+        static_cast<void>(open("/dev/null", flags));
+    }
+    struct sigaction byDefault = {};
+    byDefault.sa_handler = SIG_DFL;
+    for (int signal = 1; signal < NSIG; ++signal) {
+        sigaction(signal, &byDefault, nullptr);
+    }
+    sigset_t none;
+    sigemptyset(&none);
+    sigprocmask(SIG_SETMASK, &none, nullptr);
+    execve(start.arguments[0], start.arguments.data(), start.environment.data());
+    page.startError = errno;
+    End();
+}
+
+// Waits for the child's end; false when it has not come in time, or is asked for. SIGCHLD is
+// blocked, so one that comes between the look and the wait is not missed; the caller sends it too.
+bool AwaitEnd(pid_t pid, Clock::time_point end, const std::atomic<bool> &blAsked, int &status) {
+    sigset_t childSignal;
+    sigemptyset(&childSignal);
+    sigaddset(&childSignal, SIGCHLD);
+    while (waitpid(pid, &status, WNOHANG) != pid) {
+        const Clock::duration left = end - Clock::now();
+        if (blAsked || left <= Clock::duration::zero()) {
+            return false;
+        }
+        const timespec time = Timespec(left);
+        sigtimedwait(&childSignal, nullptr, &time);
+    }
+    return true;
+}
+
+// Starts the program and waits for it.
+void Watch(const Start &start, Page &page) {
+    const Clock::time_point end = Clock::now() + start.limit;
+    const pid_t pid = Fork(SIGCHLD);
+    if (pid == 0) {
+        BeProgram(start, page);
+    }
+    if (pid < 0) {
+        page.startError = errno;
+        return;
+    }
+    // Here as well: the group has to be there when it is to be ended.
+    setpgid(pid, pid);
+    int status = 0;
+    if (AwaitEnd(pid, end, page.blEndAsked, status)) {
+        page.end = Page::End::kHasStatus;
+        page.status = WIFEXITED(status) ? WEXITSTATUS(status) : kSignalledBase + WTERMSIG(status);
+        return;
+    }
+    page.end = Page::End::kTimedOut;
+    // The program itself may have moved to another group.
+    kill(-pid, SIGKILL);
+    kill(pid, SIGKILL);
+    AwaitEnd(pid, Clock::now() + kLongestDying, false, status);
+}
+
+[[noreturn]] void BeWarden(const Start &start, Page &page) {
+    closefrom(0);
+    struct sigaction byDefault = {};
+    byDefault.sa_handler = SIG_DFL;
+    sigaction(SIGCHLD, &byDefault, nullptr);
+    Watch(start, page);
+    page.ended = 1;
+    syscall(SYS_futex, &page.ended, FUTEX_WAKE, 1, nullptr, nullptr, 0);
+    End();
+}
+
 // --- In the caller ------------------------------------------------------------------------------
 
-// Makes the warden: a fork without exit signal, and without the handlers that a fork runs. It must
-// run nothing of the caller's, so it starts, and stays, with all signals blocked. Returns its id,
-// or -1 with errno.
-pid_t StartWarden(const Start &start, std::chrono::milliseconds limit, Page &page) {
+// Makes the warden: a fork without exit signal. It must run nothing of the caller's, so it starts,
+// and stays, with all signals blocked. Returns its id, or -1 with errno.
+pid_t StartWarden(const Start &start, Page &page) {
     sigset_t all;
     sigset_t before;
     sigfillset(&all);
     pthread_sigmask(SIG_SETMASK, &all, &before);
-    const long pid = syscall(SYS_clone, 0UL, 0UL, 0UL, 0UL, 0UL);
+    const pid_t pid = Fork(0);
     if (pid == 0) {
-        BeWarden(start, limit, page);
+        BeWarden(start, page);
     }
     const int error = errno;
     pthread_sigmask(SIG_SETMASK, &before, nullptr);
     errno = error;
-    return static_cast<pid_t>(pid);
+    return pid;
 }
 
-// The pages of the programs that run. Whoever takes a page out of its place owns it: the one who
-// ran the program, or the one who ends it. Of more programs than places the last are not ended.
-constexpr std::size_t kMaxRunning = 32;
-std::array<std::atomic<Page *>, kMaxRunning> g_running = {};
-std::atomic<bool> g_blGivenUp{false};
-
-// A child process has the pages of its parent's programs, which are none of its business.
-void ForgetInChild() {
-    for (std::atomic<Page *> &place : g_running) {
-        place = nullptr;
-    }
-}
-
-const int g_forkHandlers = pthread_atfork(nullptr, nullptr, ForgetInChild);
-
-[[noreturn]] void WaitForTheEnd() {
-    for (;;) {
-        pause();
-    }
-}
-
-bool PutInPlace(Page *pPage, std::size_t &place) {
-    for (place = 0; place < kMaxRunning; ++place) {
-        Page *pNone = nullptr;
-        if (g_running[place].compare_exchange_strong(pNone, pPage)) {
-            return true;
+// Waits for the warden's end, and asks for it when time is up. One that was killed wakes nobody,
+// which the next look shows.
+void AwaitWarden(pid_t warden, host::Wait &wait, Page &page) {
+    pid_t gone = 0;
+    while (page.ended == 0 && (gone = waitpid(warden, nullptr, __WALL | WNOHANG)) == 0) {
+        const Clock::duration slice = wait.Slice();
+        if (slice <= Clock::duration::zero()) {
+            page.blEndAsked = true;
+            kill(warden, SIGCHLD);
+            break;
         }
+        const timespec time = Timespec(slice);
+        syscall(SYS_futex, &page.ended, FUTEX_WAIT, 0, &time, nullptr, 0);
     }
-    return false;
+    while (gone == 0 && waitpid(warden, nullptr, __WALL) < 0 && errno == EINTR) {
+    }
 }
-
-void AskForEnd(Page &page) {
-    page.blEndAsked = true;
-    kill(page.warden, SIGCHLD);
-}
-
-ProgramEnd RunWithWarden(const Start &start, std::chrono::milliseconds limit) {
-    SharedPage pPage = NewSharedPage();
-    const pid_t pid = pPage == nullptr ? -1 : StartWarden(start, limit, *pPage);
-    if (pid < 0) {
-        return {ProgramEnd::Kind::kNotRun, errno};
-    }
-    pPage->warden = pid;
-    std::size_t place = 0;
-    const bool blPlaced = PutInPlace(pPage.get(), place);
-    // Who gives up looks through the places after saying so: the page is found there, or this is.
-    if (g_blGivenUp) {
-        AskForEnd(*pPage);
-    }
-    while (waitpid(pid, nullptr, __WALL) < 0 && errno == EINTR) {
-    }
-    const bool blMine = !blPlaced || g_running[place].exchange(nullptr) != nullptr;
-    if (!blMine || g_blGivenUp) {
-        static_cast<void>(pPage.release());
-        WaitForTheEnd();
-    }
-    return pPage->end;
-}
-
-constexpr timespec kLookPause = {0, 1'000'000};
-constexpr std::chrono::milliseconds kLongestGivingUp(500);
 
 }  // namespace
 
-ProgramEnd host::RunProgram(const std::vector<std::string> &arguments,
-                            const std::vector<std::string> &environment,
-                            std::chrono::milliseconds limit) {
-    const Start start(arguments, environment);
-    const bool blBare = arguments.size() == 1;
-    const Waiting waiting(
-        {"running '", arguments[0], blBare ? "" : " ", blBare ? "" : arguments[1], "'"});
+host::Status host::RunProgram(const std::vector<std::string> &arguments,
+                              const std::vector<std::string> &environment,
+                              std::chrono::seconds limit, int &status) {
+    status = kNotRunStatus;
+    const std::string strCommand =
+        '\'' + arguments[0] + (arguments.size() > 1 ? ' ' + arguments[1] : "") + '\'';
+    Wait wait("the program " + strCommand, limit);
+    if (Wait::IsPastDeadline()) {
+        return wait.TimeUp(YLIBC_ERR_DEADLINE);
+    }
+    const Start start = {Pointers(arguments), Environment(environment), limit};
+    const SharedPage pPage = NewSharedPage();
     // A cancelled thread ends after the program: an unwinding here would lose the warden, and one
     // in the warden would run the caller's handlers.
     int cancelState = 0;
     pthread_setcancelstate(PTHREAD_CANCEL_DISABLE, &cancelState);
-    if (g_blGivenUp) {
-        WaitForTheEnd();
+    const pid_t warden = pPage == nullptr ? -1 : StartWarden(start, *pPage);
+    const int error = errno;
+    if (warden >= 0) {
+        AwaitWarden(warden, wait, *pPage);
     }
-    const ProgramEnd end = RunWithWarden(start, limit);
     pthread_setcancelstate(cancelState, nullptr);
-    return end;
-}
-
-void ZELOWaitingGiveUp() {
-    g_blGivenUp = true;
-    std::array<Page *, kMaxRunning> asked = {};
-    for (std::size_t i = 0; i < kMaxRunning; ++i) {
-        asked[i] = g_running[i].exchange(nullptr);
-        if (asked[i] != nullptr) {
-            AskForEnd(*asked[i]);
-        }
+    if (const int startError = warden < 0 ? error : pPage->startError; startError != 0) {
+        return HOST_ERROR(YLIBC_ERR_EXEC,
+                          "cannot run " + strCommand + ": " + std::strerror(startError));
     }
-    const auto isOver = [](const Page *pPage) { return pPage == nullptr || pPage->blEnded; };
-    const Clock::time_point end = Clock::now() + kLongestGivingUp;
-    while (!std::all_of(asked.begin(), asked.end(), isOver) && Clock::now() < end) {
-        nanosleep(&kLookPause, nullptr);
+    if (pPage->end == Page::End::kUnknown) {
+        return HOST_ERROR(YLIBC_ERR_EXEC, "nothing is known of the end of " + strCommand);
     }
+    const bool blTimedOut = pPage->end == Page::End::kTimedOut;
+    status = blTimedOut ? kTimedOutStatus : pPage->status;
+    return blTimedOut ? wait.TimeUp(YLIBC_ERR_EXEC_TIME) : Status();
 }

@@ -12,29 +12,30 @@
 #include <string_view>
 #include <utility>
 
-#include "printable.h"
-#include "status.h"
+#include "destination.h"
+#include "program.h"
+#include "system_log.h"
 
 namespace host {
 namespace {
 
-constexpr const char *kFile = "program_folder";
 constexpr std::string_view kTopFolder = "/usr/zelo/etc";
+constexpr const char *kChangeable = "it can be changed by others than root";
 
+// The owner of "/usr/bin" is root, under another name where a user has a box of his own.
 bool OthersCanChange(const struct stat &status) {
-    return (status.st_uid != 0 && status.st_uid != geteuid()) ||
-           (status.st_mode & (S_IWGRP | S_IWOTH)) != 0;
+    struct stat system = {};
+    const bool blOurs = status.st_uid == 0 || status.st_uid == geteuid() ||
+                        (stat("/usr/bin", &system) == 0 && status.st_uid == system.st_uid);
+    return !blOurs || (status.st_mode & (S_IWGRP | S_IWOTH)) != 0;
 }
 
-ProgramFolder Refuse(const std::string &strFolder, const char *szReason, unsigned int code,
-                     int line) {
-    syslog(LOG_ERR, "%s:%d nothing in the folder '%s' is run: %s", kFile, line,
-           printable::Line(strFolder).c_str(), szReason);
-    Fail(code, kFile, line);
-    return ProgramFolder::kRefused;
+Status Refusal(unsigned int code, const std::string &strFolder, const char *szReason) {
+    return HOST_ERROR(code, "nothing in the folder '" + strFolder + "' is run: " + szReason)
+        .Logged(LOG_ERR);
 }
 
-// Why the file is no program to run; null when it is one.
+// Why the file in a folder is no program to run; null when it is one.
 const char *WhyNoProgram(const char *szPath) {
     struct stat status = {};
     if (lstat(szPath, &status) != 0) {
@@ -44,13 +45,13 @@ const char *WhyNoProgram(const char *szPath) {
         return "it is no regular file";
     }
     if (OthersCanChange(status)) {
-        return "it can be changed by others than root";
+        return kChangeable;
     }
     return faccessat(AT_FDCWD, szPath, X_OK, AT_EACCESS) == 0 ? nullptr : "it is not executable";
 }
 
 // The paths of the programs in the order of their names.
-bool ListPrograms(const std::string &strFolder, std::vector<std::string> &programs) {
+Status ListPrograms(const std::string &strFolder, std::vector<std::string> &programs) {
     std::error_code error;
     std::filesystem::directory_iterator entry(strFolder, error);
     for (; !error && entry != std::filesystem::directory_iterator(); entry.increment(error)) {
@@ -59,92 +60,94 @@ bool ListPrograms(const std::string &strFolder, std::vector<std::string> &progra
             continue;
         }
         if (const char *const szReason = WhyNoProgram(strPath.c_str()); szReason != nullptr) {
-            syslog(LOG_WARNING, "%s:%d '%s' is not run: %s", kFile, __LINE__,
-                   printable::Line(strPath).c_str(), szReason);
+            system_log::Write(LOG_WARNING, ZELO_SOURCE_STEM, __LINE__,
+                              '\'' + strPath + "' is not run: " + szReason);
             continue;
         }
         programs.push_back(std::move(strPath));
     }
     if (error) {
-        Refuse(strFolder, std::strerror(error.value()), YLIBC_ERR_FILE, __LINE__);
-        return false;
+        return Refusal(YLIBC_ERR_FILE, strFolder, std::strerror(error.value()));
     }
     std::sort(programs.begin(), programs.end());
-    return true;
+    return {};
 }
 
-std::string Describe(const ProgramEnd &end, std::chrono::seconds limit) {
-    switch (end.kind) {
-        case ProgramEnd::Kind::kNotRun:
-            return end.value == 0 ? "its end is not known"
-                                  : std::string("it could not be run: ") + std::strerror(end.value);
-        case ProgramEnd::Kind::kTimedOut:
-            return "it took longer than " + std::to_string(limit.count()) + " s and was ended";
-        case ProgramEnd::Kind::kSignalled:
-            return "signal " + std::to_string(end.value) + " ended it";
-        default:
-            return "exit status " + std::to_string(end.value);
+Status RunToSuccess(const std::string &strProgram, const ProgramCall &call, int &status) {
+    Status end = RunProgram({strProgram, call.strArgument}, call.environment, call.limit, status);
+    if (!end.Failed() && status == 0) {
+        return {};
     }
-}
-
-bool Succeeded(const ProgramEnd &end) {
-    return end.kind == ProgramEnd::Kind::kExited && end.value == 0;
+    if (!end.Failed()) {
+        end = HOST_ERROR(YLIBC_ERR_EXEC_STATUS, "exit status " + std::to_string(status));
+    }
+    return HOST_ERROR(end.Code(), std::string(call.szKind) + " '" + strProgram + "' failed for '" +
+                                      call.strArgument + "': " + end.Words())
+        .Logged(LOG_ERR);
 }
 
 }  // namespace
 
-ProgramFolder CheckProgramFolder(const std::string &strFolder) {
+Status CheckProgram(const std::string &strPath) {
+    destination::Place place;
+    struct stat folder = {};
+    struct stat file = {};
+    const destination::Way way = destination::Find(strPath, place);
+    const bool blThere = way == destination::Way::kFound && place.file.IsOpen() &&
+                         fstat(place.folder.Get(), &folder) == 0 &&
+                         fstat(place.file.Get(), &file) == 0;
+    if (!blThere && way != destination::Way::kForeignLink) {
+        return HOST_ERROR(YLIBC_ERR_EXEC, "cannot run '" + strPath + "': " + std::strerror(errno));
+    }
+    if (blThere && !S_ISREG(file.st_mode)) {
+        return HOST_ERROR(YLIBC_ERR_EXEC, "cannot run '" + strPath + "': it is no regular file");
+    }
+    if (!blThere || !place.blFixed || OthersCanChange(folder) || OthersCanChange(file)) {
+        return HOST_ERROR(YLIBC_ERR_UNSAFE_FILE, "'" + strPath + "' is not run: " + kChangeable);
+    }
+    return {};
+}
+
+Status CheckProgramFolder(const std::string &strFolder, bool &blThere) {
+    blThere = false;
     for (std::size_t end = kTopFolder.size();; end = strFolder.find('/', end + 1)) {
         const std::string strPart = strFolder.substr(0, end);
         struct stat status = {};
         if (lstat(strPart.c_str(), &status) != 0) {
-            return errno == ENOENT
-                       ? ProgramFolder::kMissing
-                       : Refuse(strPart, std::strerror(errno), YLIBC_ERR_FILE, __LINE__);
+            return errno == ENOENT ? Status()
+                                   : Refusal(YLIBC_ERR_FILE, strPart, std::strerror(errno));
         }
         if (!S_ISDIR(status.st_mode)) {
-            return Refuse(strPart, "it is no folder", YLIBC_ERR_UNSAFE_FILE, __LINE__);
+            return Refusal(YLIBC_ERR_UNSAFE_FILE, strPart, "it is no folder");
         }
         if (OthersCanChange(status)) {
-            return Refuse(strPart, "it can be changed by others than root", YLIBC_ERR_UNSAFE_FILE,
-                          __LINE__);
+            return Refusal(YLIBC_ERR_UNSAFE_FILE, strPart, kChangeable);
         }
         if (end == std::string::npos) {
-            return ProgramFolder::kUsable;
+            blThere = true;
+            return {};
         }
     }
 }
 
-bool RunProgramFolder(const std::string &strFolder, const ProgramCall &call, ProgramEnd &first) {
-    first = {ProgramEnd::Kind::kExited, 0};
-    const ProgramFolder folder = CheckProgramFolder(strFolder);
+Status RunProgramFolder(const std::string &strFolder, const ProgramCall &call, int &status) {
+    bool blThere = false;
+    HOST_TRY(CheckProgramFolder(strFolder, blThere));
     std::vector<std::string> programs;
-    if (folder == ProgramFolder::kUsable && !ListPrograms(strFolder, programs)) {
-        return false;
+    if (blThere) {
+        HOST_TRY(ListPrograms(strFolder, programs));
     }
+    Status first;
     for (const std::string &strProgram : programs) {
-        const ProgramEnd end =
-            RunProgram({strProgram, call.strArgument}, call.environment, call.limit);
-        if (Succeeded(end)) {
-            continue;
+        int ended = 0;
+        Status end = RunToSuccess(strProgram, call, ended);
+        end.Log();
+        if (end.Failed() && !first.Failed()) {
+            first = std::move(end);
+            status = ended;
         }
-        syslog(LOG_ERR, "%s:%d %s '%s' failed for '%s': %s", kFile, __LINE__, call.szKind,
-               printable::Line(strProgram).c_str(), printable::Line(call.strArgument).c_str(),
-               Describe(end, call.limit).c_str());
-        first = Succeeded(first) ? end : first;
     }
-    return folder != ProgramFolder::kRefused;
-}
-
-unsigned int LastErrorOf(const ProgramEnd &end) {
-    switch (end.kind) {
-        case ProgramEnd::Kind::kNotRun:
-            return YLIBC_ERR_EXEC;
-        case ProgramEnd::Kind::kTimedOut:
-            return YLIBC_ERR_EXEC_TIME;
-        default:
-            return YLIBC_ERR_EXEC_STATUS;
-    }
+    return first;
 }
 
 }  // namespace host

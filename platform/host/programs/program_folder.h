@@ -1,4 +1,8 @@
-// Folders of programs: plug-ins, notification hooks and services are run from them.
+// Which programs may be run, and running a folder of them: plug-ins, notification hooks, services.
+//
+// A program that others than root and the process's own user can write to, or that stands in a
+// folder that they can write to, is refused everywhere: whoever can write there can have anything
+// run as root.
 
 #ifndef ZELO_HOST_PROGRAM_FOLDER_H
 #define ZELO_HOST_PROGRAM_FOLDER_H
@@ -7,17 +11,19 @@
 #include <string>
 #include <vector>
 
-#include "program.h"
+#include "status.h"
 
 namespace host {
 
-// Whether the programs of a folder below "/usr/zelo/etc" may be run. The folder and each one above
-// it, up to
-// "/usr/zelo/etc", must be a real folder that only root and the process's own user can change:
-// whoever else can write to it can put a program of root's there. kRefused sets the last error and
-// writes a log line.
-enum class ProgramFolder { kUsable, kMissing, kRefused };
-ProgramFolder CheckProgramFolder(const std::string &strFolder);
+// Looks at a single program, the file at the end of all links: the folder that it stands in, and
+// each link on the way, count as well. YLIBC_ERR_EXEC when there is none, YLIBC_ERR_UNSAFE_FILE
+// when others can change it.
+Status CheckProgram(const std::string &strPath);
+
+// Looks at a folder of programs below "/usr/zelo/etc". It and each one above it, up to
+// "/usr/zelo/etc", must be a real folder. blThere becomes whether it is there; a missing one is no
+// failure. A failure is to be logged.
+Status CheckProgramFolder(const std::string &strFolder, bool &blThere);
 
 // What the programs of a folder are run with.
 struct ProgramCall {
@@ -27,18 +33,15 @@ struct ProgramCall {
     std::chrono::seconds limit;  // for each
 };
 
-// Runs all programs of the folder one after the other, in the byte order of their names, whatever
-// the ones before have done. A program is a regular, executable file that only root and the
-// process's own user can change; a name that begins with a dot does not count, and any other file
-// is passed over with a log line. So is each program that fails.
+// Runs all programs of the folder, if it is there, one after the other, in the byte order of their
+// names, whatever the ones before have done. A program is a regular, executable file that nobody
+// else can change; a name that begins with a dot does not count, and any other file is passed over
+// with a log line.
 //
-// `first` becomes how the first failing program ended, kExited with 0 when none failed or the
-// folder is missing. Returns false when the folder is refused or cannot be read, with the last
-// error set.
-bool RunProgramFolder(const std::string &strFolder, const ProgramCall &call, ProgramEnd &first);
-
-// The last error of a program that did not end with status 0.
-unsigned int LastErrorOf(const ProgramEnd &end);
+// A program has to end with status 0. Each that does not is worth a log line; the first of them is
+// the result (YLIBC_ERR_EXEC_STATUS, or as RunProgram failed), and `status` its number as
+// RunProgram gives it. `status` stays as it was when none fails, or the folder cannot be used.
+Status RunProgramFolder(const std::string &strFolder, const ProgramCall &call, int &status);
 
 }  // namespace host
 

@@ -4,7 +4,6 @@
 #include "service.h"
 
 #include <chrono>
-#include <new>
 #include <string>
 
 #include "program_folder.h"
@@ -12,22 +11,15 @@
 
 namespace {
 
-constexpr const char *kFile = "service";
 constexpr const char *kServiceFolder = "/usr/zelo/etc/service.d/";
 constexpr std::chrono::seconds kLimit(30);
 
 }  // namespace
 
 int YLIBServiceTypeReload(int type) {
-    try {
-        host::ProgramEnd first;
-        if (!host::RunProgramFolder(kServiceFolder + std::to_string(type),
-                                    {"service", "reload", {}, kLimit}, first)) {
-            return -1;
-        }
-        const bool blDone = first.kind == host::ProgramEnd::Kind::kExited && first.value == 0;
-        return blDone ? 0 : HOST_FAIL(host::LastErrorOf(first));
-    } catch (const std::bad_alloc &) {
-        return HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
-    }
+    return HOST_OPERATION([&] {
+        int status = 0;
+        return host::RunProgramFolder(kServiceFolder + std::to_string(type),
+                                      {"service", "reload", {}, kLimit}, status);
+    });
 }

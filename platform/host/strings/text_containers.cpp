@@ -9,7 +9,6 @@
 #include <cstring>
 #include <deque>
 #include <memory>
-#include <new>
 #include <string>
 #include <string_view>
 #include <unordered_map>
@@ -36,42 +35,35 @@ struct YLIBSZHASH_PAIRS {
 
 namespace {
 
-constexpr const char *kFile = "text_containers";
+using host::Status;
 
 // A new record of the given kind whose sequence has room for about cbInitial bytes.
 template <typename Content, typename Sequence>
 decltype(Content::record) *NewRecord(int cbInitial, Sequence Content::*sequence) {
-    if (cbInitial < 0) {
-        HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-        return nullptr;
-    }
-    try {
+    decltype(Content::record) *pRecord = nullptr;
+    return HOST_OPERATION(pRecord, pRecord, [&]() -> Status {
+        HOST_REQUIRE(cbInitial >= 0);
         auto pContent = std::make_unique<Content>();
         (pContent.get()->*sequence)
             .reserve(static_cast<std::size_t>(cbInitial) / sizeof(std::string));
-        return &pContent.release()->record;
-    } catch (const std::bad_alloc &) {
-        HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
-        return nullptr;
-    }
+        pRecord = &pContent.release()->record;
+        return {};
+    });
 }
 
 int Append(YLIBSZLIST &list, std::string_view text) {
-    try {
-        list.pItems->texts.emplace_back(text);
-        return list.nItem++;
-    } catch (const std::bad_alloc &) {
-        return HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
-    }
+    list.pItems->texts.emplace_back(text);
+    return list.nItem++;
 }
 
-// The pair at an index; null when there is none.
-const YLIBSZHASH_PAIRS::Pair *PairAt(const YLIBSZHASH *pHash, int index) {
-    if (pHash == nullptr || index < 0 || index >= pHash->nItem) {
-        HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-        return nullptr;
-    }
-    return &pHash->pPairs->inOrder[static_cast<std::size_t>(index)];
+// A text of the pair at an index.
+const char *TextAt(const YLIBSZHASH *pHash, int index, std::string YLIBSZHASH_PAIRS::Pair::*text) {
+    const char *szText = nullptr;
+    return HOST_OPERATION(szText, szText, [&]() -> Status {
+        HOST_REQUIRE(pHash != nullptr && index >= 0 && index < pHash->nItem);
+        szText = (pHash->pPairs->inOrder[static_cast<std::size_t>(index)].*text).c_str();
+        return {};
+    });
 }
 
 bool IsDelimiter(const char *szDelimiter) {
@@ -137,18 +129,21 @@ void YLIBCSzListFree(YLIBSZLIST *pslList) {
 }
 
 int YLIBCSzListPush(YLIBSZLIST **ppslList, const char *szText) {
-    if (ppslList == nullptr || *ppslList == nullptr || szText == nullptr) {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    return Append(**ppslList, szText);
+    int index = -1;
+    return HOST_OPERATION(-1, index, [&]() -> Status {
+        HOST_REQUIRE(ppslList != nullptr && *ppslList != nullptr && szText != nullptr);
+        index = Append(**ppslList, szText);
+        return {};
+    });
 }
 
 const char *YLIBCSzListGet(const YLIBSZLIST *pslList, int index) {
-    if (pslList == nullptr || index < 0 || index >= pslList->nItem) {
-        HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-        return nullptr;
-    }
-    return pslList->pItems->texts[static_cast<std::size_t>(index)].c_str();
+    const char *szText = nullptr;
+    return HOST_OPERATION(szText, szText, [&]() -> Status {
+        HOST_REQUIRE(pslList != nullptr && index >= 0 && index < pslList->nItem);
+        szText = pslList->pItems->texts[static_cast<std::size_t>(index)].c_str();
+        return {};
+    });
 }
 
 // --- Hashes -------------------------------------------------------------------------------------
@@ -159,15 +154,11 @@ host::PlaceInHash host::FindOrAddKey(YLIBSZHASH &hash, std::string_view key) {
     if (known != pairs.places.end()) {
         return {known->second, pairs.inOrder[known->second].strValue};
     }
-    const std::size_t index = pairs.inOrder.size();
+    const auto index = static_cast<std::size_t>(hash.nItem);
+    pairs.inOrder.resize(index);  // without what another call has not come to the end of
     YLIBSZHASH_PAIRS::Pair &pair = pairs.inOrder.emplace_back();
-    try {
-        pair.strKey = key;
-        pairs.places.emplace(pair.strKey, index);
-    } catch (const std::bad_alloc &) {
-        pairs.inOrder.pop_back();
-        throw;
-    }
+    pair.strKey = key;
+    pairs.places.emplace(pair.strKey, index);
     ++hash.nItem;
     return {index, pair.strValue};
 }
@@ -183,115 +174,96 @@ void YLIBCSzHashFree(YLIBSZHASH *pHash) {
 }
 
 int YLIBCSzHashSetValue(YLIBSZHASH **ppHash, const char *szKey, const char *szValue) {
-    if (ppHash == nullptr || *ppHash == nullptr || szKey == nullptr || szValue == nullptr) {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    try {
+    return HOST_OPERATION([&]() -> Status {
+        HOST_REQUIRE(ppHash != nullptr && *ppHash != nullptr);
+        HOST_REQUIRE(szKey != nullptr && szValue != nullptr);
         std::string strValue = szValue;
         host::FindOrAddKey(**ppHash, szKey).strValue.swap(strValue);
-        return 0;
-    } catch (const std::bad_alloc &) {
-        return HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
-    }
+        return {};
+    });
 }
 
 const char *YLIBCSzHashGetValue(const YLIBSZHASH *pHash, const char *szKey) {
-    if (pHash == nullptr || szKey == nullptr) {
-        HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-        return nullptr;
-    }
-    const auto known = pHash->pPairs->places.find(szKey);
-    if (known == pHash->pPairs->places.end()) {
-        HOST_FAIL(YLIBC_ERR_NOT_FOUND);
-        return nullptr;
-    }
-    return pHash->pPairs->inOrder[known->second].strValue.c_str();
+    const char *szValue = nullptr;
+    return HOST_OPERATION(szValue, szValue, [&]() -> Status {
+        HOST_REQUIRE(pHash != nullptr && szKey != nullptr);
+        const auto known = pHash->pPairs->places.find(szKey);
+        if (known == pHash->pPairs->places.end()) {
+            return HOST_ERROR(YLIBC_ERR_NOT_FOUND, std::string("there is no key '") + szKey + '\'');
+        }
+        szValue = pHash->pPairs->inOrder[known->second].strValue.c_str();
+        return {};
+    });
 }
 
 const char *YLIBCSzHashKeyAt(const YLIBSZHASH *pHash, int index) {
-    const auto *const pPair = PairAt(pHash, index);
-    return pPair == nullptr ? nullptr : pPair->strKey.c_str();
+    return TextAt(pHash, index, &YLIBSZHASH_PAIRS::Pair::strKey);
 }
 
 const char *YLIBCSzHashValueAt(const YLIBSZHASH *pHash, int index) {
-    const auto *const pPair = PairAt(pHash, index);
-    return pPair == nullptr ? nullptr : pPair->strValue.c_str();
+    return TextAt(pHash, index, &YLIBSZHASH_PAIRS::Pair::strValue);
 }
 
 // --- Text ---------------------------------------------------------------------------------------
 
 int YLIBCStrTok(const char *szText, const char *szDelimiter, YLIBSZLIST **ppslList) {
-    if (szText == nullptr || !IsDelimiter(szDelimiter) || ppslList == nullptr ||
-        *ppslList == nullptr) {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    if (szText[0] == '\0') {
-        return 0;
-    }
-    const std::size_t cbDelimiter = std::strlen(szDelimiter);
-    const char *szRest = szText;
-    int pieces = 1;
-    while (const char *szEnd = std::strstr(szRest, szDelimiter)) {
-        if (Append(**ppslList, Between(szRest, szEnd)) < 0) {
-            return -1;
+    int pieces = 0;
+    return HOST_OPERATION(-1, pieces, [&]() -> Status {
+        HOST_REQUIRE(szText != nullptr && IsDelimiter(szDelimiter));
+        HOST_REQUIRE(ppslList != nullptr && *ppslList != nullptr);
+        if (szText[0] == '\0') {
+            return {};
         }
-        szRest = szEnd + cbDelimiter;
+        const char *szRest = szText;
+        while (const char *szEnd = std::strstr(szRest, szDelimiter)) {
+            Append(**ppslList, Between(szRest, szEnd));
+            szRest = szEnd + std::strlen(szDelimiter);
+            ++pieces;
+        }
+        Append(**ppslList, szRest);
         ++pieces;
-    }
-    return Append(**ppslList, szRest) < 0 ? -1 : pieces;
+        return {};
+    });
 }
 
 char *YLIBCStrTokIndex(char **pszText, const char *szDelimiter) {
-    if (pszText == nullptr || !IsDelimiter(szDelimiter)) {
-        HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-        return nullptr;
-    }
-    char *const szPiece = *pszText;
-    if (szPiece == nullptr) {
-        return nullptr;
-    }
-    char *const szEnd = std::strstr(szPiece, szDelimiter);
-    if (szEnd == nullptr) {
-        *pszText = nullptr;
-        return szPiece;
-    }
-    *szEnd = '\0';
-    *pszText = szEnd + std::strlen(szDelimiter);
-    return szPiece;
+    char *szPiece = nullptr;
+    return HOST_OPERATION(szPiece, szPiece, [&]() -> Status {
+        HOST_REQUIRE(pszText != nullptr && IsDelimiter(szDelimiter));
+        szPiece = *pszText;
+        char *const szEnd = szPiece == nullptr ? nullptr : std::strstr(szPiece, szDelimiter);
+        *pszText = szEnd == nullptr ? nullptr : szEnd + std::strlen(szDelimiter);
+        if (szEnd != nullptr) {
+            *szEnd = '\0';
+        }
+        return {};
+    });
 }
 
 int YLIBCStrTrim(const char *szText, char *szOut, const char *szSet) {
-    if (szText == nullptr || szOut == nullptr || szSet == nullptr) {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    const std::string_view trimmed = Trimmed(szText, szSet);
-    std::memmove(szOut, trimmed.data(), trimmed.size());
-    szOut[trimmed.size()] = '\0';
-    return static_cast<int>(trimmed.size());
+    int cb = 0;
+    return HOST_OPERATION(-1, cb, [&]() -> Status {
+        HOST_REQUIRE(szText != nullptr && szOut != nullptr && szSet != nullptr);
+        const std::string_view trimmed = Trimmed(szText, szSet);
+        std::memmove(szOut, trimmed.data(), trimmed.size());
+        szOut[trimmed.size()] = '\0';
+        cb = static_cast<int>(trimmed.size());
+        return {};
+    });
 }
 
 int YLIBCStrReplace(char *szText, const char *szOld, const char *szNew, int /*flags*/, int cbText) {
-    if (szText == nullptr || szOld == nullptr || szNew == nullptr || cbText <= 0) {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    const std::size_t cbMost = static_cast<std::size_t>(cbText) - 1;
-    if (strnlen(szText, cbMost + 1) > cbMost) {
-        return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-    }
-    if (szOld[0] == '\0') {
-        return 0;
-    }
-    try {
+    int occurrences = 0;
+    return HOST_OPERATION(-1, occurrences, [&]() -> Status {
+        HOST_REQUIRE(szText != nullptr && szOld != nullptr && szNew != nullptr && cbText > 0);
+        const std::size_t cbMost = static_cast<std::size_t>(cbText) - 1;
+        HOST_REQUIRE(strnlen(szText, cbMost + 1) <= cbMost);
         std::string strResult;
-        const int occurrences = Replace(szText, szOld, szNew, cbMost, strResult);
-        if (occurrences < 0) {
-            return HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-        }
+        occurrences = szOld[0] == '\0' ? 0 : Replace(szText, szOld, szNew, cbMost, strResult);
+        HOST_REQUIRE(occurrences >= 0);
         if (occurrences > 0) {
             CopyToFit(szText, cbText, strResult);
         }
-        return occurrences;
-    } catch (const std::bad_alloc &) {
-        return HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
-    }
+        return {};
+    });
 }
