@@ -57,10 +57,10 @@ Held HoldAccounts() {
 }
 
 // A program at the path, which does not come back and tells its process id.
-Held HangProgram(const char *szPath) {
+Held HangProgram(const char *szPath, const std::string &strFirst = "") {
     const std::string strBefore = FileText(szPath);
     fs::create_directories(fs::path(szPath).parent_path());
-    WriteProgram(szPath, "echo $$ > /tmp/pid\nexec sleep 600");
+    WriteProgram(szPath, strFirst + "echo $$ > /tmp/pid\nexec sleep 600");
     WriteFile("/tmp/pid", "");
     return {nullptr, [szPath, strBefore](void *) {
                 strBefore.empty() ? void(fs::remove(szPath)) : WriteFile(szPath, strBefore);
@@ -312,7 +312,8 @@ TEST_F(Deadline, AJoinSaysWhatRemains) {
     ASSERT_EQ(run_program::Run({QRMCTL, "leave"}).status, 0);
     ExpectEnd({{"join", "--server", "localhost", "--http-port", "0", "--https-port", strPort,
                 "--token-file", "/tmp/token", "--sn", "S"},
-               Program(kDaemonScript),
+               {[] { return HangProgram(kDaemonScript, "[ \"$1\" = start ] || exit 1\n"); },
+                kDaemonScript},
                "this remains of the join: "});
     EXPECT_EQ(run_program::Run({QRMCTL, "status"}).status, 4);
     EXPECT_EQ(run_program::Run({QRMCTL, "leave"}).status, 0);
@@ -335,6 +336,27 @@ TEST_F(Deadline, IsANumberOfSecondsAboveZeroAndStatusHasOne) {
     EXPECT_EQ(outcome.status, 5);
     EXPECT_NE(outcome.strErr.find(stored::kDatabase), std::string::npos) << outcome.strErr;
     EXPECT_GE(std::chrono::steady_clock::now() - begin, std::chrono::seconds(10));
+}
+
+// A signal moves the deadline to now; it is told as what it is.
+TEST_F(Deadline, AnInterruptionEndsAFetchThatWaits) {
+    const Held silence = Silence(*s_pServer);
+    run_program::Program fetch(
+        {QRMCTL, "get-file", kPath, "ZELO.QRM.RPC.File", "get", "--json", "--deadline", "60"});
+    const auto files = [] {
+        return std::distance(fs::directory_iterator("/tmp/files"), fs::directory_iterator());
+    };
+    ASSERT_TRUE(run_program::Until([&] { return files() == 2; })) << "it is made beside the file";
+    const auto begin = std::chrono::steady_clock::now();
+    fetch.Signal(SIGTERM);
+    const run_program::Outcome outcome = fetch.Wait();
+    EXPECT_LT(std::chrono::steady_clock::now() - begin, std::chrono::duration<double>(1 + kBusy_s));
+    EXPECT_EQ(outcome.status, 1);
+    Json::Value result;
+    EXPECT_TRUE(json::FromString(outcome.strOut, result)) << outcome.strOut;
+    EXPECT_EQ(result["error_id"], "interrupted");
+    EXPECT_EQ(files(), 1);
+    EXPECT_EQ(FileText(kPath), "old");
 }
 
 // A reader that has stopped reading, on one of the streams; the other one is read.

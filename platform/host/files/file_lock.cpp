@@ -138,8 +138,9 @@ Status OpenOrCreate(const std::string &strPath, LockFile &file, bool &blAgain) {
         file.Open(szPath, 0) || (errno == ENOENT && file.Open(szPath, O_CREAT | O_EXCL));
     const int error = errno;
     if ((blOpen ? fstat(file.Get(), &there) : lstat(szPath, &there)) != 0) {
+        blAgain = !blOpen && errno == ENOENT && error != ENOENT;  // gone meanwhile
         errno = error;
-        return Failure("cannot open", strPath);
+        return blAgain ? Status() : Failure("cannot open", strPath);
     }
     if (blOpen && own_file::IsOwn(there)) {
         blAgain = there.st_nlink == 0;
@@ -150,7 +151,7 @@ Status OpenOrCreate(const std::string &strPath, LockFile &file, bool &blAgain) {
         blAgain = true;
         return {};
     }
-    if (!own_file::IsOwn(there)) {
+    if (host::IsRefused(there, error)) {
         return host::Refusal(strPath, there);
     }
     errno = error;

@@ -12,6 +12,8 @@
 #include <cstring>
 #include <memory>
 
+#include "own_file.h"
+
 namespace host {
 namespace {
 
@@ -74,9 +76,13 @@ void RemoveAny(const std::string &strPath) {
     }
 }
 
+bool IsRefused(const struct stat &there, int error) {
+    return !own_file::IsOwn(there) || (error == EACCES && there.st_uid != geteuid());
+}
+
 Status Refusal(const std::string &strPath, const struct stat &there) {
     const std::string strFile = '\'' + strPath + "' ";
-    if (there.st_uid != 0 && there.st_uid != geteuid()) {
+    if (there.st_uid != geteuid()) {
         const std::string strName = UserName(there.st_uid);
         return HOST_ERROR(YLIBC_ERR_UNSAFE_FILE, strFile + "belongs to the user " +
                                                      std::to_string(there.st_uid) +

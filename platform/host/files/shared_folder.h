@@ -32,6 +32,10 @@ void RemoveForeign(const std::string &strPath);
 // Removes a file, a link or an empty folder. A folder that holds something stays.
 void RemoveAny(const std::string &strPath);
 
+// Whether what stands in a file's place, and was opened (error is 0) or could not be, is refused:
+// what is not our own, and what is root's and shut to the caller.
+bool IsRefused(const struct stat &there, int error);
+
 // Why what stands at the path, where a file of ours should, is refused.
 Status Refusal(const std::string &strPath, const struct stat &there);
 

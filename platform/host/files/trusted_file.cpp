@@ -60,7 +60,7 @@ Status TakeStep(FoundFile &found, bool &blDone) {
         RemoveForeign(found.strPath);
         return {};
     }
-    if (blShared && !own_file::IsOwn(found.status)) {
+    if (blShared && IsRefused(found.status, found.blThere ? 0 : error)) {
         return Refusal(found.strPath, found.status);
     }
     if (!found.blThere) {
