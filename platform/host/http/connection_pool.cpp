@@ -14,6 +14,7 @@
 #include <vector>
 
 #include "appliance_ca.h"
+#include "exchange_record.h"
 #include "never_destroyed.h"
 
 namespace host {
@@ -77,8 +78,10 @@ curl_socket_t OpenSocket(void *pContext, curlsocktype /*purpose*/, curl_sockaddr
         return CURL_SOCKET_BAD;
     }
     try {
+        auto *const pConnection = static_cast<Connection *>(pContext);
+        NoteAddress(pAddress->addr, *pConnection->pRecord);
         const std::lock_guard<std::mutex> lock(g_pool->mutex);
-        static_cast<Connection *>(pContext)->sockets.insert(fd);
+        pConnection->sockets.insert(fd);
         return fd;
     } catch (const std::bad_alloc &) {
         close(fd);
@@ -104,8 +107,25 @@ void NoteAlert(const SSL *pTls, int where, int alert) {
 }
 
 int NoteCertificateRequest(SSL *pTls, X509 ** /*ppCertificate*/, EVP_PKEY ** /*ppKey*/) {
-    ConnectionOf(pTls)->blCertificateAsked = true;
+    ConnectionOf(pTls)->pRecord->blCertificateAsked = true;
     return 0;  // there is none
+}
+
+// Runs in place of OpenSSL's verification, which it calls: it notes what comes of it. The last word
+// without verification is that all is well.
+int Verify(X509_STORE_CTX *pVerification, void *pContext) {
+    const Connection &connection = *static_cast<Connection *>(pContext);
+    const bool blTrusted = X509_verify_cert(pVerification) == 1;
+    try {
+        NoteCertificate(pVerification, blTrusted, connection.strHost, *connection.pRecord);
+    } catch (const std::bad_alloc &) {
+        X509_STORE_CTX_set_error(pVerification, X509_V_ERR_OUT_OF_MEM);
+        return 0;
+    }
+    if (!connection.blVerify) {
+        X509_STORE_CTX_set_error(pVerification, X509_V_OK);
+    }
+    return blTrusted || !connection.blVerify ? 1 : 0;
 }
 
 CURLcode SetUpTls(CURL * /*pEasy*/, void *pSslContext, void *pConnection) {
@@ -114,8 +134,11 @@ CURLcode SetUpTls(CURL * /*pEasy*/, void *pSslContext, void *pConnection) {
         SSL_CTX_set_app_data(pTls, pConnection);
         SSL_CTX_set_info_callback(pTls, NoteAlert);
         SSL_CTX_set_client_cert_cb(pTls, NoteCertificateRequest);
-        X509_STORE *pStore = SSL_CTX_get_cert_store(pTls);
-        return AddApplianceCa(pStore) ? CURLE_OK : CURLE_SSL_CACERT_BADFILE;
+        SSL_CTX_set_cert_verify_callback(pTls, Verify, pConnection);
+        const bool blAll = AddApplianceCa(SSL_CTX_get_cert_store(pTls));
+        return blAll || !static_cast<Connection *>(pConnection)->blVerify
+                   ? CURLE_OK
+                   : CURLE_SSL_CACERT_BADFILE;
     } catch (const std::bad_alloc &) {
         return CURLE_OUT_OF_MEMORY;
     }

@@ -8,6 +8,9 @@
 #include <array>
 #include <memory>
 #include <set>
+#include <string>
+
+#include "diagnosis.h"
 
 namespace host {
 
@@ -20,9 +23,11 @@ struct Connection {
     std::set<curl_socket_t> sockets;
     bool blNamesProxy = false;  // whether the environment did when the handle was made
     std::array<char, CURL_ERROR_SIZE> reason = {};  // libcurl's, of what failed
-    // What TLS said in the latest exchange.
+    // The exchange that goes on over it, and what TLS says in it.
+    std::string strHost;
+    bool blVerify = true;
+    ZELO::Exchange *pRecord = nullptr;
     bool blEndAnnounced = false;
-    bool blCertificateAsked = false;  // of this client
     // Goes first: cleaning it up closes its sockets, which calls back to the set above.
     std::unique_ptr<CURL, CleanupEasy> pEasy;
 };

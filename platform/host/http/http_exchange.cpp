@@ -13,7 +13,9 @@
 #include <string_view>
 
 #include "connection_pool.h"
+#include "exchange_record.h"
 #include "files/key_value_lookup.h"
+#include "json.h"
 #include "printable.h"
 #include "reply_sink.h"
 #include "status.h"
@@ -30,7 +32,7 @@ constexpr long kStallBytesPerSecond = 100;
 constexpr long kStallTime_s = 30;
 // For a body in memory; one that goes to a stream may take its time as long as it moves.
 constexpr long kWholeTimeout_s = 300;
-constexpr long kLongestTimeout_s = std::numeric_limits<int>::max() / 1000;
+constexpr long long kLongestTimeout_ms = std::numeric_limits<int>::max();
 constexpr long kStreamBuffer = 512 * 1024L;
 constexpr long kReplyBuffer = 16 * 1024L;
 // What is sent is small, while libcurl allocates and frees its buffer for each exchange.
@@ -201,11 +203,15 @@ bool BuildHeaders(const HttpRequest &request, HeaderList &headers) {
 void SetRequest(CURL *pEasy, const HttpRequest &request, const curl_slist *pHeaders) {
     SetText(pEasy, CURLOPT_URL, request.strUrl.c_str());
     curl_easy_setopt(pEasy, CURLOPT_HTTPHEADER, pHeaders);
-    const long wholeTimeout_s = request.pStream == nullptr ? kWholeTimeout_s : 0;
+    const long long wholeTimeout_ms = request.pStream == nullptr ? kWholeTimeout_s * 1000 : 0;
     // What libcurl refuses would leave no limit at all.
-    const long ownTimeout_s = std::min<long>(request.timeout_s, kLongestTimeout_s);
-    curl_easy_setopt(pEasy, CURLOPT_TIMEOUT, ownTimeout_s > 0 ? ownTimeout_s : wholeTimeout_s);
-    curl_easy_setopt(pEasy, CURLOPT_FORBID_REUSE, request.blKeepConnection ? 0L : 1L);
+    const long long ownTimeout_ms = std::min(request.timeout_ms, kLongestTimeout_ms);
+    curl_easy_setopt(pEasy, CURLOPT_TIMEOUT_MS,
+                     static_cast<long>(ownTimeout_ms > 0 ? ownTimeout_ms : wholeTimeout_ms));
+    const bool blAlone = request.blOwnConnection || !request.blVerify;
+    curl_easy_setopt(pEasy, CURLOPT_FRESH_CONNECT, blAlone ? 1L : 0L);
+    curl_easy_setopt(pEasy, CURLOPT_FORBID_REUSE, request.blKeepConnection && !blAlone ? 0L : 1L);
+    curl_easy_setopt(pEasy, CURLOPT_SSL_VERIFYHOST, request.blVerify ? 2L : 0L);
     curl_easy_setopt(pEasy, CURLOPT_BUFFERSIZE,
                      request.pStream == nullptr ? kReplyBuffer : kStreamBuffer);
     curl_easy_setopt(pEasy, CURLOPT_NOPROGRESS, request.pfnObserver == nullptr ? 1L : 0L);
@@ -222,6 +228,13 @@ void SetRequest(CURL *pEasy, const HttpRequest &request, const curl_slist *pHead
 std::string_view ServerOf(std::string_view url) {
     const std::size_t host = url.find("//");
     return host == std::string_view::npos ? url : url.substr(0, url.find_first_of("/?", host + 2));
+}
+
+// Its host, without the brackets of an address.
+std::string HostOf(std::string_view url) {
+    std::string_view host = ServerOf(url);
+    host = host.substr(0, host.rfind(':')).substr(host.find("//") + 2);
+    return std::string(host.front() == '[' ? host.substr(1, host.size() - 2) : host);
 }
 
 // The error of a request as the platform's last error.
@@ -252,8 +265,21 @@ int Fail(int error, const HttpRequest &request, const std::string &strReason, in
     if (error != ZELO::CRED_REQ_ERR_UNCHANGED) {
         Warn(request, strReason, line);
     }
-    YLIBCErrSetEx(LastErrorOf(error), kFile, line);
+    ZELO::Exchange &record = LatestRecord();
+    record.error = error;
+    record.code = LastErrorOf(error);
+    record.strWords = strReason;
+    Status(record.code, kFile, line, strReason).Publish();
     return error;
+}
+
+// Hardly any reply of a call that went well speaks of an error: those are not read twice.
+int RefusalCode(const std::string &strBody) {
+    Json::Value envelope;
+    return strBody.find("\"error\"") != std::string::npos && json::FromString(strBody, envelope) &&
+                   !json::IsTrue(json::Member(envelope, "success"))
+               ? json::ErrorCode(envelope)
+               : 0;
 }
 
 // Whether the reply is there to its end, where libcurl sees nothing wrong. A length and chunks tell
@@ -305,9 +331,8 @@ int Judge(Transfer &transfer, CURLcode result, long status, std::string &strReas
 
 // What mends a refusal whose reason does not say it; empty for others.
 const char *Remedy(const Transfer &transfer, CURLcode result, long status) {
-    long relayStatus = 0;
-    curl_easy_getinfo(transfer.connection.pEasy.get(), CURLINFO_HTTP_CONNECTCODE, &relayStatus);
-    if (status == kStatusProxyAuthentication || relayStatus == kStatusProxyAuthentication) {
+    const ZELO::Exchange &record = *transfer.connection.pRecord;
+    if (status == kStatusProxyAuthentication || record.relayStatus == kStatusProxyAuthentication) {
         return transfer.request.blRelay
                    ? "the relay wants a valid name and password: set "
                      "farlink_relay=\"name:password@host:port\" in /etc/zeloinfo.conf"
@@ -317,7 +342,7 @@ const char *Remedy(const Transfer &transfer, CURLcode result, long status) {
     const bool blRefused =
         status == kStatusBadRequest || status == kStatusForbidden ||
         (status == 0 && result != CURLE_OK && result != CURLE_OPERATION_TIMEDOUT);
-    return transfer.connection.blCertificateAsked && blRefused && !transfer.blStopped
+    return record.blCertificateAsked && blRefused && !transfer.blStopped
                ? "the server asks for a client certificate, and this client has none: let the "
                  "server take it without one"
                : "";
@@ -332,11 +357,12 @@ int Transact(const HttpRequest &request, Connection &connection, HttpReply &repl
     curl_easy_setopt(pEasy, CURLOPT_WRITEDATA, &transfer);
     curl_easy_setopt(pEasy, CURLOPT_XFERINFODATA, &transfer);
     connection.reason[0] = '\0';
-    connection.blCertificateAsked = false;
     const Waiting waiting({"asking '", ServerOf(request.strUrl), "'"});
     const CURLcode result = curl_easy_perform(pEasy);
     curl_easy_getinfo(pEasy, CURLINFO_RESPONSE_CODE, &reply.status);
     reply.strBody.swap(transfer.sink.Body());
+    NoteAnswer(pEasy, *connection.pRecord);
+    connection.pRecord->errorCode = RefusalCode(reply.strBody);
     std::string strReason;
     const int error = Judge(transfer, result, reply.status, strReason);
     const std::string strRemedy = Remedy(transfer, result, reply.status);
@@ -353,12 +379,19 @@ int Transact(const HttpRequest &request, Connection &connection, HttpReply &repl
 }  // namespace
 
 int Perform(const HttpRequest &request, HttpReply &reply) {
+    ZELO::Exchange &record = LatestRecord();
+    record = {};
+    record.strUrl = request.strUrl.substr(0, request.strUrl.find('?'));
+    record.blRelayed = request.blRelay;
     const Borrowed connection;
     CURL *const pEasy = connection.Easy();
     HeaderList headers;
     if (pEasy == nullptr || !BuildHeaders(request, headers)) {
         return Fail(ZELO::CRED_REQ_ERR_MEMORY, request, "out of memory", __LINE__);
     }
+    connection.Get()->strHost = HostOf(request.strUrl);
+    connection.Get()->blVerify = request.blVerify;
+    connection.Get()->pRecord = &record;
     SetTransport(pEasy);
     if (!SetWay(*connection.Get(), request.blRelay)) {
         return Fail(ZELO::CRED_REQ_ERR_NETWORK, request,

@@ -21,7 +21,9 @@ struct HttpRequest {
     bool blRelay = false;          // through the relay of the platform's configuration
     bool blPost = false;           // POST strBody as JSON; otherwise GET
     bool blKeepConnection = true;  // false: close the connection afterwards
-    int timeout_s = 0;             // for the whole exchange; 0: the transport's own
+    long long timeout_ms = 0;      // for the whole exchange; 0: the transport's own
+    bool blVerify = true;          // false: whoever answers; over a connection of its own
+    bool blOwnConnection = false;  // none that is kept
     std::string strBody;
     std::vector<std::string> headers;  // "Name: value"
 
@@ -44,7 +46,8 @@ struct HttpReply {
 // (with a stream: one of 2xx, and written whole). Otherwise returns another value of
 // CRED_REQ_ERROR, sets the last error and writes one log line with the URL and the reason; reply
 // then holds the status, and what came of the body into memory, as far as there was one. That the
-// caller's copy is current is worth no log line. Throws std::bad_alloc.
+// caller's copy is current is worth no log line. The thread's latest exchange is this one then.
+// Throws std::bad_alloc.
 int Perform(const HttpRequest &request, HttpReply &reply);
 
 // Builds an URL; the host may be a name, an IPv4 or an IPv6 address, the query empty or

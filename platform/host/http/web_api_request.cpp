@@ -10,6 +10,8 @@
 #include <new>
 #include <utility>
 
+#include "diagnosis.h"
+#include "exchange_record.h"
 #include "fork_safe.h"
 #include "http_exchange.h"
 #include "json.h"
@@ -40,24 +42,26 @@ struct Server {
         return (blRelay ? "fld" : strScheme) + ' ' + std::to_string(port) + ' ' + strHost + ' ' +
                api;
     }
-    std::string Url(const std::string &strPath) const {
-        return host::BuildUrl(strScheme, strHost, port, strPath, "");
+    std::string Url(const std::string &strPath, const std::string &strQuery = "") const {
+        return host::BuildUrl(strScheme, strHost, port, strPath, strQuery);
     }
 };
 
-bool ReadServer(const ZELO_CRED *pCred, Server &server) {
-    if (pCred == nullptr || !pCred->protocol || !pCred->host || !pCred->port) {
-        return false;
-    }
-    const std::string &strProtocol = *pCred->protocol;
+bool ReadServer(const std::string &strProtocol, const std::string &strHost, long port,
+                Server &server) {
     if (strProtocol != "https" && strProtocol != "http" && strProtocol != "fld") {
         return false;
     }
     server.blRelay = strProtocol == "fld";
     server.strScheme = server.blRelay ? "https" : strProtocol;
-    server.strHost = *pCred->host;
-    server.port = *pCred->port;
+    server.strHost = strHost;
+    server.port = port;
     return !server.strHost.empty();
+}
+
+bool ReadServer(const ZELO_CRED *pCred, Server &server) {
+    return pCred != nullptr && pCred->protocol && pCred->host && pCred->port &&
+           ReadServer(*pCred->protocol, *pCred->host, *pCred->port, server);
 }
 
 // The URLs that this process has learnt, by server and API.
@@ -136,40 +140,21 @@ struct Observer {
 
 thread_local Observer t_observer;
 
-// Of no type that is destroyed with its thread: requests may be sent until the very end.
-thread_local CredRequestUtil::Answer t_answer;
-
-// Hardly any reply of a call that went well speaks of an error: those are not read twice.
-int RefusalCode(const std::string &strBody) {
-    Json::Value envelope;
-    return strBody.find("\"error\"") != std::string::npos && json::FromString(strBody, envelope) &&
-                   !json::IsTrue(json::Member(envelope, "success"))
-               ? json::ErrorCode(envelope)
-               : 0;
-}
-
-// Performs the exchange, and keeps what the thread may be asked for.
-int Ask(const host::HttpRequest &request, host::HttpReply &reply) {
-    t_answer = {};
-    const int result = host::Perform(request, reply);
-    t_answer.httpStatus = static_cast<int>(reply.status);
-    t_answer.errorCode = RefusalCode(reply.strBody);
-    return result;
-}
-
 // A server without a path for the API: says why. The query names nothing that helps, and it came
 // from a caller.
 std::string NoPath(const std::string &strUrl, const std::string &strReason, int line) {
+    Exchange &record = host::LatestRecord();
+    record.code = YLIBC_ERR_REPLY;
+    record.strWords = strReason;
     syslog(LOG_WARNING, "%s:%d %s: %s", kFile, line,
            printable::Line(strUrl.substr(0, strUrl.find('?'))).c_str(), strReason.c_str());
-    YLIBCErrSetEx(YLIBC_ERR_REPLY, kFile, line);
+    host::Status(YLIBC_ERR_REPLY, kFile, line, strReason).Publish();
     return {};
 }
 
 std::string Discover(const Server &server, const std::string &api) {
     host::HttpRequest request;
-    request.strUrl =
-        host::BuildUrl(server.strScheme, server.strHost, server.port, kDiscoveryPath, "api=" + api);
+    request.strUrl = server.Url(kDiscoveryPath, "api=" + api);
     request.blRelay = server.blRelay;
     request.pfnObserver = t_observer.pfn;
     request.pObserverContext = t_observer.pContext;
@@ -179,7 +164,7 @@ std::string Discover(const Server &server, const std::string &api) {
         HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
         return {};
     }
-    if (Ask(request, reply) != CRED_REQ_ERR_NONE) {
+    if (host::Perform(request, reply) != CRED_REQ_ERR_NONE) {
         return {};
     }
     if (reply.status != kStatusOk) {
@@ -278,7 +263,7 @@ struct CredRequest::Impl {
         request.blRelay = blRelay;
         request.blPost = true;
         request.blKeepConnection = blKeepConnection;
-        request.timeout_s = timeout_s;
+        request.timeout_ms = timeout_s * 1000LL;
         request.pStream = pStream;
         request.pfnWrite = pfnWrite;
         request.blHasCopy = params.isMember(kDigest);
@@ -290,7 +275,7 @@ struct CredRequest::Impl {
             return CRED_REQ_ERR_ARGUMENT;
         }
         host::HttpReply reply;
-        const int result = Ask(request, reply);
+        const int result = host::Perform(request, reply);
         if (reply.status == kStatusNotFound) {
             ForgetUrl(strUrlKey);
         }
@@ -321,10 +306,6 @@ bool CredRequestUtil::SetWebAPIURL(const ZELO_CRED *pCred, const std::string &ap
 
 void CredRequestUtil::SetProgressObserver(ProgressObserver pfnObserver, void *pContext) {
     t_observer = {pfnObserver, pContext};
-}
-
-CredRequestUtil::Answer CredRequestUtil::LatestAnswer() {
-    return t_answer;
 }
 
 CredRequest *CredRequest::CreateWebAPIRequest(const ZELO_CRED *pCred, const ZELO_CRED_SESS *pSess,
@@ -424,6 +405,35 @@ std::string CredRequest::GetResponse() const {
 
 std::string CredRequest::GetURL() const {
     return m_pImpl == nullptr ? std::string() : m_pImpl->strUrl;
+}
+
+bool LookAtServer(const Look &look, Exchange &exchange, std::string *pBody) {
+    Server server;
+    host::HttpRequest request;
+    exchange = {};
+    if (ReadServer(look.strProtocol, look.strHost, look.port, server)) {
+        request.strUrl = server.Url(look.strPath, look.strQuery);
+    }
+    if (request.strUrl.empty() || look.limit_ms <= 0) {
+        HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
+        exchange.error = CRED_REQ_ERR_ARGUMENT;
+        exchange.code = YLIBC_ERR_INVALID_ARGUMENT;
+        exchange.strWords = "the protocol, the host or the port cannot stand in an URL";
+        return false;
+    }
+    request.blRelay = server.blRelay;
+    request.blVerify = look.blVerify;
+    request.blOwnConnection = true;
+    request.timeout_ms = look.limit_ms;
+    request.pfnObserver = t_observer.pfn;
+    request.pObserverContext = t_observer.pContext;
+    host::HttpReply reply;
+    const bool blWhole = host::Perform(request, reply) == CRED_REQ_ERR_NONE;
+    exchange = LatestExchange();
+    if (pBody != nullptr) {
+        *pBody = std::move(reply.strBody);
+    }
+    return blWhole;
 }
 
 bool APIValidator::IsPort(const int &port) {
