@@ -108,9 +108,14 @@ struct Exchange {
     std::string strRetryAfter;  //
     std::time_t ownTime = 0;    // this appliance's clock as the exchange ended
 
-    int error = 0;          // a value of CRED_REQ_ERROR; 0 when a whole reply arrived
-    unsigned int code = 0;  // the last error's (last_error.h), with its words: for one that failed,
-    std::string strWords;   // and for a discovery that found no path
+    // Why it failed, or, for a discovery, why the answer tells no path: a value of CRED_REQ_ERROR,
+    // 0 when a whole reply arrived; the last error's code (last_error.h); and the reason in words,
+    // without the server's name.
+    int error = 0;
+    unsigned int code = 0;
+    std::string strWords;
+    std::string
+        strRemedy;  // what mends it, where the platform knows; also for a reply that refuses
 };
 
 // The calling thread's latest exchange, discovery, call or look, also where it failed: for a
