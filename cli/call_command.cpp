@@ -7,13 +7,10 @@
 #include "joined_server.h"
 #include "json.h"
 #include "server_request.h"
-#include "web_api_request.h"
 #include "zeloqrmclient.h"
 
 namespace qrmctl {
 namespace {
-
-using ZELO::CredRequestUtil::LatestAnswer;
 
 struct Options {
     ApiCall call;
@@ -39,7 +36,7 @@ ExitCode Call(const Options &options, Report &report) {
     if (ZELOQRMClientSendWebapi(reply, call.strApi, call.version, call.strMethod, params,
                                 options.blCached) != 0) {
         // A code without a reply comes of the look for the API's path.
-        return LatestAnswer().errorCode != 0
+        return LatestExchange().errorCode != 0
                    ? FailRequest(ErrorId::kRefused,
                                  "the server does not serve the API '" + call.strApi + '\'', "",
                                  report)
@@ -74,7 +71,7 @@ ExitCode Update(const Options &options, Report &report) {
     if (ZELOQRMClientSendSetClient(info) != 0) {
         constexpr int kNoSuchApi = 102;
         return FailRequest(
-            LatestAnswer().errorCode == kNoSuchApi ? ErrorId::kRefused : ErrorId::kUpdateFailed,
+            LatestExchange().errorCode == kNoSuchApi ? ErrorId::kRefused : ErrorId::kUpdateFailed,
             "the server did not take the update",
             ", or a fact of this appliance is missing: run 'qrmctl doctor'; -v "
             "shows the reason",

@@ -19,7 +19,6 @@
 #include "key_value_file.h"
 #include "membership.h"
 #include "server_request.h"
-#include "web_api_request.h"
 #include "zeloqrmclient.h"
 
 namespace qrmctl {
@@ -167,7 +166,7 @@ ExitCode FailAndUndo(const char *szFailed, bool blJoined, Report &report) {
     // The join itself is the one step that asks the server.
     if (FindRefusal(report, strAnswer)) {
         strError = "the server did not accept the join: it answered with " + strAnswer;
-        if (ZELO::CredRequestUtil::LatestAnswer().errorCode != 0) {
+        if (LatestExchange().errorCode != 0) {
             strError += "; check token and serial number";
         }
     }

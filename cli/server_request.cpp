@@ -2,7 +2,7 @@
 
 #include <limits>
 
-#include "web_api_request.h"
+#include "diagnosis.h"
 
 namespace qrmctl {
 
@@ -19,9 +19,13 @@ void AddApiCall(CommandHandle command, ApiCall &call) {
         .ValueName("JSON");
 }
 
+ZELO::Exchange LatestExchange() {
+    return ZELO::LatestExchange != nullptr ? ZELO::LatestExchange() : ZELO::Exchange();
+}
+
 bool FindRefusal(Report &report, std::string &strAnswer) {
     constexpr int kStatusOk = 200;
-    const ZELO::CredRequestUtil::Answer answer = ZELO::CredRequestUtil::LatestAnswer();
+    const ZELO::Exchange answer = LatestExchange();
     strAnswer.clear();
     if (answer.errorCode != 0) {
         const std::string strName = ServerErrorName(answer.errorCode);

@@ -6,6 +6,7 @@
 #include <string>
 
 #include "commands.h"
+#include "diagnosis.h"
 #include "report.h"
 
 namespace qrmctl {
@@ -20,6 +21,9 @@ struct ApiCall {
 
 // Lets the command take them.
 void AddApiCall(CommandHandle command, ApiCall &call);
+
+// The latest exchange with a server; an empty one on a platform that keeps no record of it.
+ZELO::Exchange LatestExchange();
 
 // For a request that failed: whether the server's answer to the latest exchange says why. Then
 // strAnswer names its error code and its HTTP status, and the report has them as members.

@@ -11,6 +11,10 @@
 #ifndef ZELO_PLATFORM_DIAGNOSIS_H
 #define ZELO_PLATFORM_DIAGNOSIS_H
 
+#include <ctime>
+#include <string>
+#include <vector>
+
 #include "api.h"
 #include "text_containers.h"
 
@@ -73,5 +77,95 @@ typedef void (*ZELO_WAIT_OBSERVER)(void *pContext, const char *szWaitsFor, doubl
 // other thread is in an operation.
 ZELO_DIAGNOSIS_API void ZELOWaitObserverSet(ZELO_WAIT_OBSERVER pfnObserver, void *pContext);
 }
+
+// --- Exchanges
+// ------------------------------------------------------------------------------------
+//
+// What an exchange with a server met (web_api_request.h). These are C++ and may throw
+// std::bad_alloc.
+
+namespace ZELO {
+
+// The certificate that a server showed.
+struct ServerCertificate {
+    bool blShown = false;
+    std::string strSubject;  // such as "CN=qrm.example,O=Example"
+    std::string strIssuer;
+    std::string strNames;  // for which hosts it is, such as "DNS:qrm.example, IP Address:192.0.2.7"
+    std::time_t notBefore = 0;
+    std::time_t notAfter = 0;
+    std::string strFingerprint;  // SHA-256 of the certificate, 64 lower-case hexadecimal digits
+    std::string strChainPem;     // it and what the server sent with it, in the order of sending
+    bool blNamesHost = false;    // it is for the host that was asked for
+    // Whether it leads to a trusted authority and is valid now: the number that OpenSSL has for the
+    // reason why not (X509_V_ERR_...), 0 when it does; which certificate of the chain it is about,
+    // 0 for the server's own; and the reason in words.
+    int verifyCode = 0;
+    int verifyDepth = 0;
+    std::string strVerifyWords;
+};
+
+// One exchange. A stage that was not come to has the time -1; a connection that was kept from an
+// earlier exchange has none of the stages up to TLS, and no certificate.
+struct Exchange {
+    std::string strUrl;      // without a query
+    bool blRelayed = false;  // through the platform's relay: addresses and TCP are the relay's
+
+    std::vector<std::string> addresses;  // that were tried, such as "192.0.2.7:5001", "[::1]:5001"
+    std::string strAddress;              // the one that was connected to
+    // Milliseconds from the beginning to the end of each stage.
+    long resolved_ms = -1;   // the name has addresses
+    long connected_ms = -1;  // TCP
+    long secured_ms = -1;    // TLS; through a relay that is behind its tunnel
+    long answered_ms = -1;   // the first byte of the answer
+    long whole_ms = -1;      // the end of the exchange, whatever came of it
+
+    int relayStatus = 0;        // what the relay, or a proxy, answered; 0: nothing
+    std::string strTlsVersion;  // such as "TLSv1.3"
+    ServerCertificate certificate;
+    bool blCertificateAsked = false;  // the server asked for one of this client, which has none
+
+    int httpStatus = 0;         // 0: no answer arrived
+    int errorCode = 0;          // of a reply that says why there is no success; 0 without one
+    std::string strDate;        // the answer's headers of these names, as they are
+    std::string strRetryAfter;  //
+    std::time_t ownTime = 0;    // this appliance's clock as the exchange ended
+
+    // Why it failed, or, for a discovery, why the answer tells no path: a value of CRED_REQ_ERROR,
+    // 0 when a whole reply arrived; the last error's code (last_error.h); and the reason in words,
+    // without the server's name.
+    int error = 0;
+    unsigned int code = 0;
+    std::string strWords;
+    std::string
+        strRemedy;  // what mends it, where the platform knows; also for a reply that refuses
+};
+
+// The calling thread's latest exchange, discovery, call or look, also where it failed: for a
+// program that tells its user why a server refused. It is empty at the start of a thread, and stays
+// as it was for a request whose arguments are refused. Of an error page to a request with a
+// response stream, an error code in the first 64 KiB counts.
+ZELO_DIAGNOSIS_API Exchange LatestExchange();
+
+// What to look at.
+struct Look {
+    std::string strProtocol;  // "https", "http", or "fld" for HTTPS through the relay
+    std::string strHost;
+    int port = 0;
+    std::string strPath = "/";
+    std::string strQuery;  // "name=value", whose value is encoded here; empty for none
+    // False: the server's certificate and name are not verified, nor is the platform's list of
+    // authorities needed. What comes back is a hint then, not a fact: whoever answers may lie. For
+    // clocks, and for certificates that are not trusted yet.
+    bool blVerify = true;
+    long limit_ms = 10'000;  // for all of it
+};
+
+// Asks for the path, over a connection of its own and without any token. Returns true when a whole
+// reply arrived, whatever its HTTP status. `exchange` gets what was met in any case, and *pBody the
+// body of the reply, unless it is null. It is the thread's latest exchange too.
+ZELO_DIAGNOSIS_API bool LookAtServer(const Look &look, Exchange &exchange, std::string *pBody);
+
+}  // namespace ZELO
 
 #endif

@@ -89,19 +89,6 @@ typedef bool (*ProgressObserver)(void *pContext, long long cbWritten, long long 
 // Sets the observer of the calling thread's requests; null for none, as at the start of a thread.
 ZELO_PLATFORM_API void SetProgressObserver(ProgressObserver pfnObserver, void *pContext);
 
-// What a server answered to an exchange.
-struct Answer {
-    int httpStatus = 0;  // 0: no answer arrived
-    int errorCode = 0;   // the code of a reply that says why there is no success; 0 without one
-};
-
-// The answer to the calling thread's latest exchange, discovery or call, also where the request
-// failed: for a program that tells its user why a server refused. It is empty at the start of a
-// thread and after an exchange that got no answer, and stays as it was for a request whose
-// arguments are refused. Of an error page to a request with a response stream, a code in the first
-// 64 KiB counts. Never fails.
-ZELO_PLATFORM_API Answer LatestAnswer();
-
 }  // namespace CredRequestUtil
 
 // One call of a Web API method.

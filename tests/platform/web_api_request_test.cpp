@@ -4,14 +4,18 @@
 #include <netinet/in.h>
 #include <poll.h>
 #include <sys/socket.h>
+#include <unistd.h>
 
+#include <chrono>
 #include <climits>
 #include <cstdlib>
 #include <memory>
 #include <set>
+#include <thread>
 
 #include "children.h"
 #include "dev_server_process.h"
+#include "diagnosis.h"
 #include "files.h"
 #include "last_error.h"
 #include "run_program.h"
@@ -262,7 +266,7 @@ TEST_F(Request, PathsAreLearntOnceAndForgottenWhenTheyAreGone) {
     };
     call(200);
     call(404);
-    EXPECT_EQ(ZELO::CredRequestUtil::LatestAnswer().httpStatus, 404);
+    EXPECT_EQ(ZELO::LatestExchange().httpStatus, 404);
     EXPECT_EQ(m_pServer->Requests().size(), 3U) << "one discovery, two calls";
     call(200);
     EXPECT_EQ(m_pServer->Requests().size(), 5U) << "asked again after the 404";
@@ -276,12 +280,121 @@ TEST_F(Request, TheCallersTimeLimitEndsAnExchange) {
     answer.delay_ms = 30000;
     m_pServer->AnswerNext(kApi, answer);
     EXPECT_FALSE(request.Process(true, 1));
-    EXPECT_EQ(ZELO::CredRequestUtil::LatestAnswer().httpStatus, 0) << "none arrived";
+    EXPECT_EQ(ZELO::LatestExchange().httpStatus, 0) << "none arrived";
     EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_NETWORK));
     // The next one has its own, also one that is longer than the transport can count.
     answer.delay_ms = 1500;
     m_pServer->AnswerNext(kApi, answer);
     EXPECT_TRUE(request.Process(true, INT_MAX));
+}
+
+// What a look at the server meets, with and without trust in it.
+TEST_F(Request, EachExchangeIsRecorded) {
+    EXPECT_EQ(Https(), "/qrm/rpc");
+    const ZELO::Exchange discovery = ZELO::LatestExchange();
+    EXPECT_EQ(discovery.httpStatus, 200);
+    EXPECT_EQ(discovery.strWords, "");
+
+    fs::remove(kCaFile);
+    ZELO::Look look{"https", "localhost", m_pServer->HttpsPort(), "/qrm/discover", "api=a b",
+                    true,    10000};
+    for (const bool blVerify : {true, false}) {
+        look.blVerify = blVerify;
+        std::string strBody;
+        ZELO::Exchange met;
+        EXPECT_EQ(ZELO::LookAtServer(look, met, &strBody), !blVerify);
+        EXPECT_EQ(met.strUrl, "https://localhost:" + std::to_string(look.port) + "/qrm/discover");
+        EXPECT_EQ(met.strAddress, "127.0.0.1:" + std::to_string(look.port));
+        EXPECT_EQ(met.addresses.back(), met.strAddress);
+        EXPECT_EQ(met.httpStatus, blVerify ? 0 : 200);
+        EXPECT_EQ(met.errorCode == 0, blVerify);
+        EXPECT_EQ(met.strDate.empty(), blVerify);
+        EXPECT_EQ(met.code, unsigned{blVerify ? YLIBC_ERR_NETWORK : YLIBC_ERR_NONE});
+        EXPECT_EQ(met.strWords.empty(), !blVerify);
+        EXPECT_GE(met.connected_ms, 0);
+        EXPECT_EQ(met.answered_ms >= 0, !blVerify);
+        EXPECT_EQ(met.strTlsVersion, "TLSv1.3");
+        EXPECT_EQ(met.certificate.verifyCode, 20) << met.certificate.strVerifyWords;
+        EXPECT_TRUE(met.certificate.blNamesHost);
+        EXPECT_EQ(met.certificate.strFingerprint.size(), 64U);
+        EXPECT_NE(met.certificate.strChainPem.find("BEGIN CERTIFICATE"), std::string::npos);
+        EXPECT_LT(met.certificate.notBefore, met.certificate.notAfter);
+    }
+    EXPECT_EQ(Https(), "/qrm/rpc") << "over the connection that was verified";
+    EXPECT_TRUE(children::InOne([&] { return Https().empty(); })) << "a look lends no trust";
+
+    ZELO::Exchange met;
+    look.port = 1;
+    EXPECT_FALSE(ZELO::LookAtServer(look, met, nullptr));
+    EXPECT_GE(met.resolved_ms, 0);
+    EXPECT_EQ(met.connected_ms, -1);
+    look.strHost = "nowhere.invalid";
+    EXPECT_FALSE(ZELO::LookAtServer(look, met, nullptr));
+    EXPECT_EQ(met.resolved_ms, -1);
+    look.strHost = "a b";
+    EXPECT_FALSE(ZELO::LookAtServer(look, met, nullptr));
+    EXPECT_EQ(met.code, unsigned{YLIBC_ERR_INVALID_ARGUMENT});
+}
+
+// A thread holds many a lock while it connects; its child has to connect too.
+TEST_F(Request, AChildOfAFirstDiscoveryMakesItsOwn) {
+    constexpr int kRuns = 12;
+    EXPECT_TRUE(children::InEach(1, [&](int) {
+        for (int run = 0; run < kRuns; ++run) {
+            const bool blBoth = children::InOne([&] {
+                bool blOwn = false;
+                std::thread discovery([&] { blOwn = Https() == "/qrm/rpc"; });
+                std::this_thread::sleep_for(std::chrono::milliseconds(run));
+                const bool blChild = children::InOne([&] {
+                    alarm(10);
+                    return Https() == "/qrm/rpc";
+                });
+                discovery.join();
+                return blOwn && blChild;
+            });
+            if (!blBoth) {
+                return false;
+            }
+        }
+        return true;
+    }));
+}
+
+// What the callback of a response stream has forked.
+pid_t g_child = -1;
+
+TEST_F(Request, AForkInTheMiddleOfAReplyLeavesTheConnectionToTheParent) {
+    const Cred pCred = ServerAt("https", m_pServer->HttpsPort());
+    ZELO::CredRequest request;
+    ASSERT_TRUE(ZELO::CredRequestUtil::SetWebAPIURL(pCred.get(), kApi, 1, "join", &request));
+    std::FILE *const pStream = std::tmpfile();
+    devserver::NextAnswer answer;
+    answer.status = 200;
+    answer.body = "{}";
+    m_pServer->AnswerNext(kApi, answer);
+    g_child = -1;
+    request.SetRespStream(pStream, [](const char *, std::size_t cb, std::FILE *) {
+        g_child = fork();
+        return cb;
+    });
+    const bool blWhole = request.Process(true, 0);
+    if (g_child == 0) {
+        alarm(10);
+        _exit(!blWhole && Https() == "/qrm/rpc" ? 0 : 1);
+    }
+    EXPECT_TRUE(blWhole);
+    EXPECT_TRUE(children::Ended(g_child)) << "fails, and connects anew";
+    m_pServer->ForgetRequests();
+    EXPECT_EQ(Https(), "/qrm/rpc");
+    EXPECT_EQ(Https(), "/qrm/rpc");
+    EXPECT_EQ(Connections().size(), 1U);
+    std::fclose(pStream);
+}
+
+TEST_F(Request, ARequestWithoutMemorySaysSo) {
+    const Cred pCred = ServerAt("http", m_pServer->HttpPort());
+    EXPECT_FALSE(ZELO::CredRequestUtil::SetWebAPIURL(pCred.get(), kApi, 1, "join", nullptr));
+    EXPECT_EQ(YLIBCErrGet(), unsigned{YLIBC_ERR_OUT_OF_MEMORY});
 }
 
 }  // namespace

@@ -1,0 +1,25 @@
+// What a certificate says, in words and numbers that need no OpenSSL.
+
+#ifndef ZELO_HOST_CERTIFICATE_FACTS_H
+#define ZELO_HOST_CERTIFICATE_FACTS_H
+
+#include <openssl/x509.h>
+
+#include <string>
+
+#include "diagnosis.h"
+
+namespace host {
+
+// Subject, issuer, names, times and fingerprint. Throws std::bad_alloc, as all of these do.
+ZELO::ServerCertificate ReadCertificate(X509 *pCertificate);
+
+// The certificate as a PEM block.
+std::string PemOf(X509 *pCertificate);
+
+// Whether it is for the host, a name or an address without brackets.
+bool NamesHost(X509 *pCertificate, const std::string &strHost);
+
+}  // namespace host
+
+#endif
