@@ -58,7 +58,8 @@ Status ReadNames(std::vector<AuthorityFile> &files) {
 bool ReadFile(AuthorityFile &file) {
     FoundFile found;
     std::string strPem;
-    return FindFile(file.strPath.c_str(), found) == Find::kFile && ReadContent(found, strPem) &&
+    return !FindFile(file.strPath.c_str(), found).Failed() && found.blThere &&
+           !ReadContent(found, strPem).Failed() &&
            !ReadCertificates(strPem, file.certificates).Failed();
 }
 

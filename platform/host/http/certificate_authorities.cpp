@@ -75,10 +75,8 @@ Status ReadNew(const char *szPem, Authorities &authorities) {
 
 Status Write(const std::string &strPath, const std::string &strPem) {
     FoundFile found;
-    if (FindFile(strPath.c_str(), found) == Find::kFailed || ReplaceFile(found, strPem) < 0) {
-        return HOST_ERROR(YLIBCErrGet(), "cannot write '" + strPath + "'");
-    }
-    return {};
+    HOST_TRY(FindFile(strPath.c_str(), found));
+    return ReplaceFile(found, strPem);
 }
 
 bool IsThere(const Authorities &authorities, const std::string &strFingerprint) {
