@@ -1,5 +1,6 @@
 // Web API calls, against the bare libcurl exchanges that they come down to.
 
+#include <fstream>
 #include <memory>
 
 #include "bare_exchange.h"
@@ -21,9 +22,11 @@ bool Call(bool blUseCache) {
            json::IsTrue(json::Member(reply, "success"));
 }
 
+constexpr const char *kAllAuthorities = "/tmp/zelo-bench-authorities.pem";
+constexpr const char *kBody = R"({"api":"ZELO.QRM.RPC","method":"info","params":{},"version":1})";
+
 void PrepareCall(BareExchange &bare, const std::string &strUrl) {
-    bare.Post(strUrl, R"({"api":"ZELO.QRM.RPC","method":"info","params":{},"version":1})",
-              kServerToken);
+    bare.Post(strUrl, kBody, kServerToken);
 }
 
 Pair WarmPair(bool blUseCache) {
@@ -64,6 +67,33 @@ Pair ColdPair() {
     return {{nullptr, nullptr, subject}, {nullptr, nullptr, peer}};
 }
 
+// The authorities that the library trusts, in one file: the command takes no two.
+void WriteAuthorities() {
+    std::ofstream all(kAllAuthorities);
+    for (const char *szPath : {"/etc/ssl/certs/ca-certificates.crt", kAuthority}) {
+        all << std::ifstream(szPath).rdbuf();
+    }
+    Require(all.flush().good(), "cannot write the authorities");
+}
+
+// Both as programs, each from its start to its end.
+Pair ProgramPair() {
+    const auto pServer = std::make_shared<ServerProcess>();
+    pServer->Join(kHttps);
+    WriteAuthorities();
+    const auto subject = [pServer] {
+        return RunProgram({QRMCTL, "call", kConstantApi, kConstantMethod});
+    };
+    const auto peer = [pServer] {
+        const std::string strToken = std::string("Authorization: Bearer ") + kServerToken;
+        const std::string strUrl = pServer->Url(kHttps, "/qrm/rpc");
+        return RunProgram({"curl", "--silent", "--fail", "--noproxy", "*", "--cacert",
+                           kAllAuthorities, "--header", strToken.c_str(), "--header",
+                           "Content-Type: application/json", "--data", kBody, strUrl.c_str()});
+    };
+    return {{subject, nullptr}, {peer, nullptr}};
+}
+
 }  // namespace
 
 void AddColdCallRow() {
@@ -76,6 +106,7 @@ void AddCallRows() {
             [] { return WarmPair(true); }, ""});
     AddRow({"ZELOQRMClientSendWebapi, useCache false", "bare libcurl exchange", 1.60,
             [] { return WarmPair(false); }, ""});
+    AddRow({"qrmctl call, as a process", "curl command", 1.5, ProgramPair, "", 41});
 }
 
 }  // namespace bench

@@ -1,5 +1,8 @@
 #include "child_process.h"
 
+#include <fcntl.h>
+
+#include <spawn.h>
 #include <sys/prctl.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -82,6 +85,19 @@ double InChild(const std::function<double()> &body) {
     child.Read(number);
     waitpid(child.Pid(), nullptr, 0);
     return number;
+}
+
+bool RunProgram(std::vector<const char *> arguments) {
+    posix_spawn_file_actions_t actions;
+    posix_spawn_file_actions_init(&actions);
+    posix_spawn_file_actions_addopen(&actions, STDOUT_FILENO, "/dev/null", O_WRONLY, 0);
+    arguments.push_back(nullptr);
+    pid_t pid = -1;
+    const int error = posix_spawnp(&pid, arguments[0], &actions, nullptr,
+                                   const_cast<char **>(arguments.data()), environ);
+    posix_spawn_file_actions_destroy(&actions);
+    int status = -1;
+    return error == 0 && waitpid(pid, &status, 0) == pid && status == 0;
 }
 
 ServerProcess::ServerProcess() {

@@ -8,6 +8,7 @@
 
 #include <functional>
 #include <string>
+#include <vector>
 
 namespace bench {
 
@@ -20,6 +21,9 @@ constexpr const char *kConstantMethod = "info";
 
 // Runs the body in a child process and returns its number; -1 when the child died.
 double InChild(const std::function<double()> &body);
+
+// Runs a program with its output going nowhere. True when it went well.
+bool RunProgram(std::vector<const char *> arguments);
 
 // A development server in a process of its own, trusted by the appliance until the next one. Ends
 // with its owner.

@@ -1,14 +1,11 @@
 // Files from the server and their digests, against the programs and bare loops that do the same.
 
 #include <fcntl.h>
-#include <spawn.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <cstring>
 #include <fstream>
 #include <memory>
-#include <vector>
 
 #include "bare_exchange.h"
 #include "child_process.h"
@@ -37,20 +34,6 @@ constexpr long kLibraryBuffer = 512 * 1024L;
 
 bool RemoveFile() {
     return unlink(kFile) == 0;
-}
-
-// Runs a program with its output going nowhere. True when it went well.
-bool RunProgram(std::vector<const char *> arguments) {
-    posix_spawn_file_actions_t actions;
-    posix_spawn_file_actions_init(&actions);
-    posix_spawn_file_actions_addopen(&actions, STDOUT_FILENO, "/dev/null", O_WRONLY, 0);
-    arguments.push_back(nullptr);
-    pid_t pid = -1;
-    const int error = posix_spawnp(&pid, arguments[0], &actions, nullptr,
-                                   const_cast<char **>(arguments.data()), environ);
-    posix_spawn_file_actions_destroy(&actions);
-    int status = -1;
-    return error == 0 && waitpid(pid, &status, 0) == pid && status == 0;
 }
 
 bool Download(int mib, const char *szPath) {

@@ -17,7 +17,9 @@
 #include <memory>
 #include <vector>
 
+#include "bare_exchange.h"
 #include "child_process.h"
+#include "json.h"
 #include "ratio_table.h"
 #include "rows.h"
 #include "text_containers.h"
@@ -83,7 +85,7 @@ void WriteAllStrings() {
 
 // --- Subject ------------------------------------------------------------------------------------
 
-bool Convert() {
+YLIBSZLIST *Params() {
     static YLIBSZLIST *const pParams = [] {
         YLIBSZLIST *pList = YLIBCSzListAlloc(512);
         const auto &[strSection, strKey] = kWanted[1];
@@ -92,8 +94,12 @@ bool Convert() {
                         ("_T(" + kWanted[2].strSection + ',' + kWanted[2].strKey + ')').c_str());
         return pList;
     }();
+    return pParams;
+}
+
+bool Convert() {
     Json::Value texts;
-    return ConvertLog(kWanted[0].strSection.c_str(), kWanted[0].strKey.c_str(), pParams, texts) ==
+    return ConvertLog(kWanted[0].strSection.c_str(), kWanted[0].strKey.c_str(), Params(), texts) ==
                0 &&
            texts.size() == kLanguages.size();
 }
@@ -187,6 +193,37 @@ Pair LaterPair() {
     return {{Convert, nullptr}, {ReadAndSearch, nullptr}};
 }
 
+// The peer sends the body that the library sends, ready made.
+Pair PushPair() {
+    WriteAllStrings();
+    const auto pServer = std::make_shared<ServerProcess>();
+    pServer->Join("https");
+    Json::Value call;
+    call["api"] = "ZELO.QRM.RPC.Log";
+    call["method"] = "push";
+    call["version"] = 1;
+    Json::Value &params = call["params"];
+    params["happen_time"] = 1;
+    params["level"] = "info";
+    params["username"] = "[bench]";
+    Require(ConvertLog(kWanted[0].strSection.c_str(), kWanted[0].strKey.c_str(), Params(),
+                       params["log"]) == 0,
+            "cannot convert the message");
+    std::string strBody;
+    Require(json::ToString(call, strBody), "cannot write the body");
+    const auto pBare = std::make_shared<BareExchange>();
+    pBare->Post(pServer->Url("https", "/qrm/log"), strBody, kServerToken);
+    const auto subject = [pServer] {
+        return ZELOQRMClientLog(0, kWanted[0].strSection.c_str(), kWanted[0].strKey.c_str(),
+                                Params(), nullptr) == 0;
+    };
+    const auto peer = [pBare] {
+        Json::Value reply;
+        return pBare->Perform(reply);
+    };
+    return {{subject, nullptr}, {peer, nullptr}};
+}
+
 void AddFirst(const char *szPeer, double goal, bool (*pfnPeer)()) {
     AddRow({std::string("ConvertLog, first in a process, ") + szPeer, szPeer, goal,
             [=] { return FirstPair(pfnPeer); }, "", kPairs});
@@ -201,6 +238,10 @@ void AddLogRows() {
     AddFirst("inih", 1.0 / 10, LookUpByInih);
 #endif
     AddRow({"ConvertLog, later", "read and memmem", 1.0 / 20, LaterPair, ""});
+}
+
+void AddLogPushRow() {
+    AddRow({"ZELOQRMClientLog, warm", "bare libcurl exchange", 3.0, PushPair, ""});
 }
 
 }  // namespace bench

@@ -23,6 +23,7 @@ int main(int argc, char **argv) {
     bench::AddColdCallRow();
     bench::AddLogRows();
     bench::AddCallRows();
+    bench::AddLogPushRow();
     bench::AddConnectionRows();
     bench::AddCredentialRows();
     bench::AddFileRows();

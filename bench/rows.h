@@ -15,6 +15,7 @@ void AddConnectionRows();
 void AddCredentialRows();
 void AddDownloadRows(int mib);
 void AddFileRows();
+void AddLogPushRow();
 
 }  // namespace bench
 

@@ -75,7 +75,7 @@ Check CheckStored(Stored &stored, bool &blFound) {
     if (!IsStoreReadable()) {
         return StoreUnreadable();
     }
-    const long id = ZELOCredIDGetByApplication(kServerApplication);
+    const long id = ZELOCredIDGetByApplication(kQrmServer);
     if (id < 0) {
         return NothingStored();
     }
@@ -141,7 +141,7 @@ Check CheckToken(const Stored &stored) {
 
 bool ReadStoredServer(Way &way) {
     Stored stored;
-    const long id = ZELOCredIDGetByApplication(kServerApplication);
+    const long id = ZELOCredIDGetByApplication(kQrmServer);
     return id >= 0 && stored.pCred != nullptr && ZELOCredLoad(id, stored.pCred.get()) >= 0 &&
            ReadWay(stored.pCred.get(), way);
 }

@@ -5,6 +5,7 @@
 #include <iterator>
 #include <memory>
 
+#include "appliance.h"
 #include "commands.h"
 #include "credential_store.h"
 #include "input_file.h"
@@ -138,7 +139,7 @@ ExitCode Delete(Report &report) {
         return report.Fail(ErrorId::kCredentialNotRemoved,
                            "the credential could not be removed whole; -v shows the reason");
     }
-    if (ZELOCredIDGetByApplication("ZELO.QRM") >= 0) {
+    if (ZELOCredIDGetByApplication(appliance::kQrmServer) >= 0) {
         report.Warn("a server credential that was stored later is in force now: delete again");
         return report.Done();
     }

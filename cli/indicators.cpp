@@ -195,7 +195,7 @@ std::vector<Indicator> ReadIndicators() {
     indicators.push_back(ReadFlag(flag));
     EnterStage("reading the credential store");
     std::optional<ErrorId> flaw = StoreFlaw();
-    indicators.push_back(ReadCredential(flag, flaw, "server credential", kServerApplication, 1));
+    indicators.push_back(ReadCredential(flag, flaw, "server credential", kQrmServer, 1));
     indicators.push_back(
         ReadCredential(flag, flaw, "notification-center credential", kNotificationCenter, 3));
     EnterStage("asking the cache daemon's script for its status");

@@ -3,6 +3,7 @@
 #include <memory>
 #include <vector>
 
+#include "appliance.h"
 #include "commands.h"
 #include "joined_server.h"
 #include "key_value_file.h"
@@ -14,11 +15,9 @@
 namespace qrmctl {
 namespace {
 
-constexpr const char *kInfoFile = "/tmp/qrm_client.info";
-
 // Whether a key that has no value is there all the same.
 bool HasInfoKey(const std::string &strKey) {
-    return YLIBCFileCheckKeyValue(kInfoFile, strKey.c_str(), "", 0) == 1;
+    return YLIBCFileCheckKeyValue(appliance::kClientInfoFile, strKey.c_str(), "", 0) == 1;
 }
 
 ExitCode Get(const std::string &strKey, Report &report) {
@@ -70,12 +69,11 @@ bool SetVariable(const std::string &strText, YLIBSZHASH **ppHash) {
 
 // As the library does, which keeps to itself whether a notification was sent.
 int Send(const std::string &strTag, YLIBSZHASH **ppHash) {
-    constexpr const char *kServer = "%QRM_SERVER%";
-    if (YLIBCSzHashGetValue(*ppHash, kServer) == nullptr) {
+    if (YLIBCSzHashGetValue(*ppHash, appliance::kServerVariable) == nullptr) {
         const std::optional<JoinedServer> server = FindJoinedServer();
         const bool blKnown = server && server->host.isString();
         const std::string strHost = blKnown ? server->host.asString() : "Unknown";
-        if (YLIBCSzHashSetValue(ppHash, kServer, strHost.c_str()) < 0) {
+        if (YLIBCSzHashSetValue(ppHash, appliance::kServerVariable, strHost.c_str()) < 0) {
             return -1;
         }
     }

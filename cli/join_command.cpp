@@ -9,6 +9,7 @@
 #include <memory>
 #include <vector>
 
+#include "appliance.h"
 #include "candidates.h"
 #include "commands.h"
 #include "input_file.h"
@@ -21,8 +22,6 @@
 
 namespace qrmctl {
 namespace {
-
-constexpr const char *kApi = "ZELO.QRM.RPC";
 
 struct Options {
     std::string strServer;
@@ -80,14 +79,15 @@ bool BuildJoinInfo(const Options &options, Report &report, Json::Value &joinInfo
 // The first fact that the server has to be told and that cannot be read, as "'key' in 'file'";
 // empty when all can.
 std::string MissingFact() {
-    constexpr const char *kDefaults = "/etc.defaults/zeloinfo.conf";
-    constexpr const char *kVersion = "/etc.defaults/VERSION";
     constexpr struct {
         const char *szFile;
         const char *szKey;
-    } facts[] = {{kDefaults, "upnpmodelname"}, {kVersion, "majorversion"},
-                 {kVersion, "minorversion"},   {kVersion, "buildnumber"},
-                 {kConfigFile, "admin_port"},  {kConfigFile, "secure_admin_port"}};
+    } facts[] = {{appliance::kDefaultsFile, "upnpmodelname"},
+                 {appliance::kVersionFile, "majorversion"},
+                 {appliance::kVersionFile, "minorversion"},
+                 {appliance::kVersionFile, "buildnumber"},
+                 {kConfigFile, "admin_port"},
+                 {kConfigFile, "secure_admin_port"}};
     const bool blSecure = YLIBCFileCheckKeyValue(kConfigFile, "runHTTPS", "yes", 0) == 1;
     for (const auto &fact : facts) {
         char szValue[64];
@@ -266,9 +266,10 @@ ExitCode Join(const Options &options, Report &report) {
                                ", which the server has to be told; nothing was changed");
     }
     // Nothing is left, nor removed, for a server that cannot be had.
-    Report::Stage("asking " + CandidateNames(candidates) + " for the API '" + kApi + '\'');
+    Report::Stage("asking " + CandidateNames(candidates) + " for the API '" + appliance::kQrmApi +
+                  '\'');
     Json::Value connection;
-    if (!ZELOQRMClientTestConnect(candidates, kApi, connection)) {
+    if (!ZELOQRMClientTestConnect(candidates, appliance::kQrmApi, connection)) {
         return report.FailExchange(
             ErrorId::kNoServer,
             "no server answered at '" + options.strServer +

@@ -22,9 +22,6 @@
 namespace qrmctl {
 namespace {
 
-constexpr int kOwner = 1024;
-constexpr const char *kAccountFolder = "/usr/zelo/etc/QRM";
-
 // More credentials of one application than this are no accident.
 constexpr int kMaxLeaves = 100;
 
@@ -65,7 +62,7 @@ bool RemoveRemains(bool blRejoin) {
     if (!ZELOQRMClientDeleteServerUser()) {
         return false;
     }
-    std::filesystem::remove_all(kAccountFolder, error);
+    std::filesystem::remove_all(appliance::kAccountFolder, error);
     if (error || blRejoin) {
         return !error;
     }
@@ -78,7 +75,7 @@ bool RemoveRemains(bool blRejoin) {
 // --- What is gone for certain: what cannot be read may be there ---------------------------------
 
 bool AreCredentialsGone() {
-    for (const char *szApplication : {kServerApplication, kNotificationCenter}) {
+    for (const char *szApplication : {kQrmServer, kNotificationCenter}) {
         ZELO_CRED *pList = nullptr;
         const int count = ZELOCredListGet(&pList, ZELOCredKeepByApplication, szApplication);
         const CredListHandle list(pList);
@@ -113,7 +110,7 @@ bool StoreSerial(const std::string &strSerial) {
     extraInfo["sn"] = strSerial;
     std::string strText;
     const CredHandle pCred(ZELOCredAlloc());
-    const long id = ZELOCredIDGetByApplication(kServerApplication);
+    const long id = ZELOCredIDGetByApplication(kQrmServer);
     return pCred != nullptr && id >= 0 && json::ToString(extraInfo, strText) &&
            ZELOCredLoad(id, pCred.get()) >= 0 &&
            ZELOCredItemSetExtraInfo(pCred.get(), strText.c_str()) >= 0 &&
@@ -142,7 +139,7 @@ MembershipTurn::~MembershipTurn() {
 
 bool IsStoreReadable() {
     ZELO_CRED *pList = nullptr;
-    const int count = ZELOCredListGet(&pList, ZELOCredKeepByApplication, kServerApplication);
+    const int count = ZELOCredListGet(&pList, ZELOCredKeepByApplication, kQrmServer);
     const CredListHandle list(pList);
     return count >= 0;
 }
@@ -161,19 +158,19 @@ std::vector<std::string> StoresSetAside() {
 }
 
 bool StoreServerSession(const std::string &strToken) {
-    return StoreSession(ZELOCredIDGetByApplication(kServerApplication), strToken);
+    return StoreSession(ZELOCredIDGetByApplication(kQrmServer), strToken);
 }
 
 bool StoreNotificationCenter(const std::string &strToken) {
     const CredHandle pServer(ZELOCredAlloc());
     const CredHandle pCred(ZELOCredAlloc());
-    const long serverId = ZELOCredIDGetByApplication(kServerApplication);
+    const long serverId = ZELOCredIDGetByApplication(kQrmServer);
     const long now_s = std::time(nullptr);
     long id = -1;
     return pServer != nullptr && pCred != nullptr && serverId >= 0 &&
            ZELOCredLoad(serverId, pServer.get()) >= 0 && CopyServer(pServer.get(), pCred.get()) &&
            ZELOCredItemSetApplication(pCred.get(), kNotificationCenter) >= 0 &&
-           ZELOCredItemSetOwner(pCred.get(), kOwner) >= 0 &&
+           ZELOCredItemSetOwner(pCred.get(), appliance::kCredentialOwner) >= 0 &&
            ZELOCredItemSetCreateTime(pCred.get(), now_s) >= 0 &&
            ZELOCredItemSetModifyTime(pCred.get(), now_s) >= 0 && ZELOCredSave(pCred.get()) >= 0 &&
            ZELOCredItemGetID(&id, pCred.get()) >= 0 && StoreSession(id, strToken);

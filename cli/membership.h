@@ -8,16 +8,18 @@
 #include <string>
 #include <vector>
 
+#include "appliance.h"
+
 namespace qrmctl {
 
-constexpr const char *kConfigFile = "/etc/zeloinfo.conf";
-constexpr const char *kJoinFlag = "join_nvo_qrm";
-constexpr const char *kServerApplication = "ZELO.QRM";
-constexpr const char *kNotificationCenter = "ZELO.NotificationCenter";
-constexpr const char *kCacheDaemon = "/usr/zelo/etc/rc.d/S99zelocache.sh";
-constexpr const char *kServiceAccount = "ZelonixQRM";
-constexpr const char *kClientSessions[] = {"ZELO.QRM.Client", "ZELO.QRM.Client.Machine"};
-constexpr int kSessionIndex = 13;
+using appliance::kCacheDaemon;
+using appliance::kConfigFile;
+using appliance::kJoinFlag;
+using appliance::kNotificationCenter;
+using appliance::kQrmServer;
+using appliance::kServiceAccount;
+using appliance::kSessionIndex;
+constexpr const char *kClientSessions[] = {appliance::kClientSession, appliance::kMachineSession};
 
 // The steps of a join behind the library's own, each of which returns whether it succeeded. They
 // are taken in this order, the join flag last: "yes" is only ever written over a complete state.

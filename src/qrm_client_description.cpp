@@ -5,16 +5,13 @@
 #include <cstdlib>
 #include <cstring>
 
+#include "appliance.h"
 #include "fixed_text.h"
 #include "key_value_file.h"
 #include "serial_number.h"
 
 namespace client_description {
 namespace {
-
-constexpr const char *kConfig = "/etc/zeloinfo.conf";
-constexpr const char *kDefaults = "/etc.defaults/zeloinfo.conf";
-constexpr const char *kVersion = "/etc.defaults/VERSION";
 
 // The platform gives a custom serial number fewer bytes than its own.
 constexpr int kCustomSerialSize = 31;
@@ -30,7 +27,7 @@ bool ReadKey(const char *szPath, const char *szKey, FixedText<N> &value) {
 
 bool ReadPort(const char *szKey, long &port) {
     FactText value;
-    if (!ReadKey(kConfig, szKey, value)) {
+    if (!ReadKey(appliance::kConfigFile, szKey, value)) {
         return false;
     }
     port = std::strtol(value.sz(), nullptr, 10);
@@ -50,7 +47,7 @@ bool ReadHostName(std::string &strHostName) {
 
 bool ReadModel(std::string &strModel) {
     FactText model;
-    if (!ReadKey(kDefaults, "upnpmodelname", model)) {
+    if (!ReadKey(appliance::kDefaultsFile, "upnpmodelname", model)) {
         return false;
     }
     strModel = model.sz();
@@ -62,13 +59,14 @@ bool ReadVersion(Json::Value &description) {
     VersionText minor;
     VersionText smallFix;
     VersionText build;
-    if (!ReadKey(kVersion, "majorversion", major) || !ReadKey(kVersion, "minorversion", minor)) {
+    if (!ReadKey(appliance::kVersionFile, "majorversion", major) ||
+        !ReadKey(appliance::kVersionFile, "minorversion", minor)) {
         return false;
     }
-    if (!ReadKey(kVersion, "smallfixnumber", smallFix)) {
+    if (!ReadKey(appliance::kVersionFile, "smallfixnumber", smallFix)) {
         smallFix.Format("0");
     }
-    if (!ReadKey(kVersion, "buildnumber", build)) {
+    if (!ReadKey(appliance::kVersionFile, "buildnumber", build)) {
         return false;
     }
 
@@ -92,7 +90,7 @@ bool ReadSecureAdminPort(long &port) {
 }
 
 bool IsHttpsServed() {
-    return YLIBCFileCheckKeyValue(kConfig, "runHTTPS", "yes", 0) == 1;
+    return YLIBCFileCheckKeyValue(appliance::kConfigFile, "runHTTPS", "yes", 0) == 1;
 }
 
 bool ReadSerialNumber(std::string &strSerial) {

@@ -1,6 +1,7 @@
 // Client info file: how the latest dealings with the QRM server went, for programs outside the
 // library. It lies in "/tmp", so it starts empty after a restart of the appliance.
 
+#include "appliance.h"
 #include "fixed_text.h"
 #include "guard.h"
 #include "key_value_file.h"
@@ -10,14 +11,14 @@
 
 namespace {
 
-constexpr const char *kDataFile = "/tmp/qrm_client.info";
 constexpr const char *kLockFile = "/tmp/qrm_client.info.lock";
 
 // No lock: a file is only ever replaced as a whole, so a reader sees the old text or the new one.
 bool GetInfo(const std::string &key, std::string &value) {
     FixedText<1024> text;
-    if (!IsTerminatedText(key) || YLIBCFileGetKeyValue(kDataFile, key.c_str(), text.Buffer(),
-                                                       FixedText<1024>::Size(), 0) < 0) {
+    if (!IsTerminatedText(key) ||
+        YLIBCFileGetKeyValue(appliance::kClientInfoFile, key.c_str(), text.Buffer(),
+                             FixedText<1024>::Size(), 0) < 0) {
         return false;
     }
     value = text.sz();
@@ -30,7 +31,7 @@ bool SetInfo(const std::string &key, const std::string &value) {
     }
     FileLock lock;
     return YLIBCFileLockByFile(kLockFile, 0, lock.Address()) > 0 &&
-           YLIBCFileSetKeyValue(kDataFile, key.c_str(), value.c_str(), 0) >= 0;
+           YLIBCFileSetKeyValue(appliance::kClientInfoFile, key.c_str(), value.c_str(), 0) >= 0;
 }
 
 }  // namespace

@@ -2,6 +2,7 @@
 
 #include <cstdlib>
 
+#include "appliance.h"
 #include "fixed_text.h"
 #include "guard.h"
 #include "json.h"
@@ -16,16 +17,6 @@
 #include "zeloqrmclient.h"
 
 namespace {
-
-constexpr const char *kInfoFile = "/etc/zeloinfo.conf";
-constexpr const char *kJoinFlag = "join_nvo_qrm";
-constexpr const char *kServerApplication = "ZELO.QRM";
-constexpr const char *kNotificationCenter = "ZELO.NotificationCenter";
-constexpr const char *kCacheDaemon = "/usr/zelo/etc/rc.d/S99zelocache.sh";
-constexpr const char *kClientSession = "ZELO.QRM.Client";
-constexpr const char *kMachineSession = "ZELO.QRM.Client.Machine";
-constexpr int kSessionIndex = 13;
-constexpr const char *kServiceAccount = "ZelonixQRM";
 
 // Released whether or not it could be made ready.
 class CgiContext {
@@ -66,14 +57,15 @@ int Disagree(const char *szRule, int line) {
 
 bool HasClientSession() {
     CgiContext context;
-    return context.Init() &&
-           (ZeloCgiSessionExistByIndex(context.Get(), kSessionIndex, kClientSession) != 0 ||
-            ZeloCgiSessionExistByIndex(context.Get(), kSessionIndex, kMachineSession) != 0);
+    return context.Init() && (ZeloCgiSessionExistByIndex(context.Get(), appliance::kSessionIndex,
+                                                         appliance::kClientSession) != 0 ||
+                              ZeloCgiSessionExistByIndex(context.Get(), appliance::kSessionIndex,
+                                                         appliance::kMachineSession) != 0);
 }
 
 int CheckServiceAccount(const Joined &joined) {
     MovingHandle<ZELO_USER, ZELOUserFree> user;
-    const bool blExists = ZELOUserGet(kServiceAccount, user.Address()) == 0;
+    const bool blExists = ZELOUserGet(appliance::kServiceAccount, user.Address()) == 0;
     if (joined.blYes && !blExists) {
         return DISAGREE("TRUE == blJoined");
     }
@@ -86,8 +78,9 @@ int CheckServiceAccount(const Joined &joined) {
 
 // The indicators in a fixed order; the first that disagrees with the flag ends the walk.
 int Status() {
-    const Joined joined(YLIBCFileCheckKeyValue(kInfoFile, kJoinFlag, "yes", 0));
-    for (const char *szApplication : {kServerApplication, kNotificationCenter}) {
+    const Joined joined(
+        YLIBCFileCheckKeyValue(appliance::kConfigFile, appliance::kJoinFlag, "yes", 0));
+    for (const char *szApplication : {appliance::kQrmServer, appliance::kNotificationCenter}) {
         const long credId = ZELOCredIDGetByApplication(szApplication);
         if (joined.blNo && credId >= 0) {
             return DISAGREE("FALSE == blJoined && 0 <= CredId");
@@ -96,7 +89,7 @@ int Status() {
             return DISAGREE("TRUE == blJoined && 0 > CredId");
         }
     }
-    const int runRet = YLIBCExec(kCacheDaemon, "status", nullptr, nullptr, nullptr);
+    const int runRet = YLIBCExec(appliance::kCacheDaemon, "status", nullptr, nullptr, nullptr);
     if (joined.blNo && runRet == 0) {
         return DISAGREE("FALSE == blJoined && 0 == runRet");
     }
@@ -121,7 +114,6 @@ int Status() {
 constexpr const char *kPlugin = "qrm_client/disjoin";
 constexpr const char *kAdminCenter = "ZELO.PKV.AdminCenter.Application";
 constexpr const char *kDetachSuccess = "QRMClientDetachSuccess";
-constexpr const char *kServerVariable = "%QRM_SERVER%";
 constexpr int kHashSize = 512;
 
 struct Request {
@@ -144,7 +136,7 @@ bool ReadField(int (*pfnGet)(char *, int, const ZELO_CRED *), const ZELO_CRED *p
 
 // Host, protocol, extra information and port; false when one of them cannot be read.
 bool ReadServer(__tag_ZELO_QRM_SERVER_INFO__ &server, std::string &strExtraInfo) {
-    const long id = ZELOCredIDGetByApplication(kServerApplication);
+    const long id = ZELOCredIDGetByApplication(appliance::kQrmServer);
     if (id < 0) {
         return false;
     }
@@ -184,8 +176,10 @@ bool RemoveSessions() {
     if (!context.Init()) {
         return false;
     }
-    if (ZeloCgiRemoveSessionByIndex(context.Get(), kSessionIndex, kClientSession) == 0 ||
-        ZeloCgiRemoveSessionByIndex(context.Get(), kSessionIndex, kMachineSession) == 0) {
+    if (ZeloCgiRemoveSessionByIndex(context.Get(), appliance::kSessionIndex,
+                                    appliance::kClientSession) == 0 ||
+        ZeloCgiRemoveSessionByIndex(context.Get(), appliance::kSessionIndex,
+                                    appliance::kMachineSession) == 0) {
         ZELO_LOG("Remove QRM session fail.");
         return false;
     }
@@ -203,7 +197,7 @@ bool SetFlag(const char *szKey, const char *szValue) {
 void NotifyDetached(const char *szHost) {
     HashHandle variables(YLIBCSzHashAlloc(kHashSize));
     if (variables.Get() == nullptr ||
-        YLIBCSzHashSetValue(variables.Address(), kServerVariable, szHost) < 0) {
+        YLIBCSzHashSetValue(variables.Address(), appliance::kServerVariable, szHost) < 0) {
         ZELO_LOG("Failed to execute YLIBCSzHash operations");
         return;
     }
@@ -213,7 +207,7 @@ void NotifyDetached(const char *szHost) {
 // Takes away what joining left behind, in a fixed order, and stops at the first failure: what is
 // done stays done, and leaving again does the rest.
 bool RemoveTraces(bool blRejoin, const char *szHost) {
-    if (YLIBCExec(kCacheDaemon, "stop", nullptr, nullptr, nullptr) < 0) {
+    if (YLIBCExec(appliance::kCacheDaemon, "stop", nullptr, nullptr, nullptr) < 0) {
         ZELO_LOG("Stop cache daemon fail");
         return false;
     }
@@ -229,7 +223,8 @@ bool RemoveTraces(bool blRejoin, const char *szHost) {
         ZELO_LOG("Remove User fail");
         return false;
     }
-    if (!SetFlag("nvo_qrm_self_join", "no") || !SetFlag(kJoinFlag, blRejoin ? "rejoin" : "no")) {
+    if (!SetFlag("nvo_qrm_self_join", "no") ||
+        !SetFlag(appliance::kJoinFlag, blRejoin ? "rejoin" : "no")) {
         return false;
     }
     if (blRejoin) {

@@ -5,6 +5,7 @@
 #include <string>
 #include <vector>
 
+#include "appliance.h"
 #include "credential_store.h"
 #include "guard.h"
 #include "json.h"
@@ -21,11 +22,8 @@ using json::HasMember;
 using json::Member;
 using json::Text;
 
-constexpr const char *kApplication = "ZELO.QRM";
-constexpr const char *kApi = "ZELO.QRM.RPC";
 constexpr const char *kMethod = "join";
 constexpr int kVersion = 1;
-constexpr int kOwner = 1024;
 
 // --- Connection test ----------------------------------------------------------------------------
 
@@ -122,18 +120,20 @@ Json::Value BuildCandidates(const Json::Value &joinInfo) {
 
 bool Connect(const Json::Value &candidates, ZELO_CRED *pCred, ZELO::CredRequest *pRequest) {
     Json::Value connection(Json::objectValue);
-    if (!ZELOQRMClientTestConnect(candidates, kApi, connection)) {
+    if (!ZELOQRMClientTestConnect(candidates, appliance::kQrmApi, connection)) {
         return false;
     }
     return ZELOCredItemSetProtocol(pCred, connection["protocol"].asCString()) >= 0 &&
            ZELOCredItemSetHost(pCred, connection["host"].asCString()) >= 0 &&
            ZELOCredItemSetPort(pCred, connection["port"].asInt()) >= 0 &&
-           ZELO::CredRequestUtil::SetWebAPIURL(pCred, kApi, kVersion, kMethod, pRequest);
+           ZELO::CredRequestUtil::SetWebAPIURL(pCred, appliance::kQrmApi, kVersion, kMethod,
+                                               pRequest);
 }
 
 bool SaveServer(ZELO_CRED *pCred) {
-    return ZELOCredItemSetApplication(pCred, kApplication) >= 0 &&
-           ZELOCredItemSetOwner(pCred, kOwner) >= 0 && ZELOCredSave(pCred) >= 0;
+    return ZELOCredItemSetApplication(pCred, appliance::kQrmServer) >= 0 &&
+           ZELOCredItemSetOwner(pCred, appliance::kCredentialOwner) >= 0 &&
+           ZELOCredSave(pCred) >= 0;
 }
 
 bool DescribePorts(const Json::Value &joinInfo, Json::Value &description) {

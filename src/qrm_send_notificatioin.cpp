@@ -1,5 +1,6 @@
 // Notifications of the server link to the appliance's own users.
 
+#include "appliance.h"
 #include "guard.h"
 #include "json.h"
 #include "log.h"
@@ -9,17 +10,17 @@
 
 namespace {
 
-constexpr const char *kServerVariable = "%QRM_SERVER%";
 constexpr int kHashSize = 512;
 
 void SetServerVariable(YLIBSZHASH **ppHash) {
     Json::Value server(Json::objectValue);
     ZELOQRMClientGetServerCredential(server);
-    if (YLIBCSzHashGetValue(*ppHash, kServerVariable) != nullptr) {
+    if (YLIBCSzHashGetValue(*ppHash, appliance::kServerVariable) != nullptr) {
         return;
     }
     const char *szHost = json::Text(json::Member(server, "host"));
-    if (YLIBCSzHashSetValue(ppHash, kServerVariable, szHost == nullptr ? "Unknown" : szHost) < 0) {
+    if (YLIBCSzHashSetValue(ppHash, appliance::kServerVariable,
+                            szHost == nullptr ? "Unknown" : szHost) < 0) {
         ZELO_LOG("Failed to YLIBCSzHashSetValue[0x%04X %s:%d]", ZELO_LAST_ERROR);
     }
 }

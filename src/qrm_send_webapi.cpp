@@ -10,6 +10,7 @@
 #include <cstdio>
 #include <vector>
 
+#include "appliance.h"
 #include "connect_failed_marker.h"
 #include "descriptor.h"
 #include "destination.h"
@@ -27,7 +28,6 @@ namespace {
 
 using json::Member;
 
-constexpr const char *kApplication = "ZELO.QRM";
 constexpr long kDefaultRecord = -1;
 
 // --- The request cache --------------------------------------------------------------------------
@@ -77,7 +77,7 @@ bool ReloadSession(long id) {
 }
 
 bool Reload() {
-    const long id = ZELOCredIDGetByApplication(kApplication);
+    const long id = ZELOCredIDGetByApplication(appliance::kQrmServer);
     if (id < 0) {
         ZELO_LOG("QRM credential is not found. [0x%04X %s:%d]", ZELO_LAST_ERROR);
         return false;
@@ -210,7 +210,7 @@ FileHandle OpenDestination(const std::string &path) {
 
 int Fetch(std::FILE *pFile, const std::string &api, int ver, const std::string &method,
           const Json::Value &params) {
-    const long id = ZELOCredIDGetByApplication(kApplication);
+    const long id = ZELOCredIDGetByApplication(appliance::kQrmServer);
     if (id < 0) {
         return -1;
     }

@@ -4,6 +4,7 @@
 
 #include <ctime>
 
+#include "appliance.h"
 #include "credential_store.h"
 #include "fixed_text.h"
 #include "guard.h"
@@ -19,9 +20,6 @@ using json::HasMember;
 using json::Member;
 using json::Text;
 
-constexpr const char *kApplication = "ZELO.QRM";
-constexpr const char *kNotificationCenter = "ZELO.NotificationCenter";
-constexpr int kOwner = 1024;
 constexpr long kDefaultRecord = -1;
 
 using StoreText = FixedText<1024>;
@@ -53,7 +51,8 @@ bool SaveCredential(ZELO_CRED *pCred, const Json::Value &cred) {
     const long now_s = std::time(nullptr);
     return pCred != nullptr && ZELOCredItemSetCreateTime(pCred, now_s) >= 0 &&
            ZELOCredItemSetModifyTime(pCred, now_s) >= 0 &&
-           ZELOCredItemSetOwner(pCred, kOwner) >= 0 && SetPort(pCred, Member(cred, "port")) &&
+           ZELOCredItemSetOwner(pCred, appliance::kCredentialOwner) >= 0 &&
+           SetPort(pCred, Member(cred, "port")) &&
            SetText(ZELOCredItemSetHost, pCred, Member(cred, "host")) &&
            SetText(ZELOCredItemSetProtocol, pCred, Member(cred, "protocol")) &&
            SetText(ZELOCredItemSetApplication, pCred, Member(cred, "application")) &&
@@ -164,7 +163,7 @@ bool Get(Json::Value &out) {
         ZELO_LOG("Bad parameters");
         return false;
     }
-    const CredListHandle pCred = ListByApplication(kApplication);
+    const CredListHandle pCred = ListByApplication(appliance::kQrmServer);
     if (pCred == nullptr) {
         ZELO_LOG("cannot find qrm server info");
         return false;
@@ -178,12 +177,12 @@ bool GetWithToken(Json::Value &out) {
         ZELO_LOG("Bad parameters");
         return false;
     }
-    const CredListHandle pCred = ListByApplication(kApplication);
+    const CredListHandle pCred = ListByApplication(appliance::kQrmServer);
     if (pCred == nullptr) {
         ZELO_LOG("cannot find qrm server info");
         return false;
     }
-    out["application"] = kApplication;
+    out["application"] = appliance::kQrmServer;
     ReadServer(pCred.get(), out);
 
     long id = -1;
@@ -266,7 +265,8 @@ bool ZELOQRMClientCreateServerCredential(const Json::Value &cred) {
 
 bool ZELOQRMClientDeleteServerCredential() {
     return ZELO_GUARD(false, [] {
-        return RemoveByApplication(kApplication) && RemoveByApplication(kNotificationCenter);
+        return RemoveByApplication(appliance::kQrmServer) &&
+               RemoveByApplication(appliance::kNotificationCenter);
     });
 }
 

@@ -9,6 +9,7 @@
 #include <cstdlib>
 #include <cstring>
 
+#include "appliance.h"
 #include "fixed_text.h"
 #include "guard.h"
 #include "json.h"
@@ -22,8 +23,6 @@
 
 namespace {
 
-constexpr const char *kUser = "ZelonixQRM";
-constexpr const char *kGroup = "administrators";
 constexpr const char *kDescription = "This user is used for QRM";
 constexpr const char *kHome = "/var/services/homes/ZelonixQRM";
 constexpr const char *kShell = "/sbin/nologin";
@@ -42,7 +41,7 @@ using GroupHandle = MovingHandle<ZELO_GROUP, ZELOGroupFree>;
 using ResultHandle = MovingHandle<YLIBCM_RESULT, YLIBCMResultFree>;
 
 bool Exists(UserHandle &user) {
-    return ZELOUserGet(kUser, user.Address()) == 0;
+    return ZELOUserGet(appliance::kServiceAccount, user.Address()) == 0;
 }
 
 // Whether the account is known not to be there. Accounts that cannot be read may hold it.
@@ -108,7 +107,8 @@ bool AllocateResult(ResultHandle &result) {
 
 bool Save(const char *szCurrentName, const ZELO_USER *pUser, ResultHandle &result) {
     if (ZELOUserSetOne(szCurrentName, pUser, result.Address()) < 0) {
-        ZELO_LOG("ZELOUserSet [%s] failed. [0x%04X %s:%d]", kUser, ZELO_LAST_ERROR);
+        ZELO_LOG("ZELOUserSet [%s] failed. [0x%04X %s:%d]", appliance::kServiceAccount,
+                 ZELO_LAST_ERROR);
         return false;
     }
     return true;
@@ -137,9 +137,10 @@ bool RefreshUser(ZELO_USER *pUser, const Password &password) {
 
 bool AddUser(const Password &password) {
     UserHandle user;
-    if (ZELOUserAlloc(user.Address(), kUser, password.sz(), kUid, kGid, kDescription, kHome, kShell,
-                      kExpireDay, kEnabled, nullptr) < 0) {
-        ZELO_LOG("Failed to Alloc USER [%s] [0x%04X %s:%d]", kUser, ZELO_LAST_ERROR);
+    if (ZELOUserAlloc(user.Address(), appliance::kServiceAccount, password.sz(), kUid, kGid,
+                      kDescription, kHome, kShell, kExpireDay, kEnabled, nullptr) < 0) {
+        ZELO_LOG("Failed to Alloc USER [%s] [0x%04X %s:%d]", appliance::kServiceAccount,
+                 ZELO_LAST_ERROR);
         return false;
     }
     const int remained = YLIBUserNumRemained();
@@ -205,7 +206,7 @@ bool AppendMember(MemberList &members, const char *szName) {
 std::size_t CountMembers(const ZELO_GROUP *pGroup, bool &blIsMember) {
     std::size_t count = 0;
     for (char **ppsz = pGroup->ppszMembers; ppsz != nullptr && *ppsz != nullptr; ++ppsz, ++count) {
-        blIsMember = blIsMember || std::strcmp(*ppsz, kUser) == 0;
+        blIsMember = blIsMember || std::strcmp(*ppsz, appliance::kServiceAccount) == 0;
     }
     return count;
 }
@@ -221,7 +222,7 @@ bool AddMember(ZELO_GROUP *pGroup, std::size_t count) {
             return false;
         }
     }
-    if (!AppendMember(members, kUser)) {
+    if (!AppendMember(members, appliance::kServiceAccount)) {
         return false;
     }
     // The record takes the new list over, and leaves the old one to be released here.
@@ -238,8 +239,9 @@ bool Create() {
         return false;
     }
     GroupHandle group;
-    if (ZELOGroupGet(kGroup, group.Address()) < 0) {
-        ZELO_LOG("ZELOGroupGet [%s] failed. [0x%04X %s:%d]", kGroup, ZELO_LAST_ERROR);
+    if (ZELOGroupGet(appliance::kAdministrators, group.Address()) < 0) {
+        ZELO_LOG("ZELOGroupGet [%s] failed. [0x%04X %s:%d]", appliance::kAdministrators,
+                 ZELO_LAST_ERROR);
         return false;
     }
     bool blIsMember = false;
@@ -250,9 +252,9 @@ bool Create() {
     if (!AddMember(group.Get(), count)) {
         return false;
     }
-    if (!ZELOQRMUserWelcomPage(kUser, false)) {
-        ZELO_LOG("Failed to hid welcom page for ZelonixQRM. [%s] [0x%04X %s:%d]", kUser,
-                 ZELO_LAST_ERROR);
+    if (!ZELOQRMUserWelcomPage(appliance::kServiceAccount, false)) {
+        ZELO_LOG("Failed to hid welcom page for ZelonixQRM. [%s] [0x%04X %s:%d]",
+                 appliance::kServiceAccount, ZELO_LAST_ERROR);
     }
     static_cast<void>(mkdir(kFolder, kFolderMode));
     static_cast<void>(YLIBServiceTypeReload(kServiceType));
@@ -274,7 +276,7 @@ bool DeleteLocked(ResultHandle &result) {
         ZELO_LOG("malloc fail");
         return false;
     }
-    *names = kUser;
+    *names = appliance::kServiceAccount;
     if (ZELOUserDelete(names.get(), 1, result.Address()) == -1) {
         ZELO_LOG("ZELOUserDelete fail[%x]", YLIBCErrGet());
         return false;
