@@ -31,6 +31,12 @@ extern "C" {
 // nothing has failed yet; -1 for no buffer.
 ZELO_DIAGNOSIS_API int ZELODiagnosisReason(char *szReason, int cbReason);
 
+// Reads the certificates of the authorities that the appliance trusts besides the system's own, as
+// a request does. Returns how many there are; -1 when some cannot be read, which fails each request
+// over TLS too: trusting less than the operator meant is an error. The last error is YLIBC_ERR_FILE
+// then, and its words name the file or the folder.
+ZELO_DIAGNOSIS_API int ZELODiagnosisAuthorities(void);
+
 // --- The deadline
 // ---------------------------------------------------------------------------------
 //
@@ -80,6 +86,8 @@ struct ServerCertificate {
     int verifyCode = 0;
     int verifyDepth = 0;
     std::string strVerifyWords;
+    std::time_t verifyNotBefore = 0;  // since when, and until when, that certificate is valid
+    std::time_t verifyNotAfter = 0;
 };
 
 // One exchange. A stage that was not come to has the time -1; a connection that was kept from an

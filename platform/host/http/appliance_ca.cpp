@@ -17,8 +17,7 @@
 #include <system_error>
 #include <utility>
 
-#include "certificate_authorities.h"
-#include "fixed_text.h"
+#include "diagnosis.h"
 #include "printable.h"
 #include "status.h"
 
@@ -38,6 +37,9 @@ struct CloseFile {
 };
 struct FreeCertificate {
     void operator()(X509 *pCertificate) const { X509_free(pCertificate); }
+};
+struct FreeStore {
+    void operator()(X509_STORE *pStore) const { X509_STORE_free(pStore); }
 };
 
 bool IsPemName(const fs::path &path) {
@@ -119,18 +121,18 @@ bool AddApplianceCa(X509_STORE *pStore) {
 
 }  // namespace host
 
-int ZELOCertAddAuthorities(struct x509_store_st *pStore, char *szPlace, int cbPlace) {
-    if (pStore == nullptr || szPlace == nullptr || cbPlace <= 0) {
-        return host::Fail(YLIBC_ERR_INVALID_ARGUMENT, host::kFile, __LINE__);
-    }
-    try {
+int ZELODiagnosisAuthorities() {
+    int count = 0;
+    return HOST_OPERATION(-1, count, [&]() -> host::Status {
+        const std::unique_ptr<X509_STORE, host::FreeStore> pStore(X509_STORE_new());
         std::string strPath;
-        if (host::AddFolder(pStore, strPath)) {
-            return 0;
+        if (pStore == nullptr) {
+            throw std::bad_alloc();
         }
-        CopyToFit(szPlace, cbPlace, strPath);
-        return host::Fail(YLIBC_ERR_FILE, host::kFile, __LINE__);
-    } catch (const std::bad_alloc &) {
-        return host::Fail(YLIBC_ERR_OUT_OF_MEMORY, host::kFile, __LINE__);
-    }
+        if (!host::AddFolder(pStore.get(), strPath)) {
+            return HOST_ERROR(YLIBC_ERR_FILE, "cannot read certificates from '" + strPath + "'");
+        }
+        count = sk_X509_OBJECT_num(X509_STORE_get0_objects(pStore.get()));
+        return {};
+    });
 }
