@@ -11,8 +11,9 @@ extern "C" {
 
 int clock_gettime(clockid_t clock, timespec *pTime) noexcept {
     const long result = syscall(SYS_clock_gettime, clock, pTime);
-    if (result == 0 && clock == CLOCK_REALTIME) {
-        pTime->tv_sec += std::atol(std::getenv("CLOCK_SHIFT"));
+    const char *const szShift = std::getenv("CLOCK_SHIFT");
+    if (result == 0 && clock == CLOCK_REALTIME && szShift != nullptr) {
+        pTime->tv_sec += std::atol(szShift);
     }
     return static_cast<int>(result);
 }
