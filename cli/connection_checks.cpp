@@ -72,10 +72,6 @@ long Took(const Exchange &met, long begin_ms, long end_ms) {
     return std::max(0L, (end_ms < 0 ? met.whole_ms : end_ms) - std::max(0L, begin_ms));
 }
 
-bool HasTimedOut(const Exchange &met, const TimeLimit &limit) {
-    return met.error != 0 && (met.whole_ms >= kStep_ms || limit.IsOver());
-}
-
 // --- Name, TCP, tunnel --------------------------------------------------------------------------
 bool CheckRelay(CheckList &checks) {
     FixedText<1024> relay;
@@ -89,14 +85,14 @@ bool CheckRelay(CheckList &checks) {
     return checks.Ok("relay", 0, "farlink_relay is " + strRelay.substr(strRelay.rfind('@') + 1));
 }
 
-bool CheckName(const Way &way, const Exchange &met, bool blInTime, CheckList &checks) {
+bool CheckName(const Way &way, const Exchange &met, CheckList &checks) {
     const std::string strWhose = way.IsRelayed() ? "the relay's name" : "'" + way.strHost + "'";
     const long duration_ms = Took(met, 0, met.resolved_ms);
     if (met.resolved_ms < 0) {
-        return checks.Fail("name_resolution", duration_ms,
-                           strWhose + " has no address: " + met.strWords,
-                           blInTime ? "check the spelling, and the name servers of /etc/resolv.conf"
-                                    : "check that the name servers of /etc/resolv.conf answer");
+        return checks.Fail(
+            "name_resolution", duration_ms, strWhose + " has no address: " + met.strWords,
+            met.blTimedOut ? "check that the name servers of /etc/resolv.conf answer"
+                           : "check the spelling, and the name servers of /etc/resolv.conf");
     }
     std::string strAddresses;
     for (const std::string &strAddress : met.addresses) {
@@ -106,16 +102,16 @@ bool CheckName(const Way &way, const Exchange &met, bool blInTime, CheckList &ch
     return checks.Ok("name_resolution", duration_ms, strWhose + " is " + strAddresses);
 }
 
-bool CheckTcp(const Way &way, const Exchange &met, bool blInTime, CheckList &checks) {
+bool CheckTcp(const Way &way, const Exchange &met, CheckList &checks) {
     const long duration_ms = Took(met, met.resolved_ms, met.connected_ms);
     if (met.connected_ms >= 0) {
         return checks.Ok("tcp", duration_ms, "connected to " + met.strAddress);
     }
     const std::string strPeer = way.IsRelayed() ? "the relay" : "the server";
     return checks.Fail("tcp", duration_ms, met.strWords,
-                       blInTime
-                           ? "check the port, and that " + strPeer + " is running"
-                           : "check that " + strPeer + " is up and no firewall drops the packets");
+                       met.blTimedOut
+                           ? "check that " + strPeer + " is up and no firewall drops the packets"
+                           : "check the port, and that " + strPeer + " is running");
 }
 
 // Its time is a part of that of TLS.
@@ -148,14 +144,14 @@ bool CheckAuthorities(CheckList &checks) {
                      "is made");
 }
 
-bool CheckTls(const Way &way, const Exchange &met, bool blInTime, CheckList &checks) {
+bool CheckTls(const Way &way, const Exchange &met, CheckList &checks) {
     const long duration_ms = Took(met, met.connected_ms, met.secured_ms);
     const bool blSecured = met.secured_ms >= 0;
     if (met.relayStatus == kStatusProxyAuthentication) {
         return checks.Fail("tls", duration_ms, "the proxy refuses with status 407",
                            ProxyRemedy(way));
     }
-    if (!blSecured && !blInTime) {
+    if (!blSecured && met.blTimedOut) {
         return checks.Fail("tls", duration_ms, "the server does not answer: " + met.strWords,
                            "check that the port is the server's HTTPS port");
     }
@@ -242,10 +238,10 @@ const char *StatusRemedy(const Way &way, int status) {
                              : "check that a QRM server stands at this address and port";
 }
 
-bool CheckHttp(const Way &way, const Exchange &met, bool blInTime, CheckList &checks) {
+bool CheckHttp(const Way &way, const Exchange &met, CheckList &checks) {
     const long duration_ms = Took(met, std::max(met.connected_ms, met.secured_ms), met.whole_ms);
     const int status = met.httpStatus;
-    if (met.blCertificateAsked && blInTime &&
+    if (met.blCertificateAsked && !met.blTimedOut &&
         (status == 0 || status == kStatusBadRequest || status == kStatusForbidden)) {
         return checks.Fail("http", duration_ms, kCertificateAsked, kCertificateRemedy);
     }
@@ -287,14 +283,13 @@ bool CheckApi(const Way &way, const TimeLimit &limit, CheckList &checks) {
                        "check that a QRM server, in a version that serves the API, stands there");
 }
 
-bool CheckSecurity(const Way &way, const Exchange &met, bool blInTime, const TimeLimit &limit,
-                   CheckList &checks) {
+bool CheckSecurity(const Way &way, const Exchange &met, const TimeLimit &limit, CheckList &checks) {
     if (!way.IsSecure()) {
         return checks.Warn("tls", 0, "plain HTTP: nothing is encrypted, nobody is verified",
                            "use HTTPS; a join over this way needs --allow-http");
     }
     return CheckAuthorities(checks) && (!way.IsRelayed() || CheckTunnel(way, met, checks)) &&
-           CheckTls(way, met, blInTime, checks) && CheckCertificate(way, met, limit, checks);
+           CheckTls(way, met, checks) && CheckCertificate(way, met, limit, checks);
 }
 
 void Tell(const Way &way, const TimeLimit &limit, CheckList &checks) {
@@ -302,9 +297,8 @@ void Tell(const Way &way, const TimeLimit &limit, CheckList &checks) {
         return;
     }
     const Exchange met = LookAt(way, true, limit);
-    const bool blInTime = !HasTimedOut(met, limit);
-    if (CheckName(way, met, blInTime, checks) && CheckTcp(way, met, blInTime, checks) &&
-        CheckSecurity(way, met, blInTime, limit, checks) && CheckHttp(way, met, blInTime, checks)) {
+    if (CheckName(way, met, checks) && CheckTcp(way, met, checks) &&
+        CheckSecurity(way, met, limit, checks) && CheckHttp(way, met, checks)) {
         CheckClock(met, checks);
         CheckApi(way, limit, checks);
     }

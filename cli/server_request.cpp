@@ -2,6 +2,7 @@
 
 #include <limits>
 
+#include "certificate_authorities.h"
 #include "fixed_text.h"
 #include "last_error.h"
 
@@ -25,12 +26,17 @@ ZELO::Exchange LatestExchange() {
 }
 
 int CountAuthorities(std::string &strFlaw) {
-    const int count = ZELODiagnosisAuthorities != nullptr ? ZELODiagnosisAuthorities() : 0;
-    if (count < 0 && YLIBCErrGet() == YLIBC_ERR_FILE) {
+    int count = 0;
+    const auto countOne = [](void *pCount, const ZELO_CERT_AUTHORITY * /*pAuthority*/) {
+        ++*static_cast<int *>(pCount);
+    };
+    if (ZELOCertAuthorityList(countOne, &count) < 0 && YLIBCErrGet() == YLIBC_ERR_FILE) {
         FixedText<4096> reason;
-        ZELODiagnosisReason(reason.Buffer(), FixedText<4096>::Size());
-        strFlaw = std::string(reason.sz()) +
-                  ", so that no server is trusted over https: mend or remove it";
+        if (ZELODiagnosisReason != nullptr) {
+            ZELODiagnosisReason(reason.Buffer(), FixedText<4096>::Size());
+        }
+        strFlaw = reason.Empty() ? "a certificate authority of this appliance cannot be read"
+                                 : reason.sz();
     }
     return count;
 }

@@ -31,12 +31,6 @@ extern "C" {
 // nothing has failed yet; -1 for no buffer.
 ZELO_DIAGNOSIS_API int ZELODiagnosisReason(char *szReason, int cbReason);
 
-// Reads the certificates of the authorities that the appliance trusts besides the system's own, as
-// a request does. Returns how many there are; -1 when some cannot be read, which fails each request
-// over TLS too: trusting less than the operator meant is an error. The last error is YLIBC_ERR_FILE
-// then, and its words name the file or the folder.
-ZELO_DIAGNOSIS_API int ZELODiagnosisAuthorities(void);
-
 // --- The deadline
 // ---------------------------------------------------------------------------------
 //
@@ -99,11 +93,12 @@ struct Exchange {
     std::vector<std::string> addresses;  // that were tried, such as "192.0.2.7:5001", "[::1]:5001"
     std::string strAddress;              // the one that was connected to
     // Milliseconds from the beginning to the end of each stage.
-    long resolved_ms = -1;   // the name has addresses
-    long connected_ms = -1;  // TCP
-    long secured_ms = -1;    // TLS; through a relay that is behind its tunnel
-    long answered_ms = -1;   // the first byte of the answer
-    long whole_ms = -1;      // the end of the exchange, whatever came of it
+    long resolved_ms = -1;    // the name has addresses
+    long connected_ms = -1;   // TCP
+    long secured_ms = -1;     // TLS; through a relay that is behind its tunnel
+    long answered_ms = -1;    // the first byte of the answer
+    long whole_ms = -1;       // the end of the exchange, whatever came of it
+    bool blTimedOut = false;  // a limit of its time ended it
 
     int relayStatus = 0;        // what the relay, or a proxy, answered; 0: nothing
     std::string strTlsVersion;  // such as "TLSv1.3"
@@ -116,9 +111,14 @@ struct Exchange {
     std::string strRetryAfter;  //
     std::time_t ownTime = 0;    // this appliance's clock as the exchange ended
 
-    int error = 0;          // a value of CRED_REQ_ERROR; 0 when a whole reply arrived
-    unsigned int code = 0;  // the last error's (last_error.h), with its words: for one that failed,
-    std::string strWords;   // and for a discovery that found no path
+    // Why it failed, or, for a discovery, why the answer tells no path: a value of CRED_REQ_ERROR,
+    // 0 when a whole reply arrived; the last error's code (last_error.h); and the reason in words,
+    // without the server's name.
+    int error = 0;
+    unsigned int code = 0;
+    std::string strWords;
+    std::string
+        strRemedy;  // what mends it, where the platform knows; also for a reply that refuses
 };
 
 // The calling thread's latest exchange, discovery, call or look, also where it failed: for a

@@ -2,7 +2,8 @@
 //
 // A server is described by a credential record (credential_store.h) with three fields set:
 // protocol, host and port. The protocols are
-//     "https"  HTTP over TLS; the server's certificate and name are verified
+//     "https"  HTTP over TLS; the server's certificate and name are verified as
+//              certificate_authorities.h says
 //     "http"   plain HTTP
 //     "fld"    HTTPS through the platform's relay
 // and any other value fails. A request is built, sent with Process, and read.
@@ -10,10 +11,6 @@
 // What holds for every operation
 //   - Only http and https are ever spoken, a redirect is never followed, and a token goes only to
 //     the host and port of the record.
-//   - A TLS connection is verified against the system's authorities and the appliance's own as they
-//     are when it is made. A change counts for every connection that is made after it; one that was
-//     made before is used for three minutes at the most. It fails when an authority of the
-//     appliance cannot be read.
 //   - A call goes out at most once. When its connection ends before the reply, the request fails,
 //     and the server may have carried it out or not. The question for a path may be asked again.
 //   - A reply counts when it is there to its end. One whose body ends with the connection, instead

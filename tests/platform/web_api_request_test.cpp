@@ -293,7 +293,8 @@ TEST_F(Request, EachExchangeIsRecorded) {
     EXPECT_EQ(discovery.strWords, "");
 
     fs::remove(kCaFile);
-    ZELO::Look look{"https", "localhost", m_pServer->HttpsPort(), "/qrm/discover", "api=a b"};
+    ZELO::Look look{"https", "localhost", m_pServer->HttpsPort(), "/qrm/discover", "api=a b",
+                    true,    10000};
     for (const bool blVerify : {true, false}) {
         look.blVerify = blVerify;
         std::string strBody;

@@ -92,6 +92,15 @@ void NoteCertificate(X509_STORE_CTX *pVerification, bool blTrusted, const std::s
     exchange.strTlsVersion = SSL_get_version(pTls);
 }
 
+void NoteConnection(CURL *pEasy, ZELO::Exchange &exchange) {
+    const char *szAddress = nullptr;
+    if (exchange.connected_ms < 0 &&
+        curl_easy_getinfo(pEasy, CURLINFO_PRIMARY_IP, &szAddress) == CURLE_OK &&
+        szAddress != nullptr && szAddress[0] != '\0') {
+        exchange.connected_ms = Time(pEasy, CURLINFO_TOTAL_TIME_T);
+    }
+}
+
 void NoteAnswer(CURL *pEasy, ZELO::Exchange &exchange) {
     const char *szAddress = nullptr;
     long port = 0;
@@ -101,14 +110,14 @@ void NoteAnswer(CURL *pEasy, ZELO::Exchange &exchange) {
         exchange.strAddress = AddressText(szAddress, port);
     }
     exchange.resolved_ms = Time(pEasy, CURLINFO_NAMELOOKUP_TIME_T);
-    exchange.connected_ms = Time(pEasy, CURLINFO_CONNECT_TIME_T);
+    const long connected_ms = Time(pEasy, CURLINFO_CONNECT_TIME_T);
+    exchange.connected_ms = connected_ms < 0 ? exchange.connected_ms : connected_ms;
     exchange.secured_ms = Time(pEasy, CURLINFO_APPCONNECT_TIME_T);
+    if (exchange.addresses.empty()) {  // a connection that was kept
+        exchange.resolved_ms = exchange.connected_ms = exchange.secured_ms = -1;
+    }
     exchange.answered_ms = Time(pEasy, CURLINFO_STARTTRANSFER_TIME_T);
     exchange.whole_ms = Time(pEasy, CURLINFO_TOTAL_TIME_T);
-    // libcurl has no time for a connection whose TLS failed.
-    if (exchange.connected_ms < 0 && !exchange.strAddress.empty()) {
-        exchange.connected_ms = exchange.whole_ms;
-    }
     long status = 0;
     curl_easy_getinfo(pEasy, CURLINFO_RESPONSE_CODE, &status);
     exchange.httpStatus = static_cast<int>(status);

@@ -24,6 +24,9 @@ void NoteAddress(const sockaddr &address, ZELO::Exchange &exchange);
 void NoteCertificate(X509_STORE_CTX *pVerification, bool blTrusted, const std::string &strHost,
                      ZELO::Exchange &exchange);
 
+// The time at which there is a TCP connection: libcurl has none where TLS fails then.
+void NoteConnection(CURL *pEasy, ZELO::Exchange &exchange);
+
 // What libcurl knows when the exchange is over: the times, the address, the answers.
 void NoteAnswer(CURL *pEasy, ZELO::Exchange &exchange);
 

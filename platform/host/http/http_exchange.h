@@ -1,9 +1,10 @@
 // One HTTP exchange over the connections that this process keeps open.
 //
 // What the transport promises: certificate and host name of each connection are verified against
-// the system's and the appliance's own authorities; only http and https; no redirect; a POST is
-// sent at most once; no reply counts that is cut or encoded; connecting, stalling and a body in
-// memory are bounded; connections are used again, but never by a child process.
+// the system's and the appliance's own authorities, unless the request says otherwise; only http
+// and https; no redirect; a POST is sent at most once; no reply counts that is cut or encoded;
+// connecting, stalling, a body in memory and whatever else arrives are bounded, and the process's
+// deadline holds; connections are used again, but never by a child process.
 
 #ifndef ZELO_HOST_HTTP_EXCHANGE_H
 #define ZELO_HOST_HTTP_EXCHANGE_H
@@ -12,16 +13,17 @@
 #include <string>
 #include <vector>
 
+#include "status.h"
 #include "web_api_request.h"
 
 namespace host {
 
 struct HttpRequest {
-    std::string strUrl;
+    std::string strUrl;            // one of BuildUrl's
     bool blRelay = false;          // through the relay of the platform's configuration
     bool blPost = false;           // POST strBody as JSON; otherwise GET
     bool blKeepConnection = true;  // false: close the connection afterwards
-    long long timeout_ms = 0;      // for the whole exchange; 0: the transport's own
+    long long limit_ms = 0;        // for the whole exchange; 0: the transport's own
     bool blVerify = true;          // false: whoever answers; over a connection of its own
     bool blOwnConnection = false;  // none that is kept
     std::string strBody;
@@ -31,24 +33,20 @@ struct HttpRequest {
     std::FILE *pStream = nullptr;
     ZELO::CredRequest::RespWriteCallback pfnWrite = nullptr;
     bool blHasCopy = false;  // the request tells of a copy that may turn out to be current
-
-    // Who watches the exchange.
-    ZELO::CredRequestUtil::ProgressObserver pfnObserver = nullptr;
-    void *pObserverContext = nullptr;
 };
 
 struct HttpReply {
+    int error = ZELO::CRED_REQ_ERR_NONE;  // why there is none
     long status = 0;
     std::string strBody;
 };
 
-// Performs the exchange. Returns CRED_REQ_ERR_NONE when a whole reply arrived, whatever its status
-// (with a stream: one of 2xx, and written whole). Otherwise returns another value of
-// CRED_REQ_ERROR, sets the last error and writes one log line with the URL and the reason; reply
-// then holds the status, and what came of the body into memory, as far as there was one. That the
-// caller's copy is current is worth no log line. The thread's latest exchange is this one then.
+// Performs the exchange, watched by the thread's progress observer; it is the thread's latest
+// exchange then. It succeeds when a whole reply arrived, whatever its status (with a stream: one of
+// 2xx, and written whole). Otherwise reply holds the status, and what came of the body into memory,
+// as far as there was one. A failure is to be logged, except that the caller's copy is current.
 // Throws std::bad_alloc.
-int Perform(const HttpRequest &request, HttpReply &reply);
+Status Perform(const HttpRequest &request, HttpReply &reply);
 
 // Builds an URL; the host may be a name, an IPv4 or an IPv6 address, the query empty or
 // "name=value" with a value that is encoded here. Empty when a part does not fit into an URL: a

@@ -1,116 +1,23 @@
-// Web API requests: discovery of an API's path and calls of its methods.
+// Web API requests: calls of a server's methods.
 
 #include "web_api_request.h"
 
-#include <syslog.h>
-
 #include <algorithm>
-#include <map>
-#include <mutex>
 #include <new>
 #include <utility>
 
-#include "diagnosis.h"
-#include "exchange_record.h"
-#include "fork_safe.h"
+#include "discovery.h"
 #include "http_exchange.h"
 #include "json.h"
-#include "never_destroyed.h"
-#include "printable.h"
+#include "server_address.h"
 #include "status.h"
 #include "store/credential_record.h"
 
 namespace ZELO {
 namespace {
 
-constexpr const char *kFile = "web_api_request";
 constexpr const char *kDigest = "md5";
-constexpr const char *kDiscoveryPath = "/qrm/discover";
-constexpr long kStatusOk = 200;
 constexpr long kStatusNotFound = 404;
-constexpr std::size_t kMaxPath = 1024;
-constexpr std::size_t kMaxUrls = 256;
-
-// A server as its credential record describes it.
-struct Server {
-    std::string strScheme;
-    std::string strHost;
-    long port = 0;
-    bool blRelay = false;
-
-    std::string Key(const std::string &api) const {
-        return (blRelay ? "fld" : strScheme) + ' ' + std::to_string(port) + ' ' + strHost + ' ' +
-               api;
-    }
-    std::string Url(const std::string &strPath, const std::string &strQuery = "") const {
-        return host::BuildUrl(strScheme, strHost, port, strPath, strQuery);
-    }
-};
-
-bool ReadServer(const std::string &strProtocol, const std::string &strHost, long port,
-                Server &server) {
-    if (strProtocol != "https" && strProtocol != "http" && strProtocol != "fld") {
-        return false;
-    }
-    server.blRelay = strProtocol == "fld";
-    server.strScheme = server.blRelay ? "https" : strProtocol;
-    server.strHost = strHost;
-    server.port = port;
-    return !server.strHost.empty();
-}
-
-bool ReadServer(const ZELO_CRED *pCred, Server &server) {
-    return pCred != nullptr && pCred->protocol && pCred->host && pCred->port &&
-           ReadServer(*pCred->protocol, *pCred->host, *pCred->port, server);
-}
-
-// The URLs that this process has learnt, by server and API.
-std::mutex g_urlMutex;
-const int g_forkHandlers = HoldAroundForks<g_urlMutex>();
-host::NeverDestroyed<std::map<std::string, std::string>> g_urls;
-
-std::string FindUrl(const std::string &strKey) {
-    const std::lock_guard<std::mutex> lock(g_urlMutex);
-    const auto at = g_urls->find(strKey);
-    return at == g_urls->end() ? std::string() : at->second;
-}
-
-void LearnUrl(const std::string &strKey, const std::string &strUrl) {
-    const std::lock_guard<std::mutex> lock(g_urlMutex);
-    if (g_urls->size() >= kMaxUrls) {
-        g_urls->clear();
-    }
-    (*g_urls)[strKey] = strUrl;
-}
-
-void ForgetUrl(const std::string &strKey) {
-    const std::lock_guard<std::mutex> lock(g_urlMutex);
-    g_urls->erase(strKey);
-}
-
-// Runs the body; short memory becomes the failure value.
-template <typename Result, typename Body>
-Result NoThrow(Result failure, Body &&body) {
-    try {
-        return std::forward<Body>(body)();
-    } catch (const std::bad_alloc &) {
-        HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
-        return failure;
-    }
-}
-
-// The path comes from a server and becomes part of an URL.
-bool IsPath(const std::string &strPath) {
-    if (strPath.empty() || strPath.front() != '/' || strPath.size() > kMaxPath) {
-        return false;
-    }
-    for (char c : strPath) {
-        if (c <= ' ' || c > '~' || c == '?' || c == '#') {
-            return false;
-        }
-    }
-    return true;
-}
 
 // A token becomes part of a header line: it must not end it, or begin another one.
 bool IsHeaderValue(const std::string &strToken) {
@@ -133,65 +40,11 @@ std::string Quoted(const std::string &strText) {
     return strQuoted;
 }
 
-struct Observer {
-    CredRequestUtil::ProgressObserver pfn = nullptr;
-    void *pContext = nullptr;
-};
-
-thread_local Observer t_observer;
-
-// A server without a path for the API: says why. The query names nothing that helps, and it came
-// from a caller.
-std::string NoPath(const std::string &strUrl, const std::string &strReason, int line) {
-    Exchange &record = host::LatestRecord();
-    record.code = YLIBC_ERR_REPLY;
-    record.strWords = strReason;
-    syslog(LOG_WARNING, "%s:%d %s: %s", kFile, line,
-           printable::Line(strUrl.substr(0, strUrl.find('?'))).c_str(), strReason.c_str());
-    host::Status(YLIBC_ERR_REPLY, kFile, line, strReason).Publish();
-    return {};
-}
-
-std::string Discover(const Server &server, const std::string &api) {
-    host::HttpRequest request;
-    request.strUrl = server.Url(kDiscoveryPath, "api=" + api);
-    request.blRelay = server.blRelay;
-    request.pfnObserver = t_observer.pfn;
-    request.pObserverContext = t_observer.pContext;
-    host::HttpReply reply;
-    if (request.strUrl.empty()) {
-        syslog(LOG_WARNING, "%s:%d a host or port that cannot stand in an URL", kFile, __LINE__);
-        HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-        return {};
-    }
-    if (host::Perform(request, reply) != CRED_REQ_ERR_NONE) {
-        return {};
-    }
-    if (reply.status != kStatusOk) {
-        return NoPath(request.strUrl, "answers with status " + std::to_string(reply.status),
-                      __LINE__);
-    }
-    Json::Value envelope;
-    if (!json::FromString(reply.strBody, envelope) || !json::HasMember(envelope, "success")) {
-        return NoPath(request.strUrl, "does not answer like a QRM server", __LINE__);
-    }
-    if (!json::IsTrue(json::Member(envelope, "success"))) {
-        return NoPath(request.strUrl, "does not serve the Web API", __LINE__);
-    }
-    const char *szPath = json::Text(json::Member(json::Member(envelope, "data"), "path"));
-    if (szPath == nullptr || !IsPath(szPath)) {
-        return NoPath(request.strUrl, "names no path that can be used", __LINE__);
-    }
-    LearnUrl(server.Key(api), server.Url(szPath));
-    return szPath;
-}
-
 }  // namespace
 
 struct CredRequest::Impl {
+    host::ServerAddress server;
     std::string strUrl;
-    std::string strUrlKey;
-    bool blRelay = false;
     std::string strApi;
     int version = 0;
     std::string strMethod;
@@ -204,33 +57,34 @@ struct CredRequest::Impl {
     int error = CRED_REQ_ERR_NONE;
     std::string strResponse;
 
-    bool SetTokens(const ZELO_CRED_SESS &sess) {
+    host::Status SetTokens(const ZELO_CRED_SESS &sess) {
         strAccessToken = sess.accessToken.value_or("");
         strCsrfToken = sess.csrfToken.value_or("");
-        return IsHeaderValue(strAccessToken) && IsHeaderValue(strCsrfToken);
+        HOST_REQUIRE(IsHeaderValue(strAccessToken) && IsHeaderValue(strCsrfToken));
+        return {};
     }
 
-    bool SetUrl(const ZELO_CRED *pCred, const std::string &api, int ver,
-                const std::string &method) {
-        Server server;
-        if (!ReadServer(pCred, server) || api.empty() || method.empty()) {
-            HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-            return false;
-        }
-        strUrlKey = server.Key(api);
-        strUrl = FindUrl(strUrlKey);
-        if (strUrl.empty()) {
-            const std::string strPath = Discover(server, api);
-            if (strPath.empty()) {
-                return false;
-            }
-            strUrl = server.Url(strPath);
-        }
-        blRelay = server.blRelay;
+    host::Status SetUrl(const ZELO_CRED *pCred, const std::string &api, int ver,
+                        const std::string &method) {
+        HOST_REQUIRE(!api.empty() && !method.empty());
+        host::ServerAddress address;
+        std::string strPath;
+        HOST_TRY(host::ReadAddress(pCred, address));
+        HOST_TRY(host::FindPath(address, api, strPath));
+        HOST_TRY(address.Url(strPath, "", strUrl));
+        server = std::move(address);
         strApi = api;
         version = ver;
         strMethod = method;
-        return !strUrl.empty();
+        return {};
+    }
+
+    host::Status AddParams(const Json::Value &more) {
+        HOST_REQUIRE(more.isObject());
+        for (auto member = more.begin(); member != more.end(); ++member) {
+            params[member.name()] = *member;
+        }
+        return {};
     }
 
     void AddHeaders(std::vector<std::string> &headers) const {
@@ -255,78 +109,71 @@ struct CredRequest::Impl {
         return true;
     }
 
-    // Returns a value of CRED_REQ_ERROR.
-    int Exchange(bool blKeepConnection, int timeout_s) {
+    host::Status Exchange(bool blKeepConnection, int timeout_s) {
         strResponse.clear();
         host::HttpRequest request;
         request.strUrl = strUrl;
-        request.blRelay = blRelay;
+        request.blRelay = server.IsRelayed();
         request.blPost = true;
         request.blKeepConnection = blKeepConnection;
-        request.timeout_ms = timeout_s * 1000LL;
+        request.limit_ms = timeout_s * 1000LL;
         request.pStream = pStream;
         request.pfnWrite = pfnWrite;
         request.blHasCopy = params.isMember(kDigest);
-        request.pfnObserver = t_observer.pfn;
-        request.pObserverContext = t_observer.pContext;
         AddHeaders(request.headers);
         if (strUrl.empty() || !BuildBody(request.strBody)) {
-            HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-            return CRED_REQ_ERR_ARGUMENT;
+            error = CRED_REQ_ERR_ARGUMENT;
+            return HOST_ERROR(
+                YLIBC_ERR_INVALID_ARGUMENT,
+                strUrl.empty() ? "the request has no URL" : "the parameters are nested too deeply");
         }
         host::HttpReply reply;
-        const int result = host::Perform(request, reply);
+        host::Status status = host::Perform(request, reply);
+        error = reply.error;
         if (reply.status == kStatusNotFound) {
-            ForgetUrl(strUrlKey);
+            host::ForgetPath(server, strApi);
         }
-        if (result == CRED_REQ_ERR_NONE) {
+        if (!status.Failed()) {
             strResponse.swap(reply.strBody);
         }
-        return result;
+        return status;
     }
 };
 
-std::string CredRequestUtil::GetWebAPIPath(const ZELO_CRED *pCred, const std::string &api) {
-    Server server;
-    if (!ReadServer(pCred, server) || api.empty()) {
-        HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-        return {};
-    }
-    return Discover(server, api);
-}
+// For a request that was made while memory was short.
+#define REQUIRE_IMPL(pImpl)                                                          \
+    do {                                                                             \
+        if ((pImpl) == nullptr) {                                                    \
+            return HOST_ERROR(YLIBC_ERR_OUT_OF_MEMORY, "the request has no memory"); \
+        }                                                                            \
+    } while (false)
 
 bool CredRequestUtil::SetWebAPIURL(const ZELO_CRED *pCred, const std::string &api, int ver,
                                    const std::string &method, CredRequest *pRequest) {
-    if (pRequest == nullptr || pRequest->m_pImpl == nullptr) {
-        HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-        return false;
-    }
-    return NoThrow(false, [&] { return pRequest->m_pImpl->SetUrl(pCred, api, ver, method); });
-}
-
-void CredRequestUtil::SetProgressObserver(ProgressObserver pfnObserver, void *pContext) {
-    t_observer = {pfnObserver, pContext};
+    bool blSet = true;
+    return HOST_OPERATION(false, blSet, [&]() -> host::Status {
+        // Made with new (std::nothrow), it is null when memory is short.
+        REQUIRE_IMPL(pRequest);
+        REQUIRE_IMPL(pRequest->m_pImpl);
+        return pRequest->m_pImpl->SetUrl(pCred, api, ver, method);
+    });
 }
 
 CredRequest *CredRequest::CreateWebAPIRequest(const ZELO_CRED *pCred, const ZELO_CRED_SESS *pSess,
                                               const std::string &api, int ver,
                                               const std::string &method,
                                               const Json::Value &params) {
-    if (pSess == nullptr || !(params.isObject() || params.isNull())) {
-        HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-        return nullptr;
-    }
-    return NoThrow<CredRequest *>(nullptr, [&]() -> CredRequest * {
+    CredRequest *pResult = nullptr;
+    return HOST_OPERATION(pResult, pResult, [&]() -> host::Status {
+        HOST_REQUIRE(pSess != nullptr);
         auto pRequest = std::make_unique<CredRequest>();
-        if (pRequest->m_pImpl == nullptr || !pRequest->m_pImpl->SetTokens(*pSess)) {
-            HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-            return nullptr;
-        }
-        if (!CredRequestUtil::SetWebAPIURL(pCred, api, ver, method, pRequest.get()) ||
-            !(params.isNull() || pRequest->AddPostParam(params))) {
-            return nullptr;
-        }
-        return pRequest.release();
+        REQUIRE_IMPL(pRequest->m_pImpl);
+        Impl &impl = *pRequest->m_pImpl;
+        HOST_TRY(impl.SetTokens(*pSess));
+        HOST_TRY(impl.AddParams(params.isNull() ? Json::Value(Json::objectValue) : params));
+        HOST_TRY(impl.SetUrl(pCred, api, ver, method));
+        pResult = pRequest.release();
+        return {};
     });
 }
 
@@ -343,56 +190,50 @@ CredRequest *CredRequest::CreateWebAPIRequest(long id, const std::string &api, i
 
 // A request whose memory is short from the start is one without an Impl: it refuses everything.
 CredRequest::CredRequest() noexcept {
-    try {
+    static_cast<void>(HOST_OPERATION([&]() -> host::Status {
         m_pImpl = std::make_unique<Impl>();
-    } catch (const std::bad_alloc &) {
-        HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
-    }
+        return {};
+    }));
 }
 
 CredRequest::~CredRequest() = default;
 
 bool CredRequest::AddPostParam(const Json::Value &params) {
-    if (m_pImpl == nullptr || !params.isObject()) {
-        HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-        return false;
-    }
-    return NoThrow(false, [&] {
-        for (auto member = params.begin(); member != params.end(); ++member) {
-            m_pImpl->params[member.name()] = *member;
-        }
-        return true;
+    bool blAdded = true;
+    return HOST_OPERATION(false, blAdded, [&]() -> host::Status {
+        REQUIRE_IMPL(m_pImpl);
+        return m_pImpl->AddParams(params);
     });
 }
 
 bool CredRequest::SetEncryptMode(_tag_CRED_REQ_CRYPTO mode) {
-    if (m_pImpl == nullptr || mode < CRED_REQ_CRYPTO_NONE || mode > CRED_REQ_CRYPTO_PARAMS) {
-        HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-        return false;
-    }
-    m_pImpl->encryptMode = mode;
-    return true;
+    bool blSet = true;
+    return HOST_OPERATION(false, blSet, [&]() -> host::Status {
+        REQUIRE_IMPL(m_pImpl);
+        HOST_REQUIRE(mode >= CRED_REQ_CRYPTO_NONE && mode <= CRED_REQ_CRYPTO_PARAMS);
+        m_pImpl->encryptMode = mode;
+        return {};
+    });
 }
 
 bool CredRequest::Process(bool blKeepConnection, int timeout_s) {
-    if (m_pImpl == nullptr) {
-        HOST_FAIL(YLIBC_ERR_OUT_OF_MEMORY);
-        return false;
-    }
-    m_pImpl->error = NoThrow<int>(CRED_REQ_ERR_MEMORY, [&]() -> int {
+    bool blDone = true;
+    return HOST_OPERATION(false, blDone, [&]() -> host::Status {
+        REQUIRE_IMPL(m_pImpl);
+        m_pImpl->error = CRED_REQ_ERR_MEMORY;  // where nothing comes back
         return m_pImpl->Exchange(blKeepConnection, timeout_s);
     });
-    return m_pImpl->error == CRED_REQ_ERR_NONE;
 }
 
 bool CredRequest::SetRespStream(std::FILE *pStream, RespWriteCallback pfnWrite) {
-    if (m_pImpl == nullptr || pStream == nullptr) {
-        HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-        return false;
-    }
-    m_pImpl->pStream = pStream;
-    m_pImpl->pfnWrite = pfnWrite;
-    return true;
+    bool blSet = true;
+    return HOST_OPERATION(false, blSet, [&]() -> host::Status {
+        REQUIRE_IMPL(m_pImpl);
+        HOST_REQUIRE(pStream != nullptr);
+        m_pImpl->pStream = pStream;
+        m_pImpl->pfnWrite = pfnWrite;
+        return {};
+    });
 }
 
 int CredRequest::GetError() const {
@@ -405,35 +246,6 @@ std::string CredRequest::GetResponse() const {
 
 std::string CredRequest::GetURL() const {
     return m_pImpl == nullptr ? std::string() : m_pImpl->strUrl;
-}
-
-bool LookAtServer(const Look &look, Exchange &exchange, std::string *pBody) {
-    Server server;
-    host::HttpRequest request;
-    exchange = {};
-    if (ReadServer(look.strProtocol, look.strHost, look.port, server)) {
-        request.strUrl = server.Url(look.strPath, look.strQuery);
-    }
-    if (request.strUrl.empty() || look.limit_ms <= 0) {
-        HOST_FAIL(YLIBC_ERR_INVALID_ARGUMENT);
-        exchange.error = CRED_REQ_ERR_ARGUMENT;
-        exchange.code = YLIBC_ERR_INVALID_ARGUMENT;
-        exchange.strWords = "the protocol, the host or the port cannot stand in an URL";
-        return false;
-    }
-    request.blRelay = server.blRelay;
-    request.blVerify = look.blVerify;
-    request.blOwnConnection = true;
-    request.timeout_ms = look.limit_ms;
-    request.pfnObserver = t_observer.pfn;
-    request.pObserverContext = t_observer.pContext;
-    host::HttpReply reply;
-    const bool blWhole = host::Perform(request, reply) == CRED_REQ_ERR_NONE;
-    exchange = LatestExchange();
-    if (pBody != nullptr) {
-        *pBody = std::move(reply.strBody);
-    }
-    return blWhole;
 }
 
 bool APIValidator::IsPort(const int &port) {
