@@ -4,11 +4,14 @@
 #include <netinet/in.h>
 #include <poll.h>
 #include <sys/socket.h>
+#include <unistd.h>
 
+#include <chrono>
 #include <climits>
 #include <cstdlib>
 #include <memory>
 #include <set>
+#include <thread>
 
 #include "children.h"
 #include "dev_server_process.h"
@@ -331,6 +334,67 @@ TEST_F(Request, EachExchangeIsRecorded) {
     look.strHost = "a b";
     EXPECT_FALSE(ZELO::LookAtServer(look, met, nullptr));
     EXPECT_EQ(met.code, unsigned{YLIBC_ERR_INVALID_ARGUMENT});
+}
+
+// A thread holds many a lock while it connects; its child has to connect too.
+TEST_F(Request, AChildOfAFirstDiscoveryMakesItsOwn) {
+    constexpr int kRuns = 12;
+    EXPECT_TRUE(children::InEach(1, [&](int) {
+        for (int run = 0; run < kRuns; ++run) {
+            const bool blBoth = children::InOne([&] {
+                bool blOwn = false;
+                std::thread discovery([&] { blOwn = Https() == "/qrm/rpc"; });
+                std::this_thread::sleep_for(std::chrono::milliseconds(run));
+                const bool blChild = children::InOne([&] {
+                    alarm(10);
+                    return Https() == "/qrm/rpc";
+                });
+                discovery.join();
+                return blOwn && blChild;
+            });
+            if (!blBoth) {
+                return false;
+            }
+        }
+        return true;
+    }));
+}
+
+// What the callback of a response stream has forked.
+pid_t g_child = -1;
+
+TEST_F(Request, AForkInTheMiddleOfAReplyLeavesTheConnectionToTheParent) {
+    const Cred pCred = ServerAt("https", m_pServer->HttpsPort());
+    ZELO::CredRequest request;
+    ASSERT_TRUE(ZELO::CredRequestUtil::SetWebAPIURL(pCred.get(), kApi, 1, "join", &request));
+    std::FILE *const pStream = std::tmpfile();
+    devserver::NextAnswer answer;
+    answer.status = 200;
+    answer.body = "{}";
+    m_pServer->AnswerNext(kApi, answer);
+    g_child = -1;
+    request.SetRespStream(pStream, [](const char *, std::size_t cb, std::FILE *) {
+        g_child = fork();
+        return cb;
+    });
+    const bool blWhole = request.Process(true, 0);
+    if (g_child == 0) {
+        alarm(10);
+        _exit(!blWhole && Https() == "/qrm/rpc" ? 0 : 1);
+    }
+    EXPECT_TRUE(blWhole);
+    EXPECT_TRUE(children::Ended(g_child)) << "fails, and connects anew";
+    m_pServer->ForgetRequests();
+    EXPECT_EQ(Https(), "/qrm/rpc");
+    EXPECT_EQ(Https(), "/qrm/rpc");
+    EXPECT_EQ(Connections().size(), 1U);
+    std::fclose(pStream);
+}
+
+TEST_F(Request, ARequestWithoutMemorySaysSo) {
+    const Cred pCred = ServerAt("http", m_pServer->HttpPort());
+    EXPECT_FALSE(ZELO::CredRequestUtil::SetWebAPIURL(pCred.get(), kApi, 1, "join", nullptr));
+    EXPECT_EQ(YLIBCErrGet(), unsigned{YLIBC_ERR_OUT_OF_MEMORY});
 }
 
 }  // namespace
