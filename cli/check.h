@@ -1,4 +1,4 @@
-// One check of a diagnosis: what was looked at, how it went, and what mends it.
+// The checks of a diagnosis: what was looked at, how it went, and what mends it.
 
 #ifndef QRMCTL_CHECK_H
 #define QRMCTL_CHECK_H
@@ -38,6 +38,58 @@ inline const char *OutcomeName(Outcome outcome) {
     }
     return "skipped";
 }
+
+// The checks so far, and one way to add each kind of outcome. Tells whether one may go on.
+class CheckList {
+  public:
+    bool Ok(const char *szName, long duration_ms, const std::string &strSeen) {
+        m_checks.push_back({szName, Outcome::kOk, duration_ms, strSeen, ""});
+        return true;
+    }
+    bool Warn(const char *szName, long duration_ms, const std::string &strSeen,
+              const std::string &strRemedy) {
+        m_checks.push_back({szName, Outcome::kWarning, duration_ms, strSeen, strRemedy});
+        return true;
+    }
+    bool Fail(const char *szName, long duration_ms, const std::string &strSeen,
+              const std::string &strRemedy) {
+        if (!m_blFailed) {
+            m_blFailed = true;
+            SkipOthers(std::string("not tried: '") + szName + "' failed",
+                       std::string("mend '") + szName + "' first");
+        }
+        m_checks.push_back({szName, Outcome::kFailed, duration_ms, strSeen, strRemedy});
+        return false;
+    }
+    void Skip(const char *szName, const std::string &strSeen, const std::string &strRemedy) {
+        m_checks.push_back({szName, Outcome::kSkipped, 0, strSeen, strRemedy});
+    }
+    // Says why the checks are skipped that are not added.
+    void SkipOthers(const std::string &strSeen, const std::string &strRemedy) {
+        m_strSkipped = strSeen;
+        m_strSkippedRemedy = strRemedy;
+    }
+
+    // A check for each of the names.
+    Checks InOrder(const std::vector<const char *> &names) const {
+        Checks ordered;
+        for (const char *szName : names) {
+            const auto at = std::find_if(m_checks.begin(), m_checks.end(), [&](const Check &check) {
+                return check.strName == szName;
+            });
+            ordered.push_back(at != m_checks.end() ? *at
+                                                   : Check{szName, Outcome::kSkipped, 0,
+                                                           m_strSkipped, m_strSkippedRemedy});
+        }
+        return ordered;
+    }
+
+  private:
+    Checks m_checks;
+    bool m_blFailed = false;
+    std::string m_strSkipped = "not tried: the ways before took all the time";
+    std::string m_strSkippedRemedy = "name fewer candidates";
+};
 
 // The moment at which checking gives up, whatever is still to do; the run's deadline at the latest.
 class TimeLimit {

@@ -3,8 +3,9 @@
 #ifndef QRMCTL_CONNECTION_CHECKS_H
 #define QRMCTL_CONNECTION_CHECKS_H
 
+#include <string>
+
 #include "check.h"
-#include "probe.h"
 
 namespace qrmctl {
 
@@ -12,6 +13,20 @@ constexpr const char *kQrmApi = "ZELO.QRM.RPC";
 
 // No step of a check takes longer.
 constexpr long kStep_ms = 10'000;
+
+// A way to a server.
+struct Way {
+    std::string strProtocol;  // "https", "http" or "fld"
+    std::string strHost;
+    int port = 0;
+
+    bool IsRelayed() const { return strProtocol == "fld"; }
+    bool IsSecure() const { return strProtocol != "http"; }
+};
+
+// Whether the platform lets a tool look at servers. Without that, the API is the one check of a
+// way.
+bool CanLookAtServers();
 
 // All checks of the way, in a fixed order; those behind one that failed are skipped. Nothing but
 // the discovery of the API is asked of the server, and no token is sent.
@@ -22,9 +37,6 @@ bool IsUsable(const Checks &checks);
 
 // Such as "https://localhost:8443".
 std::string WayText(const Way &way);
-
-// A moment such as "2030-05-14T09:26:53Z".
-std::string TimeText(std::time_t time);
 
 }  // namespace qrmctl
 

@@ -1,6 +1,5 @@
 #include "credential_checks.h"
 
-#include "connection_checks.h"
 #include "fixed_text.h"
 #include "json.h"
 #include "key_value_file.h"

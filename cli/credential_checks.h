@@ -4,7 +4,7 @@
 #define QRMCTL_CREDENTIAL_CHECKS_H
 
 #include "check.h"
-#include "probe.h"
+#include "connection_checks.h"
 
 namespace qrmctl {
 

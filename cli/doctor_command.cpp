@@ -142,6 +142,11 @@ ExitCode Doctor(const Options &options, Report &report) {
         return report.Fail(ErrorId::kBadInput, strError);
     }
     const bool blStoredWay = options.strCandidates.empty() && options.strServer.empty();
+    if (!CanLookAtServers()) {
+        report.Warn(
+            "this platform cannot look at servers: only whether the API answers, and what is "
+            "stored, is checked");
+    }
     const TimeLimit limit(kLimit);
     bool blUsable = false;
     Json::Value connections(Json::arrayValue);

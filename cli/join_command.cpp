@@ -279,13 +279,14 @@ ExitCode Join(const Options &options, Report &report) {
                   '\'');
     Json::Value connection;
     if (!ZELOQRMClientTestConnect(candidates, appliance::kQrmApi, connection)) {
-        return report.FailExchange(
+        return FailExchange(
             ErrorId::kNoServer,
             "no server answered at '" + options.strServer +
                 "' or any other candidate, nothing was changed: check address, ports "
-                "and certificate, with 'qrmctl doctor'; -v shows the reason of each attempt");
+                "and certificate, with 'qrmctl doctor'; -v shows the reason of each attempt",
+            report);
     }
-    report.WarnOfAuthority();
+    WarnOfAuthority(report);
     Report::Stage(kTurnStage);
     const MembershipTurn turn;
     if (!turn.IsTaken()) {

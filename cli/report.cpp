@@ -1,15 +1,11 @@
 #include "report.h"
 
 #include <json/writer.h>
-#include <openssl/x509.h>
 
 #include <algorithm>
-#include <array>
 #include <cstdio>
 #include <iostream>
-#include <memory>
 
-#include "certificate_authorities.h"
 #include "deadline.h"
 #include "json.h"
 #include "printable.h"
@@ -106,31 +102,6 @@ ExitCode FailShortOfMemory(bool blJson) noexcept {
         std::cout.flush();
     }
     return kFailed;
-}
-
-// A sentence about a certificate authority that cannot be read; empty when all can.
-static std::string AuthorityFlaw() {
-    std::array<char, 4096> place = {};
-    const std::unique_ptr<X509_STORE, void (*)(X509_STORE *)> pStore(X509_STORE_new(),
-                                                                     X509_STORE_free);
-    if (ZELOCertAddAuthorities(pStore.get(), place.data(), static_cast<int>(place.size())) == 0 ||
-        place[0] == '\0') {
-        return {};
-    }
-    return std::string("cannot read certificates from '") + place.data() +
-           "', so that no server is trusted over https: mend or remove it";
-}
-
-void Report::WarnOfAuthority() {
-    const std::string strFlaw = AuthorityFlaw();
-    if (!strFlaw.empty()) {
-        Warn(strFlaw);
-    }
-}
-
-ExitCode Report::FailExchange(ErrorId id, const std::string &strError) {
-    const std::string strFlaw = AuthorityFlaw();
-    return strFlaw.empty() ? Fail(id, strError) : Fail(ErrorId::kCaUnreadable, strFlaw);
 }
 
 // Puts everything out that is meant for standard output. A reader who takes it has all the time

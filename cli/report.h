@@ -48,12 +48,6 @@ class Report {
     ExitCode Done(ExitCode code = kDone);
     ExitCode Fail(ErrorId id, const std::string &strError);
 
-    // A certificate authority of the appliance that cannot be read: no exchange over HTTPS succeeds
-    // with it. A warning when another way was found; for an exchange that failed it takes the place
-    // of the error.
-    void WarnOfAuthority();
-    ExitCode FailExchange(ErrorId id, const std::string &strError);
-
   private:
     ExitCode FailAtDeadline();
     ExitCode PutOutFailure(ErrorId id, const std::string &strError);

@@ -2,7 +2,9 @@
 
 #include <limits>
 
-#include "diagnosis.h"
+#include "certificate_authorities.h"
+#include "fixed_text.h"
+#include "last_error.h"
 
 namespace qrmctl {
 
@@ -21,6 +23,37 @@ void AddApiCall(CommandHandle command, ApiCall &call) {
 
 ZELO::Exchange LatestExchange() {
     return ZELO::LatestExchange != nullptr ? ZELO::LatestExchange() : ZELO::Exchange();
+}
+
+int CountAuthorities(std::string &strFlaw) {
+    int count = 0;
+    const auto countOne = [](void *pCount, const ZELO_CERT_AUTHORITY * /*pAuthority*/) {
+        ++*static_cast<int *>(pCount);
+    };
+    if (ZELOCertAuthorityList(countOne, &count) < 0 && YLIBCErrGet() == YLIBC_ERR_FILE) {
+        FixedText<4096> reason;
+        if (ZELODiagnosisReason != nullptr) {
+            ZELODiagnosisReason(reason.Buffer(), FixedText<4096>::Size());
+        }
+        strFlaw = reason.Empty() ? "a certificate authority of this appliance cannot be read"
+                                 : reason.sz();
+    }
+    return count;
+}
+
+void WarnOfAuthority(Report &report) {
+    std::string strFlaw;
+    CountAuthorities(strFlaw);
+    if (!strFlaw.empty()) {
+        report.Warn(strFlaw);
+    }
+}
+
+ExitCode FailExchange(ErrorId id, const std::string &strError, Report &report) {
+    std::string strFlaw;
+    CountAuthorities(strFlaw);
+    return strFlaw.empty() ? report.Fail(id, strError)
+                           : report.Fail(ErrorId::kCaUnreadable, strFlaw);
 }
 
 bool FindRefusal(Report &report, std::string &strAnswer) {
@@ -46,7 +79,7 @@ ExitCode FailRequest(ErrorId id, const std::string &strWhat, const std::string &
     std::string strAnswer;
     return FindRefusal(report, strAnswer)
                ? report.Fail(id, strWhat + ": it answered with " + strAnswer)
-               : report.FailExchange(id, strWhat + strReasons);
+               : FailExchange(id, strWhat + strReasons, report);
 }
 
 }  // namespace qrmctl

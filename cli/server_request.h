@@ -25,6 +25,17 @@ void AddApiCall(CommandHandle command, ApiCall &call);
 // The latest exchange with a server; an empty one on a platform that keeps no record of it.
 ZELO::Exchange LatestExchange();
 
+// How many certificates of the appliance's own authorities there are. Where one cannot be read, no
+// exchange over HTTPS succeeds, and strFlaw says so.
+int CountAuthorities(std::string &strFlaw);
+
+// Warns of an authority that cannot be read, where another way to the server was found.
+void WarnOfAuthority(Report &report);
+
+// Ends the command after an exchange that failed: with strError, or with the authority that cannot
+// be read.
+ExitCode FailExchange(ErrorId id, const std::string &strError, Report &report);
+
 // For a request that failed: whether the server's answer to the latest exchange says why. Then
 // strAnswer names its error code and its HTTP status, and the report has them as members.
 bool FindRefusal(Report &report, std::string &strAnswer);

@@ -1,11 +1,10 @@
 #include "support_files.h"
 
-#include <curl/curl.h>
+#include <dlfcn.h>
 #include <fcntl.h>
 #include <json/version.h>
 #include <openssl/crypto.h>
 #include <spawn.h>
-#include <sqlite3.h>
 #include <sys/mman.h>
 #include <sys/stat.h>
 #include <sys/utsname.h>
@@ -18,7 +17,7 @@
 #include <ctime>
 #include <filesystem>
 
-#include "connection_checks.h"
+#include "clock_check.h"
 #include "deadline.h"
 #include "diagnosis.h"
 #include "fixed_text.h"
@@ -151,6 +150,12 @@ std::string OutputOf(std::vector<std::string> words, bool blJson, double limit_s
 
 // --- Texts --------------------------------------------------------------------------------------
 
+// The version of a library that came with the platform's, by the function that tells it.
+std::string PlatformVersion(const char *szFunction) {
+    const auto pfnVersion = reinterpret_cast<const char *(*)()>(dlsym(RTLD_DEFAULT, szFunction));
+    return pfnVersion != nullptr ? pfnVersion() : "not loaded";
+}
+
 std::string Versions() {
     utsname kernel = {};
     uname(&kernel);
@@ -163,9 +168,11 @@ std::string Versions() {
     return std::string("libzeloqrmclient, qrmctl: ") + ZELO_VERSION +
            "\nsystem: " + (system.Empty() ? "unknown" : system.sz()) +
            "\nkernel: " + kernel.sysname + ' ' + kernel.release + ' ' + kernel.machine +
-           "\nlibcurl: " + curl_version() + "\nOpenSSL: " + OpenSSL_version(OPENSSL_VERSION) +
-           "\nSQLite: " + sqlite3_libversion() + "\nJsonCpp: " + JSONCPP_VERSION_STRING +
-           "\ncollected: " + TimeText(std::time(nullptr)) + '\n';
+           "\nlibcurl: " + PlatformVersion("curl_version") +
+           "\nOpenSSL: " + OpenSSL_version(OPENSSL_VERSION) +
+           "\nSQLite: " + PlatformVersion("sqlite3_libversion") +
+           "\nJsonCpp: " + JSONCPP_VERSION_STRING + "\ncollected: " + TimeText(std::time(nullptr)) +
+           '\n';
 }
 
 struct Setting {

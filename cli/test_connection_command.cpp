@@ -4,6 +4,7 @@
 
 #include "candidates.h"
 #include "commands.h"
+#include "server_request.h"
 #include "zeloqrmclient.h"
 
 namespace qrmctl {
@@ -24,13 +25,14 @@ ExitCode TestConnection(const Options &options, Report &report) {
     Report::Stage("asking " + CandidateNames(candidates) + " for the API '" + options.strApi + "'");
     Json::Value connection;
     if (!ZELOQRMClientTestConnect(candidates, options.strApi, connection)) {
-        return report.FailExchange(ErrorId::kNoServer,
-                                   "no candidate of '" + options.strCandidates +
-                                       "' answered for the API '" + options.strApi +
-                                       "': check addresses, ports and certificates, with "
-                                       "'qrmctl doctor'; -v shows the reason of each attempt");
+        return FailExchange(ErrorId::kNoServer,
+                            "no candidate of '" + options.strCandidates +
+                                "' answered for the API '" + options.strApi +
+                                "': check addresses, ports and certificates, with "
+                                "'qrmctl doctor'; -v shows the reason of each attempt",
+                            report);
     }
-    report.WarnOfAuthority();
+    WarnOfAuthority(report);
     report.Fact("protocol", connection["protocol"]);
     report.Fact("host", connection["host"]);
     report.Fact("port", connection["port"]);

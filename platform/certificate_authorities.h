@@ -16,9 +16,6 @@
 
 #include "api.h"
 
-// OpenSSL's X509_STORE.
-struct x509_store_st;
-
 // An authority, for as long as its reader runs.
 struct ZELO_CERT_AUTHORITY {
     const char *szFingerprint;  // SHA-256, 64 lower-case hexadecimal digits
@@ -46,12 +43,6 @@ ZELO_PLATFORM_API int ZELOCertAuthorityList(ZELO_CERT_AUTHORITY_READER pfnRead, 
 // in the folder; others in the same file stay. YLIBC_ERR_NOT_FOUND when it is not there. The
 // system's own authorities are not this operation's.
 ZELO_PLATFORM_API int ZELOCertAuthorityRemove(const char *szFingerprint);
-
-// Going away: a program looks at a server with LookAtServer (diagnosis.h). Adds the folder's
-// certificates to an OpenSSL certificate store. When some cannot be read, szPlace, a buffer of
-// cbPlace bytes, gets the path of the file.
-ZELO_PLATFORM_API int ZELOCertAddAuthorities(struct x509_store_st *pStore, char *szPlace,
-                                             int cbPlace);
 }
 
 #endif

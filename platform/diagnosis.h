@@ -103,6 +103,8 @@ struct ServerCertificate {
     int verifyCode = 0;
     int verifyDepth = 0;
     std::string strVerifyWords;
+    std::time_t verifyNotBefore = 0;  // since when, and until when, that certificate is valid
+    std::time_t verifyNotAfter = 0;
 };
 
 // One exchange. A stage that was not come to has the time -1; a connection that was kept from an
@@ -114,11 +116,12 @@ struct Exchange {
     std::vector<std::string> addresses;  // that were tried, such as "192.0.2.7:5001", "[::1]:5001"
     std::string strAddress;              // the one that was connected to
     // Milliseconds from the beginning to the end of each stage.
-    long resolved_ms = -1;   // the name has addresses
-    long connected_ms = -1;  // TCP
-    long secured_ms = -1;    // TLS; through a relay that is behind its tunnel
-    long answered_ms = -1;   // the first byte of the answer
-    long whole_ms = -1;      // the end of the exchange, whatever came of it
+    long resolved_ms = -1;    // the name has addresses
+    long connected_ms = -1;   // TCP
+    long secured_ms = -1;     // TLS; through a relay that is behind its tunnel
+    long answered_ms = -1;    // the first byte of the answer
+    long whole_ms = -1;       // the end of the exchange, whatever came of it
+    bool blTimedOut = false;  // a limit of its time ended it
 
     int relayStatus = 0;        // what the relay, or a proxy, answered; 0: nothing
     std::string strTlsVersion;  // such as "TLSv1.3"

@@ -229,7 +229,8 @@ TEST_F(Doctor, NamesTheStepThatFailsAndWhatMendsIt) {
          [&] { return fs::remove(kCaFile), https(); }},
         {"oof-----", kCaFile, good, [&] { return Replace(kCaFile, "no certificate"), https(); }},
         {"oooowooo", "2 days left", ending, https},
-        {"oooooowo", " s behind", good, [&] { return TellTime(now - kHour), https(); }},
+        {"oooooowo", "about 60 minutes behind (36", good,
+         [&] { return TellTime(now - kHour), https(); }},
         {"ooooof--", "status 500", good, [&] { return AnswerDiscovery(fault), https(); }},
         {"ooooooof", "error code 102", good, [&] { return AnswerDiscovery(unknown), https(); }},
         {"oowooo", "nothing is encrypted", good,
@@ -269,6 +270,74 @@ TEST_F(Doctor, NamesTheStepThatFailsAndWhatMendsIt) {
         EXPECT_EQ(connection["usable"], blUsable);
         EXPECT_EQ(Outcomes(result["credential_checks"]), "o-");
     }
+}
+
+// With a clock that is years off, the authority's certificate is not valid either.
+TEST_F(Doctor, AClockThatIsYearsOffIsToldFromACertificateThatIsOutOfDate) {
+#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
+    GTEST_SKIP() << "a sanitizer has to be loaded first";
+#endif
+    const std::time_t now = std::time(nullptr);
+    const std::time_t fiveYears = 1827 * kDay;
+    // What this appliance's clock says, and the server's; what is said.
+    const std::tuple<std::time_t, std::time_t, const char *, std::vector<const char *>> rows[] = {
+        {kHour,
+         now,
+         "oooof-f-",
+         {"clock says 1970-01-01T01:0", "years ahead (", "that of an authority, valid from",
+          "set this appliance's clock", "mend 'clock' first"}},
+        {now + fiveYears,
+         now,
+         "oooof-f-",
+         {"about 5 years behind (157852", "that of an authority, valid from",
+          "set this appliance's clock", "mend 'clock' first"}},
+        {now + fiveYears,
+         now + fiveYears,
+         "oooof-o-",
+         {"the clock is not the suspect", "mend 'certificate' first"}},
+        {now + fiveYears, now + 2 * fiveYears, "oooof-w-", {"valid by neither"}},
+    };
+    for (const auto &[ownTime, serverTime, szOutcomes, said] : rows) {
+        SCOPED_TRACE(szOutcomes);
+        TellTime(serverTime);
+        setenv("CLOCK_SHIFT", std::to_string(ownTime - now).c_str(), 1);
+        setenv("LD_PRELOAD", CLOCK_SHIFT, 1);
+        const Json::Value result = Run(Server("localhost", 0, m_pServer->HttpsPort()), 1);
+        unsetenv("LD_PRELOAD");
+        EXPECT_EQ(Outcomes(result["connections"][0]["checks"]), szOutcomes);
+        for (const char *szSaid : said) {
+            EXPECT_TRUE(Holds(json::ToLogText(result), szSaid))
+                << szSaid << json::ToLogText(result);
+        }
+        m_pServer->ForgetAnswers();
+    }
+}
+
+TEST_F(Doctor, APlatformWithoutDiagnosisIsAskedForTheApi) {
+    Store();
+    setenv("LD_LIBRARY_PATH", WITHOUT_DIAGNOSIS, 1);
+    const Json::Value usable = Run({}, 0);
+    EXPECT_EQ(usable["warnings"].size(), 1U);
+    EXPECT_TRUE(Holds(usable["warnings"][0].asString(), "this platform cannot look at servers"));
+    EXPECT_EQ(Outcomes(usable["connections"][0]["checks"]), "-------o");
+    EXPECT_EQ(Outcomes(usable["credential_checks"]), "oo");
+    EXPECT_EQ(Outcomes(Run(Server("localhost", 0, 1), 1)["connections"][0]["checks"]), "-------f");
+    // Other commands do as ever.
+    const std::pair<int, Arguments> rows[] = {
+        {4, {"status"}},
+        {0, {"call", kApi, "info"}},
+        {1, {"call", kApi, "nothing"}},
+        {1, {"call", "NO.SUCH", "info"}},
+        {0, {"--deadline", "20", "call", kApi, "info"}},
+        {0, {"support", "/tmp/without_diagnosis"}},
+    };
+    for (auto [status, arguments] : rows) {
+        arguments.insert(arguments.begin(), QRMCTL);
+        const Outcome outcome = run_program::Run(arguments);
+        EXPECT_EQ(outcome.status, status) << arguments[1] << outcome.strErr;
+    }
+    unsetenv("LD_LIBRARY_PATH");
+    fs::remove("/tmp/without_diagnosis");
 }
 
 TEST_F(Doctor, TheLogOfARequestSaysWhatIsWrong) {

@@ -13,7 +13,6 @@
 #include "certificate_facts.h"
 #include "file_system.h"
 #include "files/file_replacement.h"
-#include "fixed_text.h"
 #include "fork_guard.h"
 #include "printable.h"
 
@@ -182,18 +181,5 @@ int ZELOCertAuthorityRemove(const char *szFingerprint) {
     return HOST_OPERATION([&]() -> host::Status {
         HOST_REQUIRE(szFingerprint != nullptr);
         return host::Remove(szFingerprint);
-    });
-}
-
-int ZELOCertAddAuthorities(struct x509_store_st *pStore, char *szPlace, int cbPlace) {
-    return HOST_OPERATION([&]() -> host::Status {
-        HOST_REQUIRE(pStore != nullptr && szPlace != nullptr && cbPlace > 0);
-        std::vector<host::AuthorityFile> files;
-        host::Status status = host::ReadAuthorities(files);
-        if (status.Failed()) {
-            CopyToFit(szPlace, cbPlace, files.back().strPath);
-            return status;
-        }
-        return host::AddAuthorities(pStore);
     });
 }

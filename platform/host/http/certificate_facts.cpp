@@ -9,6 +9,7 @@
 #include <array>
 #include <memory>
 #include <new>
+#include <tuple>
 
 namespace host {
 namespace {
@@ -75,10 +76,13 @@ ZELO::ServerCertificate ReadCertificate(X509 *pCertificate) {
     certificate.strSubject = NameText(X509_get_subject_name(pCertificate));
     certificate.strIssuer = NameText(X509_get_issuer_name(pCertificate));
     certificate.strNames = AlternativeNames(pCertificate);
-    certificate.notBefore = TimeOf(X509_get0_notBefore(pCertificate));
-    certificate.notAfter = TimeOf(X509_get0_notAfter(pCertificate));
+    std::tie(certificate.notBefore, certificate.notAfter) = ValidityOf(pCertificate);
     certificate.strFingerprint = Fingerprint(pCertificate);
     return certificate;
+}
+
+std::pair<std::time_t, std::time_t> ValidityOf(const X509 *pCertificate) {
+    return {TimeOf(X509_get0_notBefore(pCertificate)), TimeOf(X509_get0_notAfter(pCertificate))};
 }
 
 std::string PemOf(X509 *pCertificate) {

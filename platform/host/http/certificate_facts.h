@@ -5,7 +5,9 @@
 
 #include <openssl/x509.h>
 
+#include <ctime>
 #include <string>
+#include <utility>
 
 #include "diagnosis.h"
 
@@ -13,6 +15,9 @@ namespace host {
 
 // Subject, issuer, names, times and fingerprint. Throws std::bad_alloc, as all of these do.
 ZELO::ServerCertificate ReadCertificate(X509 *pCertificate);
+
+// Since when, and until when, it is valid.
+std::pair<std::time_t, std::time_t> ValidityOf(const X509 *pCertificate);
 
 // The certificate as a PEM block.
 std::string PemOf(X509 *pCertificate);

@@ -8,6 +8,7 @@
 #include <climits>
 #include <memory>
 #include <new>
+#include <tuple>
 
 #include "certificate_facts.h"
 
@@ -83,6 +84,9 @@ void NoteCertificate(X509_STORE_CTX *pVerification, bool blTrusted, const std::s
     certificate.verifyCode = blTrusted ? X509_V_OK : X509_STORE_CTX_get_error(pVerification);
     certificate.verifyDepth = blTrusted ? 0 : X509_STORE_CTX_get_error_depth(pVerification);
     certificate.strVerifyWords = X509_verify_cert_error_string(certificate.verifyCode);
+    X509 *const pRefused = blTrusted ? nullptr : X509_STORE_CTX_get_current_cert(pVerification);
+    std::tie(certificate.verifyNotBefore, certificate.verifyNotAfter) =
+        ValidityOf(pRefused != nullptr ? pRefused : pServer);
     const auto *const pTls = static_cast<const SSL *>(
         X509_STORE_CTX_get_ex_data(pVerification, SSL_get_ex_data_X509_STORE_CTX_idx()));
     exchange.strTlsVersion = SSL_get_version(pTls);

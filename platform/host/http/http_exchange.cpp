@@ -205,6 +205,7 @@ Status Transact(const HttpRequest &request, CurlHandle &handle, HttpReply &reply
     SetCallbacks(transfer);
     const CURLcode result = Run(transfer);
     NoteAnswer(handle.pEasy.get(), record);
+    record.blTimedOut = result == CURLE_OPERATION_TIMEDOUT;
     Status status = Judge(transfer, result, reply.error);
     reply.status = record.httpStatus;
     reply.strBody.swap(transfer.sink.Body());
