@@ -39,7 +39,7 @@ inline const char *OutcomeName(Outcome outcome) {
     return "skipped";
 }
 
-// The checks so far, and one way to add each kind of outcome. Tells whether one may go on.
+// The checks so far. Each of the ways to add one tells whether the checks behind it are to be made.
 class CheckList {
   public:
     bool Ok(const char *szName, long duration_ms, const std::string &strSeen) {

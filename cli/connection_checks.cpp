@@ -73,6 +73,7 @@ long Took(const Exchange &met, long begin_ms, long end_ms) {
 }
 
 // --- Name, TCP, tunnel --------------------------------------------------------------------------
+
 bool CheckRelay(CheckList &checks) {
     FixedText<1024> relay;
     if (YLIBCFileGetKeyValue(kConfigFile, "farlink_relay", relay.Buffer(), FixedText<1024>::Size(),

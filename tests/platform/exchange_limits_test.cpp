@@ -159,7 +159,7 @@ TEST(ExchangeLimits, TheObserverOfWaitsIsCalledMeanwhile) {
     EXPECT_FALSE(Ask({"silence", false, "", ""}, std::chrono::milliseconds(50), duration));
     ZELODeadlineSet(-1);
     ZELOWaitObserverSet(nullptr, nullptr);
-    EXPECT_EQ(calls, 2);
+    EXPECT_GE(calls, 2);
 }
 
 }  // namespace
