@@ -50,8 +50,8 @@ inline int CopyToFit(char *szOut, int cbOut, const char *szText) {
     return CopyToFit(szOut, cbOut, std::string_view(szText, strnlen(szText, cbMost)));
 }
 
-// A buffer of N bytes that holds zero-terminated text of at most N - 1 bytes, at first none. It is
-// all zeroes then: a platform getter may write a text without its end.
+// A buffer of N bytes that holds zero-terminated text of at most N - 1 bytes, at first empty. All
+// of it is zero then, since a platform getter may write a text without its end.
 template <std::size_t N>
 class FixedText {
   public:

@@ -22,7 +22,7 @@ constexpr int kMaxDepth = 1000;
 constexpr std::size_t kMaxValues = 2'000'000;
 
 // Writes the value as compact JSON text, on one line and in ASCII, without a line feed at its end.
-// Returns false, and leaves strText as it was, when the value has more levels than that.
+// Returns false, and leaves strText as it was, when the value has more levels than maxDepth.
 bool ToString(const Json::Value &value, std::string &strText, int maxDepth = kMaxDepth);
 
 // The same for a log line: a value that cannot be written reads as "...".

@@ -18,7 +18,7 @@ namespace own_file {
 constexpr int kFlags = O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC;
 
 // Whether it is a regular file of the caller's own, or root's, with no other name. One that lost
-// its name after it was opened is.
+// its name after it was opened is one too.
 inline bool IsOwn(const struct stat &opened) {
     return S_ISREG(opened.st_mode) && opened.st_nlink <= 1 &&
            (opened.st_uid == 0 || opened.st_uid == geteuid());

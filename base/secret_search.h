@@ -28,8 +28,8 @@ class SecretSearch {
     void Add(const std::string &strSecret);
 
     // How many bytes of the text at the place stand for one of the secrets, the longest of them; 0
-    // for none. Backslashes before a character do not count. What begins like a longer secret for
-    // 32 bytes is taken for it as far as it is like it, so that looking at every place takes time
+    // for none. Backslashes before a character do not count. Text whose first 32 bytes are those of
+    // a secret counts as that secret, as far as the two agree: so looking at every place takes time
     // that grows with the text alone.
     std::size_t LengthAt(const std::string &strText, std::size_t at) const;
 

@@ -11,7 +11,7 @@ namespace qrmctl {
 
 constexpr const char *kQrmApi = "ZELO.QRM.RPC";
 
-// No step of a check takes longer.
+// The most that a look, or any other step of a check, may take.
 constexpr long kStep_ms = 10'000;
 
 // A way to a server.

@@ -61,7 +61,7 @@ void NoteWait(void * /*pContext*/, const char *szWaitsFor, double /*waited_s*/) 
     }
 }
 
-// A reader who has stopped reading keeps no line of this length out of a pipe that has room.
+// Writes its line only where there is room: a reader who has stopped reading must not keep it.
 void EndAtOnce(int /*signal*/) {
     constexpr std::string_view kLine =
         "qrmctl: the deadline struck a second ago, and what the program is blocked in does not "
@@ -105,7 +105,7 @@ void StartDeadline(double limit_s) {
     const auto limit_ms = static_cast<long long>(limit_s * kMsPerS);
     StartTimer(limit_s);
     g_run.limit_s = limit_s;
-    // Not after the platform's own: what has given up there finds the deadline over here.
+    // Before the platform's own: what gives up there must find the deadline over here too.
     g_run.end = Clock::now() + std::chrono::milliseconds(limit_ms);
     if (ZELODeadlineSet != nullptr) {
         ZELODeadlineSet(limit_ms);

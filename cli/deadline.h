@@ -31,13 +31,13 @@ double DeadlineLeft_s();
 // How the deadline struck.
 struct Strike {
     double limit_s;
-    std::string strStage;
-    std::string strLongest;
-    std::string strError;
+    std::string strStage;    // in force then, with what it waited for
+    std::string strLongest;  // the stage that took longest
+    std::string strError;    // all of it in words, with the remedy
 };
 Strike DescribeStrike();
 
-// The result is out: nothing ends the program any more.
+// For when the result is out: nothing ends the program any more.
 void EndDeadline();
 
 // While it lives, a signal that would end the program ends the platform's waits instead.

@@ -11,10 +11,12 @@
 
 namespace {
 
-// In nanoseconds of the steady clock. A signal handler sets it: it has no lock.
+// In nanoseconds of the steady clock. A signal handler may set it, so it must need no lock.
 constexpr std::int64_t kNever = std::numeric_limits<std::int64_t>::max();
 std::atomic<std::int64_t> g_deadline_ns{kNever};
 static_assert(std::atomic<std::int64_t>::is_always_lock_free);
+
+constexpr std::int64_t kNsPerMs = 1'000'000;
 
 struct Observer {
     ZELO_WAIT_OBSERVER pfn = nullptr;
@@ -31,16 +33,14 @@ std::int64_t Now_ns() {
 }  // namespace
 
 void ZELODeadlineSet(long long left_ms) {
-    constexpr std::int64_t kPerMs = 1'000'000;
     const std::int64_t now = Now_ns();
-    const bool blNever = left_ms < 0 || left_ms > (kNever - now) / kPerMs;
-    g_deadline_ns.store(blNever ? kNever : now + left_ms * kPerMs);
+    const bool blNever = left_ms < 0 || left_ms > (kNever - now) / kNsPerMs;
+    g_deadline_ns.store(blNever ? kNever : now + left_ms * kNsPerMs);
 }
 
 long long ZELODeadlineLeft() {
-    constexpr std::int64_t kPerMs = 1'000'000;
     const std::int64_t deadline = g_deadline_ns.load();
-    return deadline == kNever ? -1 : std::max<std::int64_t>(0, (deadline - Now_ns()) / kPerMs);
+    return deadline == kNever ? -1 : std::max<std::int64_t>(0, (deadline - Now_ns()) / kNsPerMs);
 }
 
 void ZELOWaitObserverSet(ZELO_WAIT_OBSERVER pfnObserver, void *pContext) {

@@ -37,11 +37,10 @@ class Wait {
     // The time that is left, however long; 0 when time is up.
     Clock::duration Left() const;
 
-    // Whether the process's deadline is what ended, or would end, the wait now.
+    // Whether the process's deadline is over.
     static bool IsPastDeadline();
 
-    // Why the wait ended: YLIBC_ERR_DEADLINE for the process's deadline, the code for its own
-    // limit.
+    // Why the wait ended: YLIBC_ERR_DEADLINE at the process's deadline, else `code`.
     Status TimeUp(unsigned int code) const;
 
     const std::string &WaitsFor() const { return m_strWaitsFor; }

@@ -36,8 +36,8 @@ class [[nodiscard]] Status {
         return std::move(*this);
     }
 
-    // Writes the log line, if it is to have one, and forgets that it was to. For a failure that
-    // ends no operation.
+    // Writes the log line, if it is to have one, now and not again. For a failure that ends no
+    // operation.
     void Log();
 
     // Makes this failure the calling thread's last error, with its words, and writes the log line.
@@ -62,7 +62,7 @@ class [[nodiscard]] Status {
         }                                                               \
     } while (false)
 
-// A null or unusable argument.
+// Fails for a null or unusable argument.
 #define HOST_REQUIRE(condition)                                                   \
     do {                                                                          \
         if (!(condition)) {                                                       \
@@ -70,11 +70,11 @@ class [[nodiscard]] Status {
         }                                                                         \
     } while (false)
 
-// The last error when memory is too short for words.
+// Sets the last error where memory is too short for words.
 void PublishShortMemory(const char *szStem, int line);
 
-// Runs the body of an exported operation, which returns a Status. Returns `result`, as it is then,
-// or `failure` with the last error set.
+// Runs the body of an exported operation, which returns a Status and sets `result`. Returns
+// `result`, or `failure` with the last error set.
 template <typename Result, typename Body>
 Result RunOperation(const char *szStem, int line, Result failure, Result &result, Body &&body) {
     try {
@@ -102,26 +102,6 @@ int RunOperation(const char *szStem, int line, Body &&body) {
 
 // The words of the calling thread's last error; "" when it has none.
 const char *LastErrorWords();
-
-// ---- Until every function returns a Status ------------------------------------------------------
-
-inline int Fail(unsigned int code, const char *szFile, int line) {
-    YLIBCErrSetEx(code, szFile, line);
-    return -1;
-}
-#define HOST_FAIL(code) ::host::Fail(code, kFile, __LINE__)
-
-// The last error as it is now, for putting it back: what an operation looks at besides may fail
-// without the operation's failing.
-class LastError {
-  public:
-    void Restore() const { YLIBCErrSetEx(m_code, m_szFile, m_line); }
-
-  private:
-    unsigned int m_code = YLIBCErrGet();
-    const char *m_szFile = YLIBCErrorGetFile();
-    int m_line = YLIBCErrorGetLine();
-};
 
 }  // namespace host
 

@@ -108,7 +108,7 @@ Status Failure(const char *szWhat, const std::string &strPath) {
                                           "': " + std::strerror(errno));
 }
 
-// Root's: puts a lock file in the place of what another user has put at the path. It is locked
+// For root: puts a lock file in the place of what another user has put at the path. It is locked
 // meanwhile, so nobody holds it when it turns out that another program of root's has been quicker:
 // that one's file then gets its name back.
 void TakeNameBack(const std::string &strPath) {
@@ -199,7 +199,7 @@ Status CheckHeld(int fd, const std::string &strPath, bool &blAgain) {
 }  // namespace
 
 Status host::TakeLock(const char *szPath, int timeout_s, int &handle) {
-    // Of a name that root cannot take back, another user makes a lock file again and again.
+    // Another user may make a lock file at the path again and again.
     constexpr int kMostTries = 1000;
     const std::string strPath = szPath;
     Wait wait("the lock '" + strPath + '\'', std::chrono::seconds(std::max(timeout_s, 0)));

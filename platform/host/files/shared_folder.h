@@ -25,15 +25,15 @@ Status ReadShared(const std::string &strFolder, bool &blShared);
 // Whether the caller is root and may take the name back from what stands there.
 bool IsForeignToRoot(const std::string &strPath, const struct stat &there);
 
-// Root's: removes what another user has put at the path. What root's program has put there since
-// stays.
+// For root: removes what another user has put at the path. What a program of root's has put there
+// meanwhile stays.
 void RemoveForeign(const std::string &strPath);
 
 // Removes a file, a link or an empty folder. A folder that holds something stays.
 void RemoveAny(const std::string &strPath);
 
-// Whether what stands in a file's place, and was opened (error is 0) or could not be, is refused:
-// what is not our own, and what is root's and shut to the caller.
+// Whether what stands where a file of ours should is refused: because it is not our own, or because
+// it is root's and the caller may not open it. `error` is that of opening it, 0 when it is open.
 bool IsRefused(const struct stat &there, int error);
 
 // Why what stands at the path, where a file of ours should, is refused.

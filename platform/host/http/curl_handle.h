@@ -26,24 +26,24 @@ struct CleanupMulti {
 struct CurlHandle {
     // Known by number, so that a child process can close its copies without a word on the wire.
     std::set<curl_socket_t> sockets;
-    bool blNamesProxy = false;  // whether the environment did when the handle was made
-    // The exchange that goes on.
-    pthread_t user = {};
+    bool blNamesProxy = false;  // the environment named a proxy when the handle was made
+    // Of the exchange in progress.
+    pthread_t user = {};        // the thread that makes it
     bool blForked = false;      // the process was forked in the middle of it: this is the child
-    std::string strHost;        // whose certificate is looked for
-    bool blVerify = true;       // and has to be trusted
-    ZELO::Exchange record;      // what it meets
+    std::string strHost;        // the host that the certificate has to be for
+    bool blVerify = true;       // whether the certificate has to be trusted
+    ZELO::Exchange record;      // what the exchange meets
     bool blTlsEnded = false;    // TLS has announced the end of the connection
     std::string strTlsFailure;  // why TLS was not begun
     std::array<char, CURL_ERROR_SIZE> reason = {};  // libcurl's, of what failed
-    // They go first: cleaning them up closes the sockets, which calls back to the set above. The
-    // connections are the second one's.
+    // Last, so that they are destroyed first: cleaning them up closes the sockets, which calls back
+    // to the set above. pMulti holds the connections.
     std::unique_ptr<CURL, CleanupEasy> pEasy;
     std::unique_ptr<CURLM, CleanupMulti> pMulti;
 };
 
-// A handle from those that are kept, and given back when the exchange is over. It comes with the
-// options of its connections: who is trusted, and how long one is kept.
+// A handle from the process's pool, given back when the exchange is over. It comes with the options
+// of its connections: who is trusted, and how long one is kept.
 class BorrowedHandle {
   public:
     // Throws std::bad_alloc.

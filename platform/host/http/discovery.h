@@ -13,10 +13,10 @@ namespace host {
 // Asks the server for the path, which this process remembers.
 Status AskForPath(const ServerAddress &server, const std::string &api, std::string &strPath);
 
-// The path that this process remembers; otherwise asks for it.
+// Gets the path that this process remembers, or else asks for it.
 Status FindPath(const ServerAddress &server, const std::string &api, std::string &strPath);
 
-// It is not there any more.
+// Forgets the path: the server does not serve the API there any more.
 void ForgetPath(const ServerAddress &server, const std::string &api);
 
 }  // namespace host

@@ -14,7 +14,7 @@
 
 namespace host {
 
-// No exchange is longer in connecting, from the look-up of the name to the end of the handshake.
+// The longest that connecting may take, from the look-up of the name to the end of the handshake.
 constexpr long kConnectLimit_s = 10;
 
 struct FreeHeaders {

@@ -30,7 +30,7 @@ std::string AddressText(const std::string &strAddress, long port) {
     return (blIPv6 ? '[' + strAddress + ']' : strAddress) + ':' + std::to_string(port);
 }
 
-// Milliseconds; -1 for a stage that was not come to.
+// Milliseconds; -1 for a stage that was not reached.
 long Time(CURL *pEasy, CURLINFO info) {
     constexpr curl_off_t kUsPerMs = 1000;
     curl_off_t time_us = 0;

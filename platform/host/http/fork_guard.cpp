@@ -42,7 +42,7 @@ int GuardForks(void (*pfnInChild)()) {
     return pthread_atfork([] { pthread_rwlock_wrlock(&g_lock); },
                           [] { pthread_rwlock_unlock(&g_lock); },
                           [] {
-                              // The lock is kept under the number of the parent's thread.
+                              // The parent's thread holds the lock; the child's has another id.
                               g_lock = kFree;
                               g_pfnInChild();
                           });

@@ -1,5 +1,6 @@
-// Who is inside libcurl, and thus perhaps inside OpenSSL, whose own locks a child process would
-// find locked for ever: a fork waits until no thread is.
+// Keeps libcurl and fork apart. A child that is forked while another thread is inside libcurl, and
+// thus perhaps inside OpenSSL, would find their locks taken for ever; so a fork waits until no
+// thread is inside.
 
 #ifndef ZELO_HOST_FORK_GUARD_H
 #define ZELO_HOST_FORK_GUARD_H
@@ -16,8 +17,8 @@ class InsideLibcurl {
     InsideLibcurl &operator=(const InsideLibcurl &) = delete;
 };
 
-// The other way round: for as long as it lives, the thread, which is inside, runs a function of the
-// program's, which may wait, fork, or make another exchange.
+// For a thread inside that calls a function of the program's: for as long as it lives, the thread
+// counts as outside, so the function may wait, fork, or make another exchange.
 class OutsideLibcurl {
   public:
     OutsideLibcurl();
@@ -26,8 +27,8 @@ class OutsideLibcurl {
     OutsideLibcurl &operator=(const OutsideLibcurl &) = delete;
 };
 
-// Lets no thread fork while another is inside; then pfnInChild runs in the child. Called once,
-// while the library is loaded.
+// From now on a fork waits until no thread is inside, and runs pfnInChild in the child. Called
+// once, while the library is loaded.
 int GuardForks(void (*pfnInChild)());
 
 }  // namespace host

@@ -86,7 +86,7 @@ int RefusalCode(const std::string &strBody) {
 }
 
 // Whether the reply is there to its end, where libcurl sees nothing wrong. A length and chunks tell
-// their end, and libcurl looks at it; any other body ends with its connection.
+// their end, and libcurl looks at it; any other body ends with its connection, whose end TLS tells.
 bool IsWhole(const Transfer &transfer) {
     CURL *const pEasy = transfer.handle.pEasy.get();
     curl_off_t length = -1;

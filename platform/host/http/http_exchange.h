@@ -24,8 +24,8 @@ struct HttpRequest {
     bool blPost = false;           // POST strBody as JSON; otherwise GET
     bool blKeepConnection = true;  // false: close the connection afterwards
     long long limit_ms = 0;        // for the whole exchange; 0: the transport's own
-    bool blVerify = true;          // false: whoever answers; over a connection of its own
-    bool blOwnConnection = false;  // none that is kept
+    bool blVerify = true;          // false: take whoever answers, over a new connection
+    bool blOwnConnection = false;  // over a new connection, none that was kept
     std::string strBody;
     std::vector<std::string> headers;  // "Name: value"
 
@@ -36,7 +36,7 @@ struct HttpRequest {
 };
 
 struct HttpReply {
-    int error = ZELO::CRED_REQ_ERR_NONE;  // why there is none
+    int error = ZELO::CRED_REQ_ERR_NONE;  // why there is none: a value of CRED_REQ_ERROR
     long status = 0;
     std::string strBody;
 };
@@ -44,7 +44,7 @@ struct HttpReply {
 // Performs the exchange, watched by the thread's progress observer; it is the thread's latest
 // exchange then. It succeeds when a whole reply arrived, whatever its status (with a stream: one of
 // 2xx, and written whole). Otherwise reply holds the status, and what came of the body into memory,
-// as far as there was one. A failure is to be logged, except that the caller's copy is current.
+// as far as there was one. A failure is to be logged, unless it says that the copy is current.
 // Throws std::bad_alloc.
 Status Perform(const HttpRequest &request, HttpReply &reply);
 

@@ -1,4 +1,4 @@
-// An exchange while it goes on: what arrives, and whether it may go on.
+// An exchange in progress: what has arrived, and whether it may go on.
 
 #ifndef ZELO_HOST_TRANSFER_H
 #define ZELO_HOST_TRANSFER_H

@@ -109,7 +109,7 @@ const Wait &Database::BeginWait() {
     return m_wait.emplace("the " + m_store.Named(), kBusyLimit);
 }
 
-// False when nothing is in the file, and nothing is to be.
+// False when the file is empty, and no store is to be created in it.
 bool Database::Open(std::unique_ptr<SQLite::Database> &pConnection, bool blCreate) {
     pConnection = std::make_unique<SQLite::Database>(m_store.szPath,
                                                      SQLITE_OPEN_READWRITE | SQLITE_OPEN_NOMUTEX);

@@ -1,5 +1,5 @@
-// A string hash's pairs for the host platform's own code, which need not go through zero-terminated
-// text.
+// Setting a pair of a string hash (text_containers.h) from the host platform's own code, whose
+// texts are not zero-terminated.
 
 #ifndef ZELO_HOST_HASH_PLACE_H
 #define ZELO_HOST_HASH_PLACE_H
