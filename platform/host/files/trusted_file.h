@@ -2,8 +2,8 @@
 //
 // In a shared folder (shared_folder.h) what stands at the path is opened only when it is our own
 // (own_file.h); root removes what is another user's, which counts as not there. In any other folder
-// links are followed and every regular file will do. Only the folder that a
-// name stands in is looked at; those above it are the caller's choice.
+// links are followed and every regular file will do. Only the folder that a name stands in is
+// looked at; those above it are the caller's choice.
 
 #ifndef ZELO_HOST_TRUSTED_FILE_H
 #define ZELO_HOST_TRUSTED_FILE_H
