@@ -293,7 +293,7 @@ bool CheckSecurity(const Way &way, const Exchange &met, const TimeLimit &limit, 
            CheckTls(way, met, checks) && CheckCertificate(way, met, limit, checks);
 }
 
-void Tell(const Way &way, const TimeLimit &limit, CheckList &checks) {
+void MakeChecks(const Way &way, const TimeLimit &limit, CheckList &checks) {
     if (limit.IsOver() || (way.IsRelayed() && !CheckRelay(checks))) {
         return;
     }
@@ -314,7 +314,7 @@ bool CanLookAtServers() {
 Checks CheckConnection(const Way &way, const TimeLimit &limit) {
     CheckList checks;
     if (CanLookAtServers()) {
-        Tell(way, limit, checks);
+        MakeChecks(way, limit, checks);
     } else if (!limit.IsOver()) {
         checks.SkipOthers("this platform cannot look at servers", "see 'api'");
         CheckApi(way, limit, checks);
