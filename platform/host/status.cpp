@@ -71,8 +71,4 @@ void PublishShortMemory(const char *szStem, int line) {
     Set(YLIBC_ERR_OUT_OF_MEMORY, szStem, line, "memory is short");
 }
 
-const char *LastErrorWords() {
-    return t_lastError.words.sz();
-}
-
 }  // namespace host

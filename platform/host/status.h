@@ -100,9 +100,6 @@ int RunOperation(const char *szStem, int line, Body &&body) {
 // return HOST_OPERATION(failure, result, [&]() -> host::Status { … });  `result`, set by the body
 #define HOST_OPERATION(...) ::host::RunOperation(ZELO_SOURCE_STEM, __LINE__, __VA_ARGS__)
 
-// The words of the calling thread's last error; "" when it has none.
-const char *LastErrorWords();
-
 }  // namespace host
 
 #endif

@@ -298,7 +298,7 @@ int ZELOCredStoreListSetAside(YLIBSZLIST **ppslPaths) {
         HOST_TRY(host::ListSetAside(kStore, paths));
         for (const std::string &strPath : paths) {
             if (YLIBCSzListPush(ppslPaths, strPath.c_str()) < 0) {
-                return HOST_ERROR(YLIBCErrGet(), host::LastErrorWords());
+                return HOST_ERROR(YLIBCErrGet(), "the list cannot take '" + strPath + "'");
             }
         }
         count = static_cast<int>(paths.size());
