@@ -61,7 +61,7 @@ bool TakeTarget(const Descriptor &link, Place &place, std::string &strRest) {
 }
 
 // One name on. kFound: the way ends here, or `strRest` goes on from the folder.
-Way Step(std::string &strRest, bool &blEnd, int &links, Place &place) {
+Result Step(std::string &strRest, bool &blEnd, int &links, Place &place) {
     place.strName = TakeName(strRest);
     const char *const szName = place.strName.c_str();
     blEnd = strRest.find_first_not_of('/') == std::string::npos;
@@ -71,27 +71,27 @@ Way Step(std::string &strRest, bool &blEnd, int &links, Place &place) {
     const bool blThere = entry.Get() >= 0;
     if ((!blThere && !(blEnd && errno == ENOENT)) || fstat(place.folder.Get(), &folder) != 0 ||
         (blThere && fstat(entry.Get(), &status) != 0)) {
-        return Way::kFailed;
+        return Result::kFailed;
     }
     if (!IsSafe(folder, blThere ? &status : nullptr, place)) {
-        return Way::kForeignLink;
+        return Result::kForeignLink;
     }
     if (S_ISLNK(status.st_mode)) {
         if (++links > kMaxLinks) {
             errno = ELOOP;
-            return Way::kFailed;
+            return Result::kFailed;
         }
         if (!IsInProc(place.folder)) {
             blEnd = false;
-            return TakeTarget(entry, place, strRest) ? Way::kFound : Way::kFailed;
+            return TakeTarget(entry, place, strRest) ? Result::kFound : Result::kFailed;
         }
         entry = Descriptor(openat(place.folder.Get(), szName, kLook));
         if (entry.Get() < 0) {
-            return Way::kFailed;
+            return Result::kFailed;
         }
     }
     (blEnd ? place.file : place.folder) = std::move(entry);
-    return Way::kFound;
+    return Result::kFound;
 }
 
 // Creates the file where others could put something into its place before it is opened.
@@ -106,20 +106,20 @@ bool Hold(Place &place) {
 
 }  // namespace
 
-Way Find(const std::string &strPath, Place &place) {
+Result Find(const std::string &strPath, Place &place) {
     place = {};
     if (strPath.empty()) {
         errno = ENOENT;
-        return Way::kFailed;
+        return Result::kFailed;
     }
     place.folder = Descriptor(open(strPath.front() == '/' ? "/" : ".", kLook | O_DIRECTORY));
     std::string strRest = strPath;
-    Way way = place.folder.Get() >= 0 ? Way::kFound : Way::kFailed;
+    Result result = place.folder.Get() >= 0 ? Result::kFound : Result::kFailed;
     int links = 0;
-    for (bool blEnd = false; way == Way::kFound && !blEnd;) {
-        way = Step(strRest, blEnd, links, place);
+    for (bool blEnd = false; result == Result::kFound && !blEnd;) {
+        result = Step(strRest, blEnd, links, place);
     }
-    return way;
+    return result;
 }
 
 std::string PathOf(const Descriptor &held) {
@@ -130,7 +130,7 @@ std::string PathOf(const Descriptor &held) {
 // very file that was looked at.
 std::FILE *OpenToWrite(const std::string &strPath) {
     Place place;
-    if (Find(strPath, place) != Way::kFound || !Hold(place)) {
+    if (Find(strPath, place) != Result::kFound || !Hold(place)) {
         return nullptr;
     }
     const std::string strOpened = place.blFixed ? strPath : PathOf(place.file);

@@ -24,10 +24,10 @@ struct Place {
     bool blFixed = true;    // nobody but the owners on the way can make the path lead elsewhere
 };
 
-enum class Way { kFound, kForeignLink, kFailed };
+enum class Result { kFound, kForeignLink, kFailed };
 
 // Goes the way. On kForeignLink and kFailed `place` is of no use; errno says why it failed.
-Way Find(const std::string &strPath, Place &place);
+Result Find(const std::string &strPath, Place &place);
 
 // The path by which what is held can be opened, wherever its names lead by then.
 std::string PathOf(const Descriptor &held);

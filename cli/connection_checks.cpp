@@ -59,7 +59,7 @@ Exchange LookAt(const Way &way, bool blVerify, const TimeLimit &limit) {
     look.strHost = way.strHost;
     look.port = way.port;
     look.strPath = kDiscoveryPath;
-    look.strQuery = std::string("api=") + kQrmApi;
+    look.strQuery = std::string("api=") + appliance::kQrmApi;
     look.blVerify = blVerify;
     look.limit_ms = std::max(1L, limit.Left_ms(kStep_ms));
     Exchange met;
@@ -270,17 +270,19 @@ bool CheckApi(const Way &way, const TimeLimit &limit, CheckList &checks) {
     if (pCred != nullptr && ZELOCredItemSetProtocol(pCred.get(), way.strProtocol.c_str()) == 0 &&
         ZELOCredItemSetHost(pCred.get(), way.strHost.c_str()) == 0 &&
         ZELOCredItemSetPort(pCred.get(), way.port) == 0) {
-        strPath = ZELO::CredRequestUtil::GetWebAPIPath(pCred.get(), kQrmApi);
+        strPath = ZELO::CredRequestUtil::GetWebAPIPath(pCred.get(), appliance::kQrmApi);
     }
     ZELO::CredRequestUtil::SetProgressObserver(nullptr, nullptr);
     if (!strPath.empty()) {
-        return checks.Ok("api", watch.Elapsed_ms(), std::string(kQrmApi) + " is at " + strPath);
+        return checks.Ok("api", watch.Elapsed_ms(),
+                         std::string(appliance::kQrmApi) + " is at " + strPath);
     }
     const int code = LatestExchange().errorCode;
     return checks.Fail("api", watch.Elapsed_ms(),
                        code == 0 ? "it does not answer as a QRM server would"
-                                 : "the server does not serve the API " + std::string(kQrmApi) +
-                                       " (error code " + std::to_string(code) + ")",
+                                 : "the server does not serve the API " +
+                                       std::string(appliance::kQrmApi) + " (error code " +
+                                       std::to_string(code) + ")",
                        "check that a QRM server, in a version that serves the API, stands there");
 }
 

@@ -5,11 +5,10 @@
 
 #include <string>
 
+#include "appliance.h"
 #include "check.h"
 
 namespace qrmctl {
-
-constexpr const char *kQrmApi = "ZELO.QRM.RPC";
 
 // The most that a look, or any other step of a check, may take.
 constexpr long kStep_ms = 10'000;

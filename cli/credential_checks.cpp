@@ -126,7 +126,7 @@ Check CheckToken(const Stored &stored) {
     TimeLimit step(std::chrono::milliseconds{2 * kStep_ms});
     ZELO::CredRequestUtil::SetProgressObserver(GoesOn, &step);
     const RequestHandle pRequest(ZELO::CredRequest::CreateWebAPIRequest(
-        stored.pCred.get(), stored.pSess.get(), kQrmApi, 1, "info", Json::Value()));
+        stored.pCred.get(), stored.pSess.get(), appliance::kQrmApi, 1, "info", Json::Value()));
     const bool blAnswered = pRequest != nullptr && pRequest->Process(false, kStep_s);
     ZELO::CredRequestUtil::SetProgressObserver(nullptr, nullptr);
     if (!blAnswered) {

@@ -87,7 +87,7 @@ ExitCode Tell(Outcome outcome, const std::string &strPath, const Progress &progr
 // False, with the error, when somebody else's link would choose where the file goes.
 bool IsWayOurs(const std::string &strPath, std::string &strError) {
     destination::Place place;
-    if (destination::Find(strPath, place) != destination::Way::kForeignLink) {
+    if (destination::Find(strPath, place) != destination::Result::kForeignLink) {
         return true;
     }
     strError = "'" + strPath +
@@ -127,7 +127,7 @@ bool ResolveDestination(const std::string &strPath, fs::path &file, std::string 
         return false;
     }
     destination::Place place;
-    if (destination::Find(strPath, place) != destination::Way::kFound) {
+    if (destination::Find(strPath, place) != destination::Result::kFound) {
         strError = "cannot reach '" + strPath + "': " + std::strerror(errno);
         return false;
     }

@@ -19,11 +19,11 @@
 #include <utility>
 #include <vector>
 
-#include "deadline.h"
 #include "held_lock.h"
 #include "never_destroyed.h"
 #include "own_file.h"
 #include "shared_folder.h"
+#include "wait.h"
 
 namespace {
 

@@ -6,12 +6,13 @@
 #include <optional>
 #include <string>
 
+#include "appliance.h"
 #include "status.h"
 
 namespace host {
 
 // The host platform's own settings stand beside the appliance's.
-constexpr const char *kConfigFile = "/etc/zeloinfo.conf";
+using appliance::kConfigFile;
 
 // Looks the key up in the file. A key that is absent is no failure: there is no value then.
 Status LookUpKey(const char *szPath, const char *szKey, std::optional<std::string> &value);

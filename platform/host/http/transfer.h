@@ -6,9 +6,9 @@
 #include <cstddef>
 
 #include "curl_handle.h"
-#include "deadline.h"
 #include "http_exchange.h"
 #include "reply_sink.h"
+#include "wait.h"
 
 namespace host {
 

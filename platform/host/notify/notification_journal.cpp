@@ -16,12 +16,12 @@
 #include <mutex>
 #include <thread>
 
-#include "deadline.h"
 #include "descriptor.h"
 #include "files/shared_folder.h"
 #include "fork_safe.h"
 #include "json.h"
 #include "own_file.h"
+#include "wait.h"
 
 namespace {
 

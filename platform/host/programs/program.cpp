@@ -32,7 +32,7 @@
 #include <new>
 #include <string_view>
 
-#include "deadline.h"
+#include "wait.h"
 
 namespace {
 

@@ -92,11 +92,11 @@ Status CheckProgram(const std::string &strPath) {
     destination::Place place;
     struct stat folder = {};
     struct stat file = {};
-    const destination::Way way = destination::Find(strPath, place);
-    const bool blThere = way == destination::Way::kFound && place.file.IsOpen() &&
+    const destination::Result found = destination::Find(strPath, place);
+    const bool blThere = found == destination::Result::kFound && place.file.IsOpen() &&
                          fstat(place.folder.Get(), &folder) == 0 &&
                          fstat(place.file.Get(), &file) == 0;
-    if (!blThere && way != destination::Way::kForeignLink) {
+    if (!blThere && found != destination::Result::kForeignLink) {
         return HOST_ERROR(YLIBC_ERR_EXEC, "cannot run '" + strPath + "': " + std::strerror(errno));
     }
     if (blThere && !S_ISREG(file.st_mode)) {

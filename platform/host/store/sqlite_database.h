@@ -22,10 +22,10 @@
 #include <mutex>
 #include <optional>
 
-#include "deadline.h"
 #include "never_destroyed.h"
 #include "status.h"
 #include "store_file.h"
+#include "wait.h"
 
 namespace host {
 

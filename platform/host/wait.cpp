@@ -1,4 +1,4 @@
-#include "deadline.h"
+#include "wait.h"
 
 #include <algorithm>
 #include <atomic>

@@ -1,8 +1,8 @@
 // Waiting inside the host platform: every wait ends at its own limit or at the process's deadline
 // (diagnosis.h), whichever comes first.
 
-#ifndef ZELO_HOST_DEADLINE_H
-#define ZELO_HOST_DEADLINE_H
+#ifndef ZELO_HOST_WAIT_H
+#define ZELO_HOST_WAIT_H
 
 #include <chrono>
 #include <string>
