@@ -20,9 +20,9 @@ extern "C" {
 // can write to, is refused (YLIBC_ERR_UNSAFE_FILE); links to it are as good as their folders.
 //
 // The operation waits for the program's end. A program that runs for longer than the platform's
-// limit, or past the process's deadline (diagnosis.h), is ended with its whole process group. Whatever the caller does with SIGCHLD, with other
-// children of its own or with its standard streams changes nothing, and no ended child is left to
-// it.
+// limit, or past the process's deadline (diagnosis.h), is ended with its whole process group.
+// Whatever the caller does with SIGCHLD, with other children of its own or with its standard
+// streams changes nothing, and no ended child is left to it.
 //
 // Returns the program's exit status, 0 to 255, or 128 plus the signal's number for a program that a
 // signal ended. Returns a negative value when the program could not be run (YLIBC_ERR_EXEC; a null

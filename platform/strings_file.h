@@ -27,9 +27,9 @@ extern "C" {
 //
 // Returns the length of the text, 0 or more, when the key was found; a negative value, with the
 // buffer as it was and the last error set (last_error.h), otherwise: YLIBC_ERR_NOT_FOUND when the
-// file, the section or the key is not there, YLIBC_ERR_FILE when the file cannot be read or has more
-// in it than a port takes into memory (a section or line of 16 MiB fits), YLIBC_ERR_INVALID_ARGUMENT
-// when an argument is unusable. Any thread may call it at any time.
+// file, the section or the key is not there, YLIBC_ERR_FILE when the file cannot be read or has
+// more in it than a port takes into memory (a section or line of 16 MiB fits),
+// YLIBC_ERR_INVALID_ARGUMENT when an argument is unusable. Any thread may call it at any time.
 ZELO_PLATFORM_API int YLIBCFileGetSectionValue(const char *szPath, const char *szSection,
                                                const char *szKey, char *szValue, int cbValue);
 }

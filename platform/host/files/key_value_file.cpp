@@ -3,7 +3,6 @@
 #include "key_value_file.h"
 
 #include <string_view>
-#include <utility>
 #include <vector>
 
 #include "file_replacement.h"
