@@ -10,6 +10,7 @@
 #include <cstdlib>
 #include <ctime>
 #include <functional>
+#include <map>
 #include <new>
 #include <thread>
 
@@ -194,22 +195,24 @@ TEST_F(UserGroup, WhatCannotBeReadIsNotTakenForMissing) {
     const std::function<int()> lookUps[] = {
         [] { return Get(kName) == nullptr ? -1 : 0; },
         [] { return Administrators() == nullptr ? -1 : 0; },
-        [] { return YLIBGroupIsAdminGroupMem(kName, 0); },
+        [] { return YLIBGroupIsAdminGroupMem(kName, 0); }, [] { return YLIBUserNumRemained(); },
         [] { return YLIBGroupExtraAdminSet("QRM", 0, 0, 0, 0); }};
-    for (const char *szFile : {"/etc/passwd", "/etc/group", kConfig}) {
-        const std::string strKept = std::string(szFile) + ".kept";
-        fs::rename(szFile, strKept);
+    const std::map<std::string, int> expected = {
+        {"/etc/passwd", 3}, {"/etc/group", 2}, {kConfig, 2}};
+    for (const auto &[strFile, lost] : expected) {
+        const std::string strKept = strFile + ".kept";
+        fs::rename(strFile, strKept);
         for (const bool blFolder : {true, false}) {
             int failed = 0;
-            blFolder ? fs::create_directory(szFile) : fs::remove(szFile);
+            blFolder ? fs::create_directory(strFile) : fs::remove(strFile);
             for (const auto &lookUp : lookUps) {
                 YLIBCErrSetEx(YLIBC_ERR_NOT_FOUND, "", 0);
                 failed += FailureOf(lookUp()) == YLIBC_ERR_FILE ? 1 : 0;
             }
-            // Of a setting that the missing file does not hold there is nothing to clear.
-            EXPECT_EQ(failed, szFile == kConfig ? blFolder : 2) << szFile;
+            // A setting that the missing file does not hold has its default.
+            EXPECT_EQ(failed, strFile == kConfig && !blFolder ? 0 : lost) << strFile;
         }
-        fs::rename(strKept, szFile);
+        fs::rename(strKept, strFile);
     }
     EXPECT_EQ(Get("nosuchuser"), nullptr);
     EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_NOT_FOUND));

@@ -233,6 +233,11 @@ Status host::LookUpKey(const char *szPath, const char *szKey, std::optional<std:
     return {};
 }
 
+Status host::ReadSetting(const char *szKey, std::optional<std::string> &value) {
+    Status status = LookUpKey(kConfigFile, szKey, value);
+    return status.Code() == YLIBC_ERR_NOT_FOUND ? Status() : status;
+}
+
 bool host::LookUpSetting(const char *szKey, std::string &strValue) {
     std::optional<std::string> value;
     const bool blFound = !LookUpKey(kConfigFile, szKey, value).Failed() && value;
