@@ -43,8 +43,6 @@ class Wait {
     // Why the wait ended: YLIBC_ERR_DEADLINE at the process's deadline, else `code`.
     Status TimeUp(unsigned int code) const;
 
-    const std::string &WaitsFor() const { return m_strWaitsFor; }
-
   private:
     std::string m_strWaitsFor;
     Clock::time_point m_begin = Clock::now();

@@ -7,8 +7,11 @@
 
 #include <algorithm>
 #include <atomic>
+#include <cstdlib>
 #include <ctime>
 #include <functional>
+#include <map>
+#include <new>
 #include <thread>
 
 #include "accounts.h"
@@ -20,6 +23,10 @@ namespace {
 
 // What the clock shows; 0: the machine's.
 std::time_t g_now = 0;
+
+// The thread's allocations, and the one of them that fails; 0: none.
+thread_local int t_allocations = 0;
+thread_local int t_failing = 0;
 
 }  // namespace
 
@@ -188,22 +195,24 @@ TEST_F(UserGroup, WhatCannotBeReadIsNotTakenForMissing) {
     const std::function<int()> lookUps[] = {
         [] { return Get(kName) == nullptr ? -1 : 0; },
         [] { return Administrators() == nullptr ? -1 : 0; },
-        [] { return YLIBGroupIsAdminGroupMem(kName, 0); },
+        [] { return YLIBGroupIsAdminGroupMem(kName, 0); }, [] { return YLIBUserNumRemained(); },
         [] { return YLIBGroupExtraAdminSet("QRM", 0, 0, 0, 0); }};
-    for (const char *szFile : {"/etc/passwd", "/etc/group", kConfig}) {
-        const std::string strKept = std::string(szFile) + ".kept";
-        fs::rename(szFile, strKept);
+    const std::map<std::string, int> expected = {
+        {"/etc/passwd", 3}, {"/etc/group", 2}, {kConfig, 2}};
+    for (const auto &[strFile, lost] : expected) {
+        const std::string strKept = strFile + ".kept";
+        fs::rename(strFile, strKept);
         for (const bool blFolder : {true, false}) {
             int failed = 0;
-            blFolder ? fs::create_directory(szFile) : fs::remove(szFile);
+            blFolder ? fs::create_directory(strFile) : fs::remove(strFile);
             for (const auto &lookUp : lookUps) {
                 YLIBCErrSetEx(YLIBC_ERR_NOT_FOUND, "", 0);
                 failed += FailureOf(lookUp()) == YLIBC_ERR_FILE ? 1 : 0;
             }
-            // Of a setting that the missing file does not hold there is nothing to clear.
-            EXPECT_EQ(failed, szFile == kConfig ? blFolder : 2) << szFile;
+            // A setting that the missing file does not hold has its default.
+            EXPECT_EQ(failed, strFile == kConfig && !blFolder ? 0 : lost) << strFile;
         }
-        fs::rename(strKept, szFile);
+        fs::rename(strKept, strFile);
     }
     EXPECT_EQ(Get("nosuchuser"), nullptr);
     EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_NOT_FOUND));
@@ -321,6 +330,11 @@ TEST_F(UserGroup, ShadowFilesMayBeMissingWhollyOrInPart) {
     EXPECT_EQ(SetMembers({kName}), 0);
     EXPECT_EQ(Findings(), "");
 
+    partly["passwd"].replace(partly["passwd"].find("QRM:x:") + 4, 1, "$y$hash");
+    WriteFiles(partly);
+    EXPECT_EQ(Change(NewUser(kName, 50000, "")), 0);
+    EXPECT_TRUE(Holds(ReadFiles()["shadow"], "ZelonixQRM:$y$hash::")) << "need not be changed";
+
     m_before.erase("shadow");
     m_before.erase("gshadow");
     WriteFiles(m_before);
@@ -344,6 +358,34 @@ TEST_F(UserGroup, AChangeThatFailsHalfWayIsTakenBack) {
                failures::Reason() == "cannot write '/etc/passwd': File too large";
     }));
     EXPECT_EQ(ReadFiles(), m_before);
+}
+
+TEST_F(UserGroup, ShortMemoryLeavesAllOfAChangeOrNothing) {
+    ASSERT_EQ(Add(NewUser(kName, 50000)), 0);
+    ASSERT_EQ(SetMembers({kName}), 0);
+    const Files before = ReadFiles();
+    const User pLocked = Get(kName);
+    pLocked->blEnabled = 0;
+    pLocked->szDescription[0] = '!';
+    int failures = 0;
+    for (const std::function<int()> &change : std::initializer_list<std::function<int()>>{
+             [&] { return Change(pLocked); }, [] { return Delete({kName}); }}) {
+        t_allocations = t_failing = 0;
+        EXPECT_EQ(change(), 0);
+        const int all = t_allocations;
+        const Files after = ReadFiles();
+        for (int nth = std::max(all - 60, 1); nth <= all; ++nth) {
+            WriteFiles(before);
+            t_allocations = 0;
+            t_failing = nth;
+            const int result = change();
+            t_failing = 0;
+            failures += result < 0 ? 1 : 0;
+            EXPECT_EQ(ReadFiles(), result < 0 ? before : after) << "allocation -" << all - nth;
+        }
+        WriteFiles(before);
+    }
+    EXPECT_GT(failures, 60);
 }
 
 TEST_F(UserGroup, ProcessesAndThreadsChangeAccountsAtOnceAndLoseNothing) {
@@ -401,3 +443,16 @@ TEST_F(UserGroup, PreferencesStayInTheirFolder) {
 }
 
 }  // namespace
+
+void *operator new(std::size_t cb) {
+    void *const p = ++t_allocations == t_failing ? nullptr : std::malloc(cb);
+    return p == nullptr ? throw std::bad_alloc() : p;
+}
+
+void operator delete(void *p) noexcept {
+    std::free(p);
+}
+
+void operator delete(void *p, std::size_t /*cb*/) noexcept {
+    std::free(p);
+}

@@ -6,6 +6,7 @@
 #include <cstring>
 #include <ctime>
 #include <filesystem>
+#include <new>
 #include <string_view>
 #include <system_error>
 
@@ -69,7 +70,7 @@ Status PutShadow(const ZELO_USER &user, bool blNew, const char *szPassword, Shad
         entry = *pPlace;
     } else {
         entry.sp_namp = Text(user.szName);
-        entry.sp_min = entry.sp_max = entry.sp_warn = entry.sp_inact = -1;
+        entry.sp_lstchg = entry.sp_min = entry.sp_max = entry.sp_warn = entry.sp_inact = -1;
         entry.sp_flag = ~0UL;
     }
     if (blNew || user.szPassword[0] != '\0') {
@@ -114,7 +115,6 @@ Status TakeOff(const Names &names, File &file, Lists... lists) {
     return {};
 }
 
-// What resists its removal is left: the users are gone all the same.
 void RemoveDirectories(const Names &names, const Names &homes, const PasswdFile &others) {
     for (const std::string &strHome : homes) {
         const bool blShared = others.FindIf([&](const struct passwd &entry) {
@@ -223,7 +223,11 @@ Status DeleteUsers(const Names &names) {
         passwd.Remove(strName);
     }
     HOST_TRY(WriteInOrder(groupShadow, groups, shadow, passwd));
-    RemoveDirectories(names, homes, passwd);
+    try {
+        RemoveDirectories(names, homes, passwd);
+    } catch (const std::bad_alloc &) {
+        // What resists its removal is left: the users are gone all the same.
+    }
     return {};
 }
 

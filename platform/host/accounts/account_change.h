@@ -8,8 +8,8 @@
 #include <string>
 #include <vector>
 
-#include "account_files.h"
 #include "files/directories.h"
+#include "status.h"
 #include "user_group.h"
 
 namespace host {

@@ -145,9 +145,11 @@ Status AccountFile<Format>::Write() {
 }
 
 template <typename Format>
-void AccountFile<Format>::PutBack() {
-    if (m_blWritten) {
-        static_cast<void>(ReplaceFile(m_found, m_strRead));
+void AccountFile<Format>::PutBack() noexcept {
+    try {
+        static_cast<void>(!m_blWritten || ReplaceFile(m_found, m_strRead).Failed());
+    } catch (const std::bad_alloc &) {
+        // The file stays as it is now.
     }
 }
 

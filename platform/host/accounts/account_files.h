@@ -13,6 +13,7 @@
 #include <shadow.h>
 
 #include <memory>
+#include <new>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -62,7 +63,7 @@ struct GroupShadowFormat {
 // In the password field of the other file: the hash stands in the shadow file.
 constexpr std::string_view kHashInShadow = "x";
 
-// Entries that are handed out live until they are replaced or one is removed.
+// Entries that are handed out live until they are replaced, or one is added or removed.
 template <typename Format>
 class AccountFile {
   public:
@@ -96,7 +97,7 @@ class AccountFile {
     Status Get(const std::string &strName, const Entry *&pEntry) const;
 
     // Puts the entry in the place of one of the file's own, which it may share texts with; at the
-    // file's end when pPlace is null. The other entries that were handed out stay valid.
+    // file's end when pPlace is null.
     Status Put(const Entry &entry, const Entry *pPlace);
 
     // Removes every entry of this name.
@@ -106,7 +107,7 @@ class AccountFile {
     Status Write();
 
     // Puts the content back that was read, where Write has replaced it; as far as that is possible.
-    void PutBack();
+    void PutBack() noexcept;
 
   private:
     static constexpr auto kName = Format::kName;
@@ -145,7 +146,12 @@ Status ReadAll(Files &...files) {
 template <typename... Files>
 Status WriteInOrder(Files &...files) {
     Status status;
-    if (!((status = files.Write(), !status.Failed()) && ...)) {
+    try {
+        static_cast<void>(((status = files.Write(), !status.Failed()) && ...));
+    } catch (const std::bad_alloc &) {
+        status = HOST_ERROR(YLIBC_ERR_OUT_OF_MEMORY, "memory is short");
+    }
+    if (status.Failed()) {
         (files.PutBack(), ...);
     }
     return status;

@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <charconv>
 #include <cstring>
+#include <optional>
 #include <string_view>
 #include <system_error>
 
@@ -91,12 +92,13 @@ Status CheckMayStore(const ZELO_USER &user, bool blNew, const PasswdFile &passwd
 
 Status CountRemaining(const PasswdFile &passwd, int &remaining) {
     int max = kDefaultMaxUsers;
-    std::string strMax;
-    if (LookUpSetting(kMaxUsersKey, strMax)) {
-        const char *const pEnd = strMax.data() + strMax.size();
-        const auto parsed = std::from_chars(strMax.data(), pEnd, max);
+    std::optional<std::string> setting;
+    HOST_TRY(ReadSetting(kMaxUsersKey, setting));
+    if (setting) {
+        const char *const pEnd = setting->data() + setting->size();
+        const auto parsed = std::from_chars(setting->data(), pEnd, max);
         if (parsed.ec != std::errc() || parsed.ptr != pEnd) {
-            return HOST_ERROR(YLIBC_ERR_FILE, "'" + strMax + "' of '" + kMaxUsersKey + "' in '" +
+            return HOST_ERROR(YLIBC_ERR_FILE, "'" + *setting + "' of '" + kMaxUsersKey + "' in '" +
                                                   kConfigFile + "' is no number");
         }
     }

@@ -292,10 +292,7 @@ int YLIBGroupExtraAdminSet(const char *szName, int n1, int n2, int n3, int n4) {
         const std::string strKey = kExtraAdminKey + std::string(szName);
         if (n1 == 0 && n2 == 0 && n3 == 0 && n4 == 0) {
             std::optional<std::string> before;
-            Status read = host::LookUpKey(host::kConfigFile, strKey.c_str(), before);
-            if (read.Failed() && read.Code() != YLIBC_ERR_NOT_FOUND) {
-                return read;
-            }
+            HOST_TRY(host::ReadSetting(strKey.c_str(), before));
             return before.value_or("").empty() ? Status() : host::SetSetting(strKey.c_str(), "");
         }
         std::string strValue = std::to_string(n1);

@@ -3,7 +3,6 @@
 #include "key_value_file.h"
 
 #include <string_view>
-#include <utility>
 #include <vector>
 
 #include "file_replacement.h"
@@ -232,6 +231,11 @@ Status host::LookUpKey(const char *szPath, const char *szKey, std::optional<std:
         value = ValueOf(line.value);
     }
     return {};
+}
+
+Status host::ReadSetting(const char *szKey, std::optional<std::string> &value) {
+    Status status = LookUpKey(kConfigFile, szKey, value);
+    return status.Code() == YLIBC_ERR_NOT_FOUND ? Status() : status;
 }
 
 bool host::LookUpSetting(const char *szKey, std::string &strValue) {
