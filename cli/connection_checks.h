@@ -5,11 +5,12 @@
 
 #include <string>
 
+#include "appliance.h"
 #include "check.h"
 
 namespace qrmctl {
 
-constexpr const char *kQrmApi = "ZELO.QRM.RPC";
+using appliance::kQrmApi;
 
 // No step of a check takes longer.
 constexpr long kStep_ms = 10'000;

@@ -22,8 +22,7 @@
 
 extern "C" {
 
-// --- Reasons
-// --------------------------------------------------------------------------------------
+// --- Reasons -------------------------------------------------------------------------------------
 
 // Writes the words of the calling thread's latest failure (last_error.h) into the buffer of
 // cbReason bytes, cut between characters and zero-terminated, such as "cannot connect to
@@ -33,12 +32,12 @@ ZELO_DIAGNOSIS_API int ZELODiagnosisReason(char *szReason, int cbReason);
 
 // --- Damaged stores -----------------------------------------------------------------------------
 //
-// Nothing but these operations sets the file of a damaged store aside, and they do it for nothing but
-// damage: not where the store is busy, out of reach, or cannot be read whole.
+// Nothing but these operations sets the file of a damaged store aside, and they do it for nothing
+// but damage: not where the store is busy, out of reach, or cannot be read whole.
 
-// Looks through the whole credential store (credential_store.h); where its file could be read whole,
-// and is damaged or of another format, renames it to one in the same folder whose name says when,
-// and never replaces another. The store is empty then, and ids count from the beginning.
+// Looks through the whole credential store (credential_store.h); where its file could be read
+// whole, and is damaged or of another format, renames it to one in the same folder whose name says
+// when, and never replaces another. The store is empty then, and ids count from the beginning.
 //
 // Returns 1 when it was set aside, 0 when nothing is damaged, a negative value when that could not
 // be found out or done; the operation may be called again then. szPath, a buffer of cbPath bytes,
@@ -53,8 +52,7 @@ ZELO_DIAGNOSIS_API int ZELOCredStoreListSetAside(YLIBSZLIST **ppslPaths);
 // context. The store is empty then: who had a session signs in again.
 ZELO_DIAGNOSIS_API int ZeloCgiStoreSetAside(char *szPath, int cbPath);
 
-// --- The deadline
-// ---------------------------------------------------------------------------------
+// --- The deadline --------------------------------------------------------------------------------
 //
 // One point in time for the whole process, at which every wait of the platform ends: for a lock, a
 // busy store, a program, a server, a name. An operation that had to give up so fails with
@@ -69,8 +67,8 @@ ZELO_DIAGNOSIS_API void ZELODeadlineSet(long long left_ms);
 ZELO_DIAGNOSIS_API long long ZELODeadlineLeft(void);
 
 // Called in the waiting thread, about once a second while an operation waits, and when the deadline
-// ends the wait: what for, such as "the lock '/tmp/userlock'", and for how long already. It must not
-// throw.
+// ends the wait: what for, such as "the lock '/tmp/userlock'", and for how long already. It must
+// not throw.
 typedef void (*ZELO_WAIT_OBSERVER)(void *pContext, const char *szWaitsFor, double waited_s);
 
 // Sets the observer of all waits of the process; null for none, as at the start. Set it while no
@@ -78,8 +76,7 @@ typedef void (*ZELO_WAIT_OBSERVER)(void *pContext, const char *szWaitsFor, doubl
 ZELO_DIAGNOSIS_API void ZELOWaitObserverSet(ZELO_WAIT_OBSERVER pfnObserver, void *pContext);
 }
 
-// --- Exchanges
-// ------------------------------------------------------------------------------------
+// --- Exchanges -----------------------------------------------------------------------------------
 //
 // What an exchange with a server met (web_api_request.h). These are C++ and may throw
 // std::bad_alloc.
@@ -140,8 +137,8 @@ struct Exchange {
     int error = 0;
     unsigned int code = 0;
     std::string strWords;
-    std::string
-        strRemedy;  // what mends it, where the platform knows; also for a reply that refuses
+    // What mends it, where the platform knows; also for a reply that refuses.
+    std::string strRemedy;
 };
 
 // The calling thread's latest exchange, discovery, call or look, also where it failed: for a

@@ -44,8 +44,6 @@ class Wait {
     // limit.
     Status TimeUp(unsigned int code) const;
 
-    const std::string &WaitsFor() const { return m_strWaitsFor; }
-
   private:
     std::string m_strWaitsFor;
     Clock::time_point m_begin = Clock::now();

@@ -103,26 +103,6 @@ int RunOperation(const char *szStem, int line, Body &&body) {
 // The words of the calling thread's last error; "" when it has none.
 const char *LastErrorWords();
 
-// ---- Until every function returns a Status ------------------------------------------------------
-
-inline int Fail(unsigned int code, const char *szFile, int line) {
-    YLIBCErrSetEx(code, szFile, line);
-    return -1;
-}
-#define HOST_FAIL(code) ::host::Fail(code, kFile, __LINE__)
-
-// The last error as it is now, for putting it back: what an operation looks at besides may fail
-// without the operation's failing.
-class LastError {
-  public:
-    void Restore() const { YLIBCErrSetEx(m_code, m_szFile, m_line); }
-
-  private:
-    unsigned int m_code = YLIBCErrGet();
-    const char *m_szFile = YLIBCErrorGetFile();
-    int m_line = YLIBCErrorGetLine();
-};
-
 }  // namespace host
 
 #endif
