@@ -207,7 +207,10 @@ Status Transact(const HttpRequest &request, CurlHandle &handle, HttpReply &reply
     SetCallbacks(transfer);
     const CURLcode result = Run(transfer);
     NoteAnswer(handle.pEasy.get(), record);
-    record.blTimedOut = result == CURLE_OPERATION_TIMEDOUT;
+    // A limit of the exchange's own ends it as a callback would.
+    record.blTimedOut =
+        result == CURLE_OPERATION_TIMEDOUT ||
+        (result == CURLE_ABORTED_BY_CALLBACK && !transfer.blStopped && transfer.IsTimeUp());
     Status status = Judge(transfer, result, reply.error);
     reply.status = record.httpStatus;
     reply.strBody.swap(transfer.sink.Body());
