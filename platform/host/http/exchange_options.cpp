@@ -87,6 +87,8 @@ void SetRequest(const HttpRequest &request, CURL *pEasy) {
     const bool blAlone = request.blOwnConnection || !request.blVerify;
     curl_easy_setopt(pEasy, CURLOPT_FRESH_CONNECT, blAlone ? 1L : 0L);
     curl_easy_setopt(pEasy, CURLOPT_FORBID_REUSE, request.blKeepConnection && !blAlone ? 0L : 1L);
+    // The server alone: a proxy that is spoken to over TLS gets a password, and stays verified.
+    curl_easy_setopt(pEasy, CURLOPT_SSL_VERIFYPEER, request.blVerify ? 1L : 0L);
     curl_easy_setopt(pEasy, CURLOPT_SSL_VERIFYHOST, request.blVerify ? 2L : 0L);
     curl_easy_setopt(pEasy, CURLOPT_BUFFERSIZE,
                      request.pStream == nullptr ? kReplyBuffer : kStreamBuffer);
