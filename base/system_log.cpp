@@ -47,7 +47,7 @@ void Write(int level, const char *szStem, int line, std::string_view text, std::
         syslog(level, "%s:%d %s%s", szStem, line, safe.sz(), szEnd);
     } else {
         syslog(level, "%s:%d %s... [cut, %zu bytes in all]", szStem, line, safe.sz(),
-               cbWhole == 0 ? text.size() : cbWhole);
+               cbWhole == 0 ? text.size() + std::strlen(szEnd) : cbWhole);
     }
 }
 

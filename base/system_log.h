@@ -12,8 +12,9 @@ namespace system_log {
 constexpr std::size_t kMaxMessage = 8000;
 
 // Writes one line at a level such as LOG_ERR, with the text made printable (printable.h). szEnd
-// goes behind it as it is. Where `text` is the first part of a longer one, cbWhole is the length of
-// that. Such a text, and one that does not fit, goes out cut, with its whole length named.
+// goes behind it as it is. A text of which only the first part fits, or is given (cbWhole is the
+// length of the whole one, 0 for that of `text` and szEnd), goes out cut, with its whole length
+// named.
 //
 // Never throws and allocates nothing, so it works when memory is short; and in a child process,
 // whatever other threads were logging when the process forked.

@@ -19,7 +19,6 @@ namespace {
 using ZELO::Exchange;
 using ZELO::ServerCertificate;
 
-constexpr const char *kDiscoveryPath = "/qrm/discover";
 constexpr const char *kAuthoritiesFolder = "/usr/zelo/etc/ssl/ca.d";
 constexpr int kStatusOk = 200;
 constexpr int kStatusBadRequest = 400;
@@ -58,7 +57,7 @@ Exchange LookAt(const Way &way, bool blVerify, const TimeLimit &limit) {
     look.strProtocol = way.strProtocol;
     look.strHost = way.strHost;
     look.port = way.port;
-    look.strPath = kDiscoveryPath;
+    look.strPath = appliance::kDiscoveryPath;
     look.strQuery = std::string("api=") + appliance::kQrmApi;
     look.blVerify = blVerify;
     look.limit_ms = std::max(1L, limit.Left_ms(kStep_ms));

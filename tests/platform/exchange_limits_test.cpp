@@ -146,6 +146,19 @@ TEST(ExchangeLimits, TheDeadlineHoldsWhateverArrives) {
     ZELODeadlineSet(-1);
 }
 
+TEST(ExchangeLimits, ALimitThatEndsALookIsTold) {
+    const EndlessServer server("", "", std::chrono::milliseconds(10));
+    ZELO::Look look;
+    look.strProtocol = "http";
+    look.strHost = "127.0.0.1";
+    look.port = server.Port();
+    look.limit_ms = 300;
+    ZELO::Exchange exchange;
+    EXPECT_FALSE(ZELO::LookAtServer(look, exchange, nullptr));
+    EXPECT_TRUE(exchange.blTimedOut) << exchange.strWords;
+    EXPECT_EQ(exchange.code, unsigned{YLIBC_ERR_NETWORK});
+}
+
 TEST(ExchangeLimits, TheObserverOfWaitsIsCalledMeanwhile) {
     int calls = 0;
     ZELOWaitObserverSet(

@@ -336,6 +336,23 @@ TEST_F(Request, EachExchangeIsRecorded) {
     EXPECT_EQ(met.code, unsigned{YLIBC_ERR_INVALID_ARGUMENT});
 }
 
+// It may be shown a password.
+TEST_F(Request, AProxyIsVerifiedInEveryLook) {
+    Replace(kConfig, "use_proxy_environment=yes\n");
+    const int port = m_pServer->HttpsPort();
+    const auto isSpokenTo = [&] {
+        return children::InOne([port] {
+            setenv("https_proxy", ("https://localhost:" + std::to_string(port)).c_str(), 1);
+            ZELO::Exchange met;
+            ZELO::LookAtServer({"https", "localhost", port, "/", "", false, 10000}, met, nullptr);
+            return met.relayStatus != 0;
+        });
+    };
+    EXPECT_TRUE(isSpokenTo());
+    fs::remove(kCaFile);
+    EXPECT_FALSE(isSpokenTo());
+}
+
 // A thread holds many a lock while it connects; its child has to connect too.
 TEST_F(Request, AChildOfAFirstDiscoveryMakesItsOwn) {
     constexpr int kRuns = 12;

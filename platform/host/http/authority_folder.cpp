@@ -1,6 +1,5 @@
 #include "authority_folder.h"
 
-#include <openssl/bio.h>
 #include <openssl/err.h>
 #include <openssl/pem.h>
 
@@ -9,16 +8,13 @@
 #include <new>
 #include <system_error>
 
+#include "certificate_facts.h"
 #include "files/trusted_file.h"
 
 namespace host {
 namespace {
 
 namespace fs = std::filesystem;
-
-struct FreeBio {
-    void operator()(BIO *pBio) const { BIO_free(pBio); }
-};
 
 // Instead of OpenSSL's own, which asks at the terminal.
 int NoPassword(char * /*szPassword*/, int /*cbPassword*/, int /*purpose*/, void * /*pContext*/) {
@@ -46,12 +42,11 @@ Status ReadNames(std::vector<AuthorityFile> &files) {
             files.push_back({entries->path().string(), {}});
         }
     }
-    std::sort(files.begin(), files.end(),
-              [](const auto &one, const auto &other) { return one.strPath < other.strPath; });
     if (error) {
-        files.push_back({kAuthorityFolder, {}});
         return Unreadable(kAuthorityFolder);
     }
+    std::sort(files.begin(), files.end(),
+              [](const auto &one, const auto &other) { return one.strPath < other.strPath; });
     return {};
 }
 
@@ -66,8 +61,7 @@ bool ReadFile(AuthorityFile &file) {
 }  // namespace
 
 Status ReadCertificates(const std::string &strPem, std::vector<Certificate> &certificates) {
-    const std::unique_ptr<BIO, FreeBio> pPem(
-        BIO_new_mem_buf(strPem.data(), static_cast<int>(strPem.size())));
+    const Bio pPem(BIO_new_mem_buf(strPem.data(), static_cast<int>(strPem.size())));
     if (pPem == nullptr) {
         throw std::bad_alloc();
     }
@@ -87,12 +81,9 @@ Status ReadCertificates(const std::string &strPem, std::vector<Certificate> &cer
 
 Status ReadAuthorities(std::vector<AuthorityFile> &files) {
     HOST_TRY(ReadNames(files));
-    for (auto file = files.begin(); file != files.end(); ++file) {
-        if (!ReadFile(*file)) {
-            const std::string strPath = file->strPath;
-            files.erase(file, files.end());
-            files.push_back({strPath, {}});
-            return Unreadable(strPath);
+    for (AuthorityFile &file : files) {
+        if (!ReadFile(file)) {
+            return Unreadable(file.strPath);
         }
     }
     return {};

@@ -31,7 +31,7 @@ struct AuthorityFile {
 Status ReadCertificates(const std::string &strPem, std::vector<Certificate> &certificates);
 
 // All files, by name. A folder that is not there holds none. Fails when one cannot be read as
-// certificates; the last of `files` is that one then, without certificates.
+// certificates.
 Status ReadAuthorities(std::vector<AuthorityFile> &files);
 
 // Adds all of them to the store.

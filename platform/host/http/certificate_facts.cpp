@@ -1,13 +1,11 @@
 #include "certificate_facts.h"
 
 #include <arpa/inet.h>
-#include <openssl/bio.h>
 #include <openssl/evp.h>
 #include <openssl/pem.h>
 #include <openssl/x509v3.h>
 
 #include <array>
-#include <memory>
 #include <new>
 #include <tuple>
 
@@ -15,11 +13,6 @@ namespace host {
 namespace {
 
 constexpr std::size_t kMaxNames = 200;
-
-struct FreeBio {
-    void operator()(BIO *pBio) const { BIO_free(pBio); }
-};
-using Bio = std::unique_ptr<BIO, FreeBio>;
 
 // What `print` writes; empty when it fails.
 template <typename Print>

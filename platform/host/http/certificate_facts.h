@@ -3,15 +3,22 @@
 #ifndef ZELO_HOST_CERTIFICATE_FACTS_H
 #define ZELO_HOST_CERTIFICATE_FACTS_H
 
+#include <openssl/bio.h>
 #include <openssl/x509.h>
 
 #include <ctime>
+#include <memory>
 #include <string>
 #include <utility>
 
 #include "diagnosis.h"
 
 namespace host {
+
+struct FreeBio {
+    void operator()(BIO *pBio) const { BIO_free(pBio); }
+};
+using Bio = std::unique_ptr<BIO, FreeBio>;
 
 // Subject, issuer, names, times and fingerprint. Throws std::bad_alloc, as all of these do.
 ZELO::ServerCertificate ReadCertificate(X509 *pCertificate);

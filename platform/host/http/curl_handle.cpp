@@ -183,9 +183,12 @@ BorrowedHandle::BorrowedHandle() {
     m_pHandle->blTlsEnded = false;
     m_pHandle->strTlsFailure.clear();
     const std::lock_guard<std::mutex> lock(g_pool->mutex);
-    g_pool->inUse.insert(m_pHandle.get());
     // A child process, where memory may be short, moves all of them there.
-    g_pool->abandoned.reserve(g_pool->abandoned.size() + kMaxIdleHandles + g_pool->inUse.size());
+    g_pool->abandoned.reserve(g_pool->abandoned.size() + kMaxIdleHandles + g_pool->inUse.size() +
+                              1);
+    // The last step: nothing may fail any more, which would leave the set with a handle that is
+    // gone.
+    g_pool->inUse.insert(m_pHandle.get());
 }
 
 BorrowedHandle::~BorrowedHandle() {

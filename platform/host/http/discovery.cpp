@@ -7,6 +7,7 @@
 #include <mutex>
 #include <utility>
 
+#include "appliance.h"
 #include "diagnosis.h"
 #include "exchange_record.h"
 #include "fork_safe.h"
@@ -19,7 +20,6 @@
 namespace host {
 namespace {
 
-constexpr const char *kDiscoveryPath = "/qrm/discover";
 constexpr long kStatusOk = 200;
 constexpr std::size_t kMaxPath = 1024;
 constexpr std::size_t kMaxPaths = 256;
@@ -73,7 +73,7 @@ std::string ReadAnswer(const HttpReply &reply, std::string &strPath) {
 
 Status AskForPath(const ServerAddress &server, const std::string &api, std::string &strPath) {
     HttpRequest request;
-    HOST_TRY(server.Url(kDiscoveryPath, "api=" + api, request.strUrl));
+    HOST_TRY(server.Url(appliance::kDiscoveryPath, "api=" + api, request.strUrl));
     request.blRelay = server.IsRelayed();
     HttpReply reply;
     HOST_TRY(Perform(request, reply));
@@ -125,10 +125,10 @@ std::string ZELO::CredRequestUtil::GetWebAPIPath(const ZELO_CRED *pCred, const s
     return strPath;
 }
 
+// Short memory is thrown here too: an exchange without a word would be taken for what was met.
 bool ZELO::LookAtServer(const Look &look, Exchange &exchange, std::string *pBody) {
-    bool blWhole = true;
     exchange = {};
-    return HOST_OPERATION(false, blWhole, [&]() -> host::Status {
+    host::Status status = [&]() -> host::Status {
         const host::ServerAddress server{look.strProtocol, look.strHost, look.port};
         host::HttpRequest request;
         host::Status usable = server.Url(look.strPath, look.strQuery, request.strUrl);
@@ -146,11 +146,15 @@ bool ZELO::LookAtServer(const Look &look, Exchange &exchange, std::string *pBody
         request.blOwnConnection = true;
         request.limit_ms = look.limit_ms;
         host::HttpReply reply;
-        host::Status status = host::Perform(request, reply);
+        host::Status performed = host::Perform(request, reply);
         exchange = LatestExchange();
         if (pBody != nullptr) {
             *pBody = std::move(reply.strBody);
         }
-        return status;
-    });
+        return performed;
+    }();
+    if (status.Failed()) {
+        status.Publish();
+    }
+    return !status.Failed();
 }

@@ -1,9 +1,9 @@
 #include "exchange_options.h"
 
-#include <algorithm>
 #include <new>
 
 #include "files/key_value_lookup.h"
+#include "server_address.h"
 
 namespace host {
 namespace {
@@ -15,13 +15,6 @@ constexpr long kStreamBuffer = 512 * 1024L;
 constexpr long kReplyBuffer = 16 * 1024L;
 // What is sent is small, while libcurl allocates and frees its buffer for each exchange.
 constexpr long kUploadBuffer = 16 * 1024L;
-
-struct CleanupUrl {
-    void operator()(CURLU *pUrl) const { curl_url_cleanup(pUrl); }
-};
-struct FreeText {
-    void operator()(char *sz) const { curl_free(sz); }
-};
 
 // Without memory for a text libcurl would do without it: with another proxy, or none.
 void SetText(CURL *pEasy, CURLoption option, const char *szText) {
@@ -94,6 +87,8 @@ void SetRequest(const HttpRequest &request, CURL *pEasy) {
     const bool blAlone = request.blOwnConnection || !request.blVerify;
     curl_easy_setopt(pEasy, CURLOPT_FRESH_CONNECT, blAlone ? 1L : 0L);
     curl_easy_setopt(pEasy, CURLOPT_FORBID_REUSE, request.blKeepConnection && !blAlone ? 0L : 1L);
+    // The server alone: a proxy that is spoken to over TLS gets a password, and stays verified.
+    curl_easy_setopt(pEasy, CURLOPT_SSL_VERIFYPEER, request.blVerify ? 1L : 0L);
     curl_easy_setopt(pEasy, CURLOPT_SSL_VERIFYHOST, request.blVerify ? 2L : 0L);
     curl_easy_setopt(pEasy, CURLOPT_BUFFERSIZE,
                      request.pStream == nullptr ? kReplyBuffer : kStreamBuffer);
@@ -121,39 +116,6 @@ Status SetOptions(const HttpRequest &request, CurlHandle &handle, Headers &heade
     SetHeaders(request, handle.pEasy.get(), headers);
     SetRequest(request, handle.pEasy.get());
     return {};
-}
-
-std::string HostAndPortOf(const std::string &strUrl) {
-    const std::size_t begin = strUrl.find("//") + 2;
-    return strUrl.substr(begin, strUrl.find_first_of("/?", begin) - begin);
-}
-
-std::string BuildUrl(const std::string &strScheme, const std::string &strHost, long port,
-                     const std::string &strPath, const std::string &strQuery) {
-    // libcurl would take a host with control characters, and so would a log line.
-    const bool blPlain = std::none_of(strHost.begin(), strHost.end(),
-                                      [](unsigned char c) { return c <= ' ' || c == 0x7F; });
-    if (port < 1 || port > 65535 || !blPlain) {
-        return {};
-    }
-    const bool blBareIPv6 = strHost.find(':') != std::string::npos && strHost.front() != '[';
-    const std::string strUrlHost = blBareIPv6 ? '[' + strHost + ']' : strHost;
-    const std::unique_ptr<CURLU, CleanupUrl> pUrl(curl_url());
-    if (pUrl == nullptr ||
-        curl_url_set(pUrl.get(), CURLUPART_SCHEME, strScheme.c_str(), 0) != CURLUE_OK ||
-        curl_url_set(pUrl.get(), CURLUPART_HOST, strUrlHost.c_str(), 0) != CURLUE_OK ||
-        curl_url_set(pUrl.get(), CURLUPART_PORT, std::to_string(port).c_str(), 0) != CURLUE_OK ||
-        curl_url_set(pUrl.get(), CURLUPART_PATH, strPath.c_str(), 0) != CURLUE_OK ||
-        (!strQuery.empty() && curl_url_set(pUrl.get(), CURLUPART_QUERY, strQuery.c_str(),
-                                           CURLU_APPENDQUERY | CURLU_URLENCODE) != CURLUE_OK)) {
-        return {};
-    }
-    char *szRaw = nullptr;
-    if (curl_url_get(pUrl.get(), CURLUPART_URL, &szRaw, 0) != CURLUE_OK) {
-        return {};
-    }
-    const std::unique_ptr<char, FreeText> szUrl(szRaw);
-    return szUrl.get();
 }
 
 }  // namespace host

@@ -26,9 +26,6 @@ using Headers = std::unique_ptr<curl_slist, FreeHeaders>;
 // until the exchange is over. Throws std::bad_alloc.
 Status SetOptions(const HttpRequest &request, CurlHandle &handle, Headers &headers);
 
-// "host:port" of an URL that BuildUrl made.
-std::string HostAndPortOf(const std::string &strUrl);
-
 }  // namespace host
 
 #endif

@@ -100,6 +100,12 @@ bool IsWhole(const Transfer &transfer) {
            (length >= 0 || blChunked || !blSecure || transfer.handle.blTlsEnded);
 }
 
+// What the sink has against the reply.
+Status WhyRefused(const ReplySink &sink, int &error) {
+    error = sink.Error();
+    return error == ZELO::CRED_REQ_ERR_NONE ? Status() : HOST_ERROR(CodeOf(error), sink.Reason());
+}
+
 // Why an exchange was ended that libcurl would have gone on with: a value of CRED_REQ_ERROR.
 Status WhyEnded(const Transfer &transfer, int &error) {
     error = ZELO::CRED_REQ_ERR_NETWORK;
@@ -124,9 +130,7 @@ Status WhyEnded(const Transfer &transfer, int &error) {
         return HOST_ERROR(YLIBC_ERR_NETWORK,
                           "the connection ended before a reply, and a call is not sent twice");
     }
-    error = transfer.sink.Error();
-    return error == ZELO::CRED_REQ_ERR_NONE ? Status()
-                                            : HOST_ERROR(CodeOf(error), transfer.sink.Reason());
+    return WhyRefused(transfer.sink, error);
 }
 
 Status WhyFailed(const Transfer &transfer, CURLcode result, int &error) {
@@ -158,10 +162,8 @@ Status Judge(Transfer &transfer, CURLcode result, int &error) {
         error = ZELO::CRED_REQ_ERR_NETWORK;
         return HOST_ERROR(YLIBC_ERR_NETWORK, "the reply is cut");
     }
-    static_cast<void>(transfer.sink.Finish(transfer.handle.record.httpStatus));
-    error = transfer.sink.Error();
-    return error == ZELO::CRED_REQ_ERR_NONE ? Status()
-                                            : HOST_ERROR(CodeOf(error), transfer.sink.Reason());
+    transfer.sink.Finish(transfer.handle.record.httpStatus);
+    return WhyRefused(transfer.sink, error);
 }
 
 // What mends a refusal whose reason does not say it; empty for others.
@@ -205,7 +207,10 @@ Status Transact(const HttpRequest &request, CurlHandle &handle, HttpReply &reply
     SetCallbacks(transfer);
     const CURLcode result = Run(transfer);
     NoteAnswer(handle.pEasy.get(), record);
-    record.blTimedOut = result == CURLE_OPERATION_TIMEDOUT;
+    // A limit of the exchange's own ends it as a callback would.
+    record.blTimedOut =
+        result == CURLE_OPERATION_TIMEDOUT ||
+        (result == CURLE_ABORTED_BY_CALLBACK && !transfer.blStopped && transfer.IsTimeUp());
     Status status = Judge(transfer, result, reply.error);
     reply.status = record.httpStatus;
     reply.strBody.swap(transfer.sink.Body());

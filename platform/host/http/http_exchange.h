@@ -19,7 +19,7 @@
 namespace host {
 
 struct HttpRequest {
-    std::string strUrl;            // one of BuildUrl's
+    std::string strUrl;            // one of ServerAddress::Url's
     bool blRelay = false;          // through the relay of the platform's configuration
     bool blPost = false;           // POST strBody as JSON; otherwise GET
     bool blKeepConnection = true;  // false: close the connection afterwards
@@ -47,12 +47,6 @@ struct HttpReply {
 // as far as there was one. A failure is to be logged, unless it says that the copy is current.
 // Throws std::bad_alloc.
 Status Perform(const HttpRequest &request, HttpReply &reply);
-
-// Builds an URL; the host may be a name, an IPv4 or an IPv6 address, the query empty or
-// "name=value" with a value that is encoded here. Empty when a part does not fit into an URL: a
-// host that holds more than a host, a port out of range.
-std::string BuildUrl(const std::string &strScheme, const std::string &strHost, long port,
-                     const std::string &strPath, const std::string &strQuery);
 
 }  // namespace host
 

@@ -62,17 +62,17 @@ bool ReplySink::Take(const char *pData, std::size_t cb, long status) noexcept {
     return true;
 }
 
-bool ReplySink::Finish(long status) noexcept {
+void ReplySink::Finish(long status) noexcept {
     if (m_pStream == nullptr) {
-        return true;
+        return;
     }
     if (status == kStatusUnchanged && m_blHasCopy) {
-        return Fail(ZELO::CRED_REQ_ERR_UNCHANGED, "the copy is current");
+        Fail(ZELO::CRED_REQ_ERR_UNCHANGED, "the copy is current");
+    } else if (!IsSuccess(status)) {
+        Fail(ZELO::CRED_REQ_ERR_STATUS, "the server answered with an error status");
+    } else if (std::fflush(m_pStream) != 0) {
+        Fail(ZELO::CRED_REQ_ERR_STREAM, std::strerror(errno));
     }
-    if (!IsSuccess(status)) {
-        return Fail(ZELO::CRED_REQ_ERR_STATUS, "the server answered with an error status");
-    }
-    return std::fflush(m_pStream) == 0 || Fail(ZELO::CRED_REQ_ERR_STREAM, std::strerror(errno));
 }
 
 }  // namespace host

@@ -21,9 +21,9 @@ class ReplySink {
     // transfer; Error then says why. Never throws: libcurl calls it.
     bool Take(const char *pData, std::size_t cb, long status) noexcept;
 
-    // Whether the whole body is where it belongs, after a transfer that went well: writes out what
-    // the stream still holds, and judges the status.
-    bool Finish(long status) noexcept;
+    // After a transfer that went well: judges the status, and writes out what the stream still
+    // holds.
+    void Finish(long status) noexcept;
 
     // A value of ZELO::CRED_REQ_ERROR, and what goes with it for people.
     int Error() const { return m_error; }

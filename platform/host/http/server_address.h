@@ -17,10 +17,14 @@ struct ServerAddress {
 
     bool IsRelayed() const { return strProtocol == "fld"; }
 
-    // Whether a request can go there, and the URL of a path there; the query is empty, or
-    // "name=value" with a value that is encoded here.
+    // The URL of a path there; the query is empty, or "name=value" with a value that is encoded
+    // here. Fails when no request can go there: the protocol is none of ours, the port out of
+    // range, or the host holds more than a name, an IPv4 or an IPv6 address.
     Status Url(const std::string &strPath, const std::string &strQuery, std::string &strUrl) const;
 };
+
+// "host:port" of an URL that Url made.
+std::string HostAndPortOf(const std::string &strUrl);
 
 Status ReadAddress(const ZELO_CRED *pCred, ServerAddress &address);
 

@@ -1,5 +1,6 @@
 #include "tls_setup.h"
 
+#include <openssl/err.h>
 #include <openssl/ssl.h>
 
 #include <new>
@@ -30,7 +31,7 @@ int NoteCertificateRequest(SSL *pTls, X509 ** /*ppCertificate*/, EVP_PKEY ** /*p
 }
 
 // Runs in place of OpenSSL's verification, which it calls, and notes what comes of it. Where
-// nothing is to be verified, all is well in the end.
+// nothing is to be verified, OpenSSL goes on all the same.
 int Verify(X509_STORE_CTX *pVerification, void *pHandle) {
     CurlHandle &handle = *static_cast<CurlHandle *>(pHandle);
     const bool blTrusted = X509_verify_cert(pVerification) == 1;
@@ -40,10 +41,14 @@ int Verify(X509_STORE_CTX *pVerification, void *pHandle) {
         X509_STORE_CTX_set_error(pVerification, X509_V_ERR_OUT_OF_MEM);
         return 0;
     }
-    if (!handle.blVerify) {
-        X509_STORE_CTX_set_error(pVerification, X509_V_OK);
-    }
-    return blTrusted || !handle.blVerify ? 1 : 0;
+    return blTrusted ? 1 : 0;
+}
+
+// libcurl does so only where it verifies.
+void AddSystemAuthorities(X509_STORE *pStore) {
+    const curl_version_info_data *const pBuilt = curl_version_info(CURLVERSION_NOW);
+    static_cast<void>(X509_STORE_load_locations(pStore, pBuilt->cainfo, pBuilt->capath));
+    ERR_clear_error();
 }
 
 CURLcode SetUpContext(CURL * /*pEasy*/, void *pContext, void *pHandle) {
@@ -53,6 +58,9 @@ CURLcode SetUpContext(CURL * /*pEasy*/, void *pContext, void *pHandle) {
     SSL_CTX_set_info_callback(pTls, NoteAlert);
     SSL_CTX_set_client_cert_cb(pTls, NoteCertificateRequest);
     SSL_CTX_set_cert_verify_callback(pTls, Verify, pHandle);
+    if (!handle.blVerify) {
+        AddSystemAuthorities(SSL_CTX_get_cert_store(pTls));
+    }
     try {
         // Trusting less than the operator meant is an error too.
         const Status added = AddAuthorities(SSL_CTX_get_cert_store(pTls));

@@ -5,6 +5,7 @@
 #include "exchange_options.h"
 #include "exchange_record.h"
 #include "fork_guard.h"
+#include "server_address.h"
 
 namespace host {
 namespace {
