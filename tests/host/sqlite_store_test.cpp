@@ -90,7 +90,6 @@ TEST(SqliteStore, FollowsTheFileThatStandsAtItsPlace) {
 }
 
 // With a write-ahead log, a change does not show in the store's file.
-// With a write-ahead log, a change does not show in the store's file.
 TEST(SqliteStore, FollowsOtherProcessesAlsoInAFileWithALog) {
     RemoveStore();
     const long id = stored::AddCredential("ZELO.QRM", "a");
