@@ -4,6 +4,7 @@
 #include <memory>
 
 #include "commands.h"
+#include "deadline.h"
 #include "indicators.h"
 #include "joined_server.h"
 #include "membership.h"
@@ -64,6 +65,9 @@ void Explain(Report &report) {
 ExitCode Status(bool blExplain, Report &report) {
     Report::Stage("judging the membership");
     int status = ZELOQRMClientStatus();
+    if (IsDeadlineOver()) {
+        return report.Done(kInconsistent);  // which tells the deadline, and no verdict
+    }
     const std::optional<ErrorId> flaw = StoreFlaw();
     // The look-ups that the judgement rests on may succeed in a store that is damaged elsewhere.
     if (flaw == ErrorId::kStoreDamaged) {

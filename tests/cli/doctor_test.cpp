@@ -67,10 +67,8 @@ std::map<std::string, std::string> Everything() {
 class SilentPort {
   public:
     explicit SilentPort(std::string strWord = {}) : m_fd(socket(AF_INET, SOCK_STREAM, 0)) {
-        sockaddr_in address = {};
+        sockaddr_in address = {AF_INET, 0, {htonl(INADDR_LOOPBACK)}, {}};
         socklen_t cb = sizeof(address);
-        address.sin_family = AF_INET;
-        address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
         bind(m_fd, reinterpret_cast<sockaddr *>(&address), cb);
         listen(m_fd, 8);
         getsockname(m_fd, reinterpret_cast<sockaddr *>(&address), &cb);

@@ -90,7 +90,6 @@ TEST(SqliteStore, FollowsTheFileThatStandsAtItsPlace) {
 }
 
 // With a write-ahead log, a change does not show in the store's file.
-// With a write-ahead log, a change does not show in the store's file.
 TEST(SqliteStore, FollowsOtherProcessesAlsoInAFileWithALog) {
     RemoveStore();
     const long id = stored::AddCredential("ZELO.QRM", "a");
@@ -222,29 +221,6 @@ TEST(SqliteStore, ARecordAndItsSessionGoTogether) {
         const stored::Session pSess(ZELOCredSessAlloc(), ZELOCredSessFree);
         EXPECT_EQ(ZELOCredSessLoad(id, pSess.get()) == 0, !blRemoved) << nth;
     }
-}
-
-TEST(SqliteStore, AWaitForAnotherProgramEndsAtTheDeadline) {
-    RemoveStore();
-    stored::AddCredential("ZELO.QRM", "a");
-    sqlite3 *pDb = nullptr;
-    ASSERT_EQ(sqlite3_open(stored::kDatabase, &pDb), SQLITE_OK);
-    ASSERT_EQ(sqlite3_exec(pDb, "BEGIN EXCLUSIVE", nullptr, nullptr, nullptr), SQLITE_OK);
-    const std::string strStore = std::string("the credential store '") + stored::kDatabase + '\'';
-    std::string strWaitsFor;
-    ZELOWaitObserverSet([](void *pText, const char *szWaitsFor,
-                           double) { *static_cast<std::string *>(pText) = szWaitsFor; },
-                        &strWaitsFor);
-    ZELODeadlineSet(1500);
-    EXPECT_EQ(FailureOf(stored::Count()), YLIBC_ERR_DEADLINE);
-    ZELODeadlineSet(-1);
-    ZELOWaitObserverSet(nullptr, nullptr);
-    EXPECT_EQ(strWaitsFor, strStore);
-    char szReason[256] = {};
-    ZELODiagnosisReason(szReason, sizeof(szReason));
-    EXPECT_TRUE(Holds(szReason, strStore)) << szReason;
-    sqlite3_close(pDb);
-    EXPECT_EQ(stored::Count(), 1);
 }
 
 TEST(SqliteStore, RemovedTokensAreGoneFromTheFile) {

@@ -2,7 +2,6 @@
 
 #include <crypt.h>
 #include <gtest/gtest.h>
-#include <shadow.h>
 #include <sys/resource.h>
 
 #include <algorithm>
@@ -410,18 +409,6 @@ TEST_F(UserGroup, ProcessesAndThreadsChangeAccountsAtOnceAndLoseNothing) {
     EXPECT_GT(alarm(0), 0U);
     EXPECT_EQ(YLIBUserNumRemained(), 100 - kProcesses * (kUsers - 1) - 1);
     EXPECT_EQ(Findings(), "");
-}
-
-TEST_F(UserGroup, AChangeWaitsForTheSystemsToolsUntilTheDeadline) {
-    ASSERT_EQ(lckpwdf(), 0);
-    ZELODeadlineSet(200);
-    EXPECT_EQ(FailureOf(Add(NewUser(kName, 50000))), YLIBC_ERR_DEADLINE);
-    EXPECT_EQ(failures::Reason(), "the deadline came while waiting for the lock '/etc/.pwd.lock'");
-    EXPECT_EQ(Get(kName), nullptr);
-    EXPECT_EQ(YLIBCErrGet(), static_cast<unsigned>(YLIBC_ERR_NOT_FOUND)) << "a look-up waits not";
-    ulckpwdf();
-    EXPECT_EQ(Add(NewUser(kName, 50000)), 0);
-    ZELODeadlineSet(-1);
 }
 
 TEST_F(UserGroup, PreferencesStayInTheirFolder) {

@@ -115,6 +115,17 @@ TEST_F(Request, OnlyAVerifiedServerIsSpokenTo) {
     EXPECT_FALSE(isTrusted());
     fs::remove(kOtherCaFile);
     EXPECT_TRUE(isTrusted());
+
+    devserver::Options expired;
+    expired.certificate.not_after = std::time(nullptr) - 60;
+    devserver::Options otherName;
+    otherName.certificate.names = {"other.example"};
+    for (const devserver::Options &options : {expired, otherName}) {
+        Start(options);
+        Replace(kCaFile, m_pServer->CaPem());
+        EXPECT_FALSE(isTrusted());
+        EXPECT_TRUE(m_pServer->Requests().empty());
+    }
 }
 
 TEST_F(Request, OnlyKnownProtocolsAndPlainHostsAreUsed) {

@@ -4,20 +4,28 @@
 #ifndef ZELO_TESTS_MEMBERSHIP_STATE_H
 #define ZELO_TESTS_MEMBERSHIP_STATE_H
 
+#include <gtest/gtest.h>
+
+#include <algorithm>
 #include <filesystem>
 #include <string>
 
 #include "accounts.h"
 #include "key_value_file.h"
+#include "last_error.h"
 #include "process.h"
 #include "stored.h"
 #include "web_session.h"
+#include "zeloqrmclient.h"
 
 namespace membership {
 
 constexpr const char *kUser = "ZelonixQRM";
 constexpr const char *kFolder = "/usr/zelo/etc/QRM";
 constexpr const char *kPreference = "/usr/zelo/etc/preference/ZelonixQRM";
+constexpr const char *kTold = "/tmp/told";
+constexpr const char *kPluginFolder = "/usr/zelo/etc/plugins/qrm_client/disjoin";
+constexpr const char *kSettings = "/usr/zelo/etc/preference/ZelonixQRM/usersettings";
 constexpr const char *kSessions[] = {"ZELO.QRM.Client", "ZELO.QRM.Client.Machine"};
 constexpr const char *kApplications[] = {"ZELO.QRM", "ZELO.NotificationCenter"};
 
@@ -100,6 +108,55 @@ inline void Build(const accounts::Files &files) {
     YLIBCINFOSetKeyValue("join_nvo_qrm", "yes");
     YLIBGroupExtraAdminSet("QRM", 1, 2, 3, 4);
 }
+
+// An appliance without a membership, and a plug-in that tells what it is told.
+class Membership : public testing::Test {
+  protected:
+    static void SetUpTestSuite() {
+        files::fs::create_directories(kPluginFolder);
+        files::WriteProgram(std::string(kPluginFolder) + "/50-told",
+                            "echo \"$1 $QRM_CLIENT_RESULT <$QRM_CLIENT_HOST> "
+                            "<$QRM_CLIENT_PROTOCOL> $QRM_CLIENT_PORT <$QRM_CLIENT_SN> "
+                            "$QRM_CLIENT_REJOIN $QRM_CLIENT_FROM "
+                            "$QRM_CLIENT_CLEAR_GLUSTER\" >>/tmp/told");
+        s_without = accounts::ReadFiles();
+        ASSERT_TRUE(ZELOQRMClientCreateServerUser());
+        s_with = accounts::ReadFiles();
+    }
+    static void TearDownTestSuite() { Clear(s_without); }
+    void SetUp() override { Reset(); }
+
+    static void Reset() {
+        Clear(s_without);
+        Forget();
+    }
+    // The account, in no group of its own.
+    static accounts::Files WithoutMember() {
+        accounts::Files files = s_with;
+        files["group"] = s_without["group"];
+        files["gshadow"] = s_without["gshadow"];
+        return files;
+    }
+    static void BuildWhole() {
+        Build(s_with);
+        Forget();
+    }
+    static void Forget() {
+        files::fs::remove(kTold);
+        files::fs::remove(files::kJournal);
+        YLIBCErrSetEx(0x123, "x", 1);
+    }
+
+    // The account's state, the system's own checks included.
+    static std::string AccountState() {
+        return Remains() + accounts::Findings() +
+               (accounts::ReadFiles()["shadow"] == s_with["shadow"] ? " same password" : "") +
+               (files::fs::exists(kSettings) ? " hidden" : "");
+    }
+
+    inline static accounts::Files s_without;
+    inline static accounts::Files s_with;
+};
 
 }  // namespace membership
 
