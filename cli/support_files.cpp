@@ -135,6 +135,10 @@ int RunAgain(std::vector<std::string> words, const NamelessFile &out, const Name
 // which comes no later than this program's.
 std::string OutputOf(std::vector<std::string> words, bool blJson, double limit_s) {
     constexpr double kLeast_s = 0.01;
+    // Nothing is begun that would outlast the deadline.
+    if (IsDeadlineOver()) {
+        return "It was not run: the deadline was over.\n";
+    }
     Report::Stage("running qrmctl " + words.front());
     const double deadline_s = std::max(kLeast_s, std::min(limit_s, DeadlineLeft_s()));
     words.insert(words.end(), {"--deadline", std::to_string(deadline_s)});
@@ -237,10 +241,10 @@ std::string ClientInfo() {
 }
 
 bool IsOurLine(const std::string &strLine) {
-    constexpr std::array<const char *, 8> kParts = {"qrm",           "zelo",
-                                                    "http_exchange", "web_api_request",
-                                                    "appliance_ca",  "sqlite_database",
-                                                    "notification",  "key_value_file"};
+    // The tools, the library, and the host platform's sources.
+    constexpr std::array<const char *, 9> kParts = {
+        "qrm",          "zelo",           "discovery",       "http_exchange", "damaged_store",
+        "notification", "program_folder", "sqlite_database", "store_file"};
     return std::any_of(kParts.begin(), kParts.end(), [&](const char *szPart) {
         return strLine.find(szPart) != std::string::npos;
     });
