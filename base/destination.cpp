@@ -11,6 +11,8 @@
 #include <climits>
 #include <utility>
 
+#include "own_file.h"
+
 namespace destination {
 namespace {
 
@@ -37,6 +39,10 @@ bool IsSafe(const struct stat &folder, const struct stat *pEntry, Place &place) 
     // The sticky bit keeps others from renaming and removing what is not theirs.
     place.blFixed =
         place.blFixed && (!place.blShared || (blTrusted && (folder.st_mode & S_ISVTX) != 0));
+    const bool blOthersWrite = (folder.st_mode & (S_IWGRP | S_IWOTH)) != 0;
+    const bool blOwnEntry = pEntry != nullptr && own_file::IsRootOrCaller(pEntry->st_uid);
+    place.blOwn = place.blOwn && own_file::IsRootOrCaller(folder.st_uid) &&
+                  (!blOthersWrite || (blOwnEntry && (folder.st_mode & S_ISVTX) != 0));
     return !place.blShared || blTrusted || !S_ISLNK(pEntry->st_mode);
 }
 

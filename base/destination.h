@@ -22,6 +22,7 @@ struct Place {
     Descriptor file;        // not open: nothing stands there
     bool blShared = false;  // everybody can write to the folder
     bool blFixed = true;    // nobody but the owners on the way can make the path lead elsewhere
+    bool blOwn = true;      // nobody but root and the caller can
 };
 
 enum class Result { kFound, kForeignLink, kFailed };

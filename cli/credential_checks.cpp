@@ -48,6 +48,7 @@ Check StoreUnreadable() {
                 "the credential store is damaged or of another format",
                 "restore a copy, or run 'qrmctl leave', which sets it aside, then 'qrmctl join'"};
         case YLIBC_ERR_STORE_BUSY:
+        case YLIBC_ERR_DEADLINE:
             return {"credential", Outcome::kFailed, 0,
                     "another program keeps the credential store locked",
                     "wait for that program, or find and end it; then try again"};
@@ -130,8 +131,10 @@ Check CheckToken(const Stored &stored) {
     const bool blAnswered = pRequest != nullptr && pRequest->Process(false, kStep_s);
     ZELO::CredRequestUtil::SetProgressObserver(nullptr, nullptr);
     if (!blAnswered) {
-        return {"token", Outcome::kFailed, watch.Elapsed_ms(), "the stored server does not answer",
-                "run 'qrmctl doctor' without candidates: it checks the stored connection"};
+        return {
+            "token", Outcome::kFailed, watch.Elapsed_ms(), "the stored server does not answer",
+            "mend what the checks of its connection say, which 'qrmctl doctor' without candidates "
+            "makes; where they succeed, look at the server's own log"};
     }
     return Judge(pRequest->GetResponse(), watch.Elapsed_ms());
 }

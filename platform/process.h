@@ -16,8 +16,9 @@ extern "C" {
 // standard streams lead to the null device), no blocked or ignored signals, and a process group of
 // its own. What it leaves running behind it runs on.
 //
-// A program that others than root and the caller can write to, or that stands in a folder that they
-// can write to, is refused (YLIBC_ERR_UNSAFE_FILE); links to it are as good as their folders.
+// A program that others than root and the caller can write to is refused (YLIBC_ERR_UNSAFE_FILE),
+// and so is one that they can put another one in the place of: by a folder on the way to it, or by
+// one that a link on that way stands in.
 //
 // The operation waits for the program's end. A program that runs for longer than the platform's
 // limit, or past the process's deadline (diagnosis.h), is ended with its whole process group.

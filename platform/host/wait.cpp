@@ -89,9 +89,14 @@ Status Wait::TimeUp(unsigned int code) const {
         return HOST_ERROR(YLIBC_ERR_DEADLINE,
                           "the deadline came while waiting for " + m_strWaitsFor);
     }
-    const auto limit = std::chrono::duration_cast<std::chrono::seconds>(m_end - m_begin);
-    return HOST_ERROR(
-        code, "waited " + std::to_string(limit.count()) + " s for " + m_strWaitsFor + ", in vain");
+    const auto limit = std::chrono::duration_cast<std::chrono::milliseconds>(m_end - m_begin);
+    constexpr long kPerSecond = 1000;
+    const std::string strLimit = limit.count() % kPerSecond == 0
+                                     ? std::to_string(limit.count() / kPerSecond) + " s"
+                                     : std::to_string(limit.count()) + " ms";
+    return HOST_ERROR(code, limit.count() <= 0
+                                ? m_strWaitsFor + " is not free"
+                                : "waited " + strLimit + " for " + m_strWaitsFor + ", in vain");
 }
 
 }  // namespace host

@@ -164,17 +164,20 @@ TEST_F(Exec, SaysWhenAProgramCannotBeRun) {
 
 TEST_F(Exec, RunsOnlyWhatNobodyElseCanChange) {
     fs::create_directory("/tmp/programs/open");
-    for (const char *szProgram : {"good", "changeable", "open/program"}) {
+    fs::create_directories("/tmp/programs/group/sub");
+    for (const char *szProgram : {"good", "changeable", "open/program", "group/sub/program"}) {
         Write((std::string(kPrograms) + '/' + szProgram).c_str(), "#!/bin/sh\n");
     }
     chmod("/tmp/programs/changeable", 0775);
     chmod("/tmp/programs/open", 0777);
+    chmod("/tmp/programs/group", 0775);
     fs::create_symlink("good", "/tmp/programs/link");
     fs::create_symlink("../good", "/tmp/programs/open/link");
     const std::pair<const char *, int> rows[] = {{"good", YLIBC_ERR_NONE},
                                                  {"link", YLIBC_ERR_NONE},
                                                  {"changeable", YLIBC_ERR_UNSAFE_FILE},
                                                  {"open/program", YLIBC_ERR_UNSAFE_FILE},
+                                                 {"group/sub/program", YLIBC_ERR_UNSAFE_FILE},
                                                  {"open/link", YLIBC_ERR_UNSAFE_FILE}};
     for (const auto &[szName, error] : rows) {
         const std::string strProgram = std::string(kPrograms) + '/' + szName;

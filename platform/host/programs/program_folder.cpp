@@ -13,6 +13,7 @@
 #include <utility>
 
 #include "destination.h"
+#include "own_file.h"
 #include "program.h"
 #include "system_log.h"
 
@@ -22,12 +23,8 @@ namespace {
 constexpr std::string_view kTopFolder = "/usr/zelo/etc";
 constexpr const char *kChangeable = "it can be changed by others than root";
 
-// The owner of "/usr/bin" is root, under another name where a user has a box of his own.
 bool OthersCanChange(const struct stat &status) {
-    struct stat system = {};
-    const bool blOurs = status.st_uid == 0 || status.st_uid == geteuid() ||
-                        (stat("/usr/bin", &system) == 0 && status.st_uid == system.st_uid);
-    return !blOurs || (status.st_mode & (S_IWGRP | S_IWOTH)) != 0;
+    return !own_file::IsRootOrCaller(status.st_uid) || (status.st_mode & (S_IWGRP | S_IWOTH)) != 0;
 }
 
 Status Refusal(unsigned int code, const std::string &strFolder, const char *szReason) {
@@ -102,7 +99,7 @@ Status CheckProgram(const std::string &strPath) {
     if (blThere && !S_ISREG(file.st_mode)) {
         return HOST_ERROR(YLIBC_ERR_EXEC, "cannot run '" + strPath + "': it is no regular file");
     }
-    if (!blThere || !place.blFixed || OthersCanChange(folder) || OthersCanChange(file)) {
+    if (!blThere || !place.blOwn || OthersCanChange(folder) || OthersCanChange(file)) {
         return HOST_ERROR(YLIBC_ERR_UNSAFE_FILE, "'" + strPath + "' is not run: " + kChangeable);
     }
     return {};
