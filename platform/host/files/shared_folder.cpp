@@ -55,19 +55,26 @@ bool IsForeignToRoot(const std::string &strPath, const struct stat &there) {
            !ReadShared(FolderOf(strPath), blShared).Failed() && blShared;
 }
 
-// A folder may hold things, so the name is freed first.
+// A folder may hold things, so the name is freed first. Another program of root's may have been
+// quicker: its file gets the name back, also from whoever has taken it since.
 void RemoveForeign(const std::string &strPath) {
     const std::string strAway = UnusedName(strPath);
+    const auto giveBack = [&](unsigned int flags) {
+        return renameat2(AT_FDCWD, strAway.c_str(), AT_FDCWD, strPath.c_str(), flags) == 0;
+    };
     struct stat moved = {};
     if (strAway.empty() || rename(strPath.c_str(), strAway.c_str()) != 0 ||
         lstat(strAway.c_str(), &moved) != 0) {
         return;
     }
-    const bool blPutBack = moved.st_uid == 0 && renameat2(AT_FDCWD, strAway.c_str(), AT_FDCWD,
-                                                          strPath.c_str(), RENAME_NOREPLACE) == 0;
-    if (!blPutBack) {
-        RemoveAny(strAway);
+    struct stat there = {};
+    if (moved.st_uid == 0 && giveBack(RENAME_NOREPLACE)) {
+        return;
     }
+    if (moved.st_uid == 0 && lstat(strPath.c_str(), &there) == 0 && there.st_uid != 0) {
+        static_cast<void>(giveBack(RENAME_EXCHANGE));
+    }
+    RemoveAny(strAway);
 }
 
 void RemoveAny(const std::string &strPath) {
