@@ -4,76 +4,16 @@
 
 #include <fcntl.h>
 #include <gtest/gtest.h>
-#include <sys/syscall.h>
 
-#include <atomic>
 #include <chrono>
 #include <set>
 
-#include "children.h"
 #include "failures.h"
-#include "files.h"
-
-namespace {
-std::atomic<int> g_syncs = 0;
-}  // namespace
-
-// The platform's calls come here first.
-extern "C" int fsync(int fd) {
-    ++g_syncs;
-    return static_cast<int>(syscall(SYS_fsync, fd));
-}
+#include "key_value.h"
 
 namespace {
 
-using namespace files;
-using Set = std::set<std::string>;
-using std::string_literals::operator""s;
-
-constexpr const char *kFolder = "/tmp/shared";
-constexpr const char *kFile = "/tmp/shared/a.conf";
-constexpr const char *kTemporary = "/tmp/shared/.a.conf.zelo-new";
-constexpr const char *kVictim = "/tmp/victim.conf";
-
-// A folder that everybody can write to, empty.
-class KeyValueFile : public testing::Test {
-  protected:
-    void SetUp() override {
-        fs::remove_all(kFolder);
-        fs::create_directory(kFolder);
-        chmod(kFolder, 01777);
-    }
-};
-
-Set Names(const char *szFolder) {
-    Set names;
-    for (const auto &entry : fs::directory_iterator(szFolder)) {
-        names.insert(entry.path().filename());
-    }
-    return names;
-}
-
-std::string Value(const char *szPath, const char *szKey) {
-    std::string strValue(100000, 'x');
-    const int cb = YLIBCFileGetKeyValue(szPath, szKey, strValue.data(), 100000, 0);
-    return cb < 0 ? "unreadable" : strValue.substr(0, static_cast<std::size_t>(cb));
-}
-
-int SetValue(const char *szPath, const std::string &strKey, const std::string &strValue) {
-    return YLIBCFileSetKeyValue(szPath, strKey.c_str(), strValue.c_str(), 0);
-}
-
-// Sets keys in so many processes at once; false when one of them has failed.
-bool SetInProcesses(int processes, int keys,
-                    const std::function<bool(const std::string &strKey)> &set) {
-    return children::InEach(processes, [&](int process) {
-        bool blAll = true;
-        for (int i = 0; i < keys; ++i) {
-            blAll = set(std::to_string(process) + '.' + std::to_string(i)) && blAll;
-        }
-        return blAll;
-    });
-}
+using namespace key_value;
 
 TEST_F(KeyValueFile, ReadsEveryFormOfALine) {
     const std::string strLong(60000, 'v');
@@ -195,22 +135,6 @@ TEST_F(KeyValueFile, AChangeLeavesAllOtherLinesAndTheModeAsTheyWere) {
     umask(umaskBefore);
 }
 
-TEST_F(KeyValueFile, WritesOnlyWhatIsNewAndWaitsOnlyForWhatOutlivesARestart) {
-    fs::remove("/etc/a.conf");
-    const std::pair<const char *, int> rows[] = {{kFile, 0}, {"/etc/a.conf", 2}};
-    for (const auto &[szPath, syncs] : rows) {
-        g_syncs = 0;
-        EXPECT_EQ(YLIBCFileRemoveKey(szPath, "k"), 0);
-        EXPECT_FALSE(fs::exists(szPath));
-        EXPECT_EQ(SetValue(szPath, "k", "v w"), 0);
-        const ino_t inode = Status(szPath).st_ino;
-        EXPECT_EQ(SetValue(szPath, "k", "v w"), 0);
-        EXPECT_EQ(YLIBCFileRemoveKey(szPath, "absent"), 0);
-        EXPECT_EQ(Status(szPath).st_ino, inode);
-        EXPECT_EQ(g_syncs, syncs);
-    }
-}
-
 TEST_F(KeyValueFile, APairThatSomebodyElseHasChangedIsWrittenAgain) {
     const std::pair<const char *, std::function<void()>> rows[] = {
         {"overwritten, with the old size and time",
@@ -222,8 +146,8 @@ TEST_F(KeyValueFile, APairThatSomebodyElseHasChangedIsWrittenAgain) {
          }},
         {"replaced",
          [] {
-             WriteFile(kTemporary, "k=\"b\"\n");
-             fs::rename(kTemporary, kFile);
+             WriteFile("/tmp/shared/other", "k=\"b\"\n");
+             fs::rename("/tmp/shared/other", kFile);
          }},
         {"removed", [] { fs::remove(kFile); }},
     };
@@ -238,40 +162,6 @@ TEST_F(KeyValueFile, APairThatSomebodyElseHasChangedIsWrittenAgain) {
         EXPECT_EQ(SetValue(kFile, "k", "a"), 0);
         EXPECT_EQ(Value(kFile, "k"), "a") << szHow;
     }
-}
-
-TEST_F(KeyValueFile, InASharedFolderTrapsAreLeftAlone) {
-    using Trap = std::function<void(const char *szPath)>;
-    const std::pair<const char *, Trap> traps[] = {
-        {"link", [](const char *szPath) { fs::create_symlink(kVictim, szPath); }},
-        {"dangling link", [](const char *szPath) { fs::create_symlink("/tmp/lured", szPath); }},
-        {"second name", [](const char *szPath) { fs::create_hard_link(kVictim, szPath); }},
-        {"folder", [](const char *szPath) { fs::create_directory(szPath); }},
-        {"FIFO", [](const char *szPath) { mkfifo(szPath, 0666); }},
-    };
-    fs::remove("/etc/to-shared.conf");
-    fs::create_symlink(kFile, "/etc/to-shared.conf");
-    WriteFile(kVictim, "k=secret\n");
-    for (const auto &[szTrap, set] : traps) {
-        SCOPED_TRACE(szTrap);
-        SetUp();
-        set(kFile);
-        for (const char *szPath : {kFile, "/etc/to-shared.conf"}) {
-            for (int result : {YLIBCFileCheckKeyValue(szPath, "k", "secret", 0),
-                               SetValue(szPath, "k", "v"), YLIBCFileRemoveKey(szPath, "k")}) {
-                EXPECT_EQ(FailureOf(result), YLIBC_ERR_UNSAFE_FILE);
-            }
-        }
-        EXPECT_EQ(Names(kFolder), Set{"a.conf"});
-        // At the temporary file's name it is no hindrance.
-        SetUp();
-        set(kTemporary);
-        EXPECT_EQ(SetValue(kFile, "k", "v"), 0);
-        EXPECT_EQ(FileText(kFile), "k=\"v\"\n");
-        EXPECT_EQ(Names(kFolder), (Set{"a.conf", ".a.conf.zelo-new"}));
-    }
-    EXPECT_EQ(FileText(kVictim), "k=secret\n");
-    EXPECT_FALSE(fs::exists("/tmp/lured"));
 }
 
 TEST_F(KeyValueFile, AnotherUsersFileIsNotBelievedAndMakesRoom) {
@@ -302,34 +192,6 @@ TEST_F(KeyValueFile, ElsewhereLinksAreFollowedAndStay) {
     for (const char *szLink : {"/etc/a/first", "/etc/a/b/second", "/etc/a/dangling"}) {
         EXPECT_TRUE(S_ISLNK(Status(szLink).st_mode)) << szLink;
     }
-}
-
-TEST_F(KeyValueFile, WritersOfThePlatformsSettingsExcludeEachOther) {
-    Set names = Names("/etc");
-    const std::size_t linesBefore = FileLines("/etc/zeloinfo.conf").size();
-    EXPECT_TRUE(SetInProcesses(
-        4, 10, [](const auto &strKey) { return YLIBCINFOSetKeyValue(strKey.c_str(), "v") == 0; }));
-    EXPECT_EQ(FileLines("/etc/zeloinfo.conf").size(), linesBefore + 40);
-    names.insert(".zeloinfo.conf.lock");
-    EXPECT_EQ(Names("/etc"), names);
-}
-
-TEST_F(KeyValueFile, WritersWithoutALockLeaveWholeFiles) {
-    const std::string strRest = std::string(200000, '#') + "\nend=here\n";
-    WriteFile(kFile, "k=0\n" + strRest);
-    WriteFile(kTemporary, "what a killed writer has left");
-    const auto writeOn = [](const std::string &strKey) {
-        return SetValue(kFile, "k", strKey) == 0;
-    };
-    const pid_t pid = children::Start([&] { return SetInProcesses(3, 150, writeOn); });
-    int status = -1;
-    while (waitpid(pid, &status, WNOHANG) == 0) {
-        const std::string strContent = FileText(kFile);
-        ASSERT_EQ(strContent.substr(strContent.find('\n') + 1), strRest);
-    }
-    EXPECT_EQ(status, 0);
-    EXPECT_NE(Value(kFile, "k"), "0");
-    EXPECT_EQ(Names(kFolder), Set{"a.conf"});
 }
 
 }  // namespace
