@@ -19,6 +19,7 @@
 
 #include "clock_check.h"
 #include "deadline.h"
+#include "descriptor.h"
 #include "diagnosis.h"
 #include "fixed_text.h"
 #include "key_value_file.h"
@@ -76,32 +77,23 @@ std::string LastLines(const std::string &strText, std::size_t count,
     return strLast;
 }
 
-// A file without a name, closed at the end of its scope.
+// A file without a name.
 class NamelessFile {
   public:
-    NamelessFile() : m_fd(memfd_create("output", MFD_CLOEXEC)) {}
-    ~NamelessFile() {
-        if (m_fd >= 0) {
-            close(m_fd);
-        }
-    }
-    NamelessFile(const NamelessFile &) = delete;
-    NamelessFile &operator=(const NamelessFile &) = delete;
-
-    int Descriptor() const { return m_fd; }
+    int Get() const { return m_file.Get(); }
     std::string Text() const {
         struct stat status = {};
         std::string strText;
-        if (fstat(m_fd, &status) == 0) {
+        if (fstat(Get(), &status) == 0) {
             strText.resize(static_cast<std::size_t>(status.st_size));
-            const ssize_t cb = pread(m_fd, strText.data(), strText.size(), 0);
+            const ssize_t cb = pread(Get(), strText.data(), strText.size(), 0);
             strText.resize(cb < 0 ? 0 : static_cast<std::size_t>(cb));
         }
         return strText;
     }
 
   private:
-    int m_fd;
+    const Descriptor m_file{memfd_create("output", MFD_CLOEXEC)};
 };
 
 // Runs this very program with these arguments; returns its exit status, -1 when it cannot be run.
@@ -116,8 +108,8 @@ int RunAgain(std::vector<std::string> words, const NamelessFile &out, const Name
     posix_spawn_file_actions_t actions;
     posix_spawn_file_actions_init(&actions);
     posix_spawn_file_actions_addopen(&actions, STDIN_FILENO, "/dev/null", O_RDONLY, 0);
-    posix_spawn_file_actions_adddup2(&actions, out.Descriptor(), STDOUT_FILENO);
-    posix_spawn_file_actions_adddup2(&actions, err.Descriptor(), STDERR_FILENO);
+    posix_spawn_file_actions_adddup2(&actions, out.Get(), STDOUT_FILENO);
+    posix_spawn_file_actions_adddup2(&actions, err.Get(), STDERR_FILENO);
     pid_t pid = -1;
     const int result =
         posix_spawn(&pid, "/proc/self/exe", &actions, nullptr, arguments.data(), environ);
