@@ -163,18 +163,18 @@ CredRequest *CredRequest::CreateWebAPIRequest(const ZELO_CRED *pCred, const ZELO
                                               const std::string &api, int ver,
                                               const std::string &method,
                                               const Json::Value &params) {
-    CredRequest *pResult = nullptr;
-    return HOST_OPERATION(pResult, pResult, [&]() -> host::Status {
+    using RequestHandle = std::unique_ptr<CredRequest>;
+    RequestHandle pRequest;
+    const auto create = [&]() -> host::Status {
         HOST_REQUIRE(pSess != nullptr);
-        auto pRequest = std::make_unique<CredRequest>();
+        pRequest = std::make_unique<CredRequest>();
         REQUIRE_IMPL(pRequest->m_pImpl);
         Impl &impl = *pRequest->m_pImpl;
         HOST_TRY(impl.SetTokens(*pSess));
         HOST_TRY(impl.AddParams(params.isNull() ? Json::Value(Json::objectValue) : params));
-        HOST_TRY(impl.SetUrl(pCred, api, ver, method));
-        pResult = pRequest.release();
-        return {};
-    });
+        return impl.SetUrl(pCred, api, ver, method);
+    };
+    return HOST_OPERATION(RequestHandle(), pRequest, create).release();
 }
 
 CredRequest *CredRequest::CreateWebAPIRequest(long id, const std::string &api, int ver,
