@@ -18,6 +18,7 @@
 #include "api.h"
 #include "text_containers.h"
 
+// Exports an operation that a port may leave out.
 #define ZELO_DIAGNOSIS_API ZELO_PLATFORM_API __attribute__((weak))
 
 extern "C" {
@@ -85,7 +86,7 @@ namespace ZELO {
 
 // The certificate that a server showed.
 struct ServerCertificate {
-    bool blShown = false;
+    bool blShown = false;    // there was one
     std::string strSubject;  // such as "CN=qrm.example,O=Example"
     std::string strIssuer;
     std::string strNames;  // for which hosts it is, such as "DNS:qrm.example, IP Address:192.0.2.7"
@@ -120,9 +121,9 @@ struct Exchange {
     long whole_ms = -1;       // the end of the exchange, whatever came of it
     bool blTimedOut = false;  // a limit of its time ended it
 
-    int relayStatus = 0;        // what the relay, or a proxy, answered; 0: nothing
-    std::string strTlsVersion;  // such as "TLSv1.3"
-    ServerCertificate certificate;
+    int relayStatus = 0;              // what the relay, or a proxy, answered; 0: nothing
+    std::string strTlsVersion;        // such as "TLSv1.3"
+    ServerCertificate certificate;    // that was shown
     bool blCertificateAsked = false;  // the server asked for one of this client, which has none
 
     int httpStatus = 0;         // 0: no answer arrived
