@@ -276,23 +276,6 @@ TEST_F(UserGroup, TheNumberOfUsersIsLimited) {
     EXPECT_EQ(YLIBCErrGet(), 0x1234U) << "a success is no error";
 }
 
-TEST_F(UserGroup, AChildChangesAccountsWhateverAThreadDidAtTheFork) {
-    std::atomic<bool> blEnd{false};
-    std::thread other([&blEnd] {
-        for (bool blEmpty = false; !blEnd; blEmpty = !blEmpty) {
-            SetMembers(blEmpty ? Names() : Names({"nobody"}));
-        }
-    });
-    for (int i = 0; i < 5; ++i) {
-        EXPECT_TRUE(children::InOne([] {
-            alarm(60);  // ends a child that hangs
-            return SetMembers({"daemon"}) == 0;
-        }));
-    }
-    blEnd = true;
-    other.join();
-}
-
 TEST_F(UserGroup, LinesOfAnyFormStayByteForByte) {
     const Files odd = {
         {"passwd",
