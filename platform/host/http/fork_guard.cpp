@@ -1,22 +1,34 @@
 #include "fork_guard.h"
 
 #include <pthread.h>
+#include <unistd.h>
+
+#include <atomic>
+#include <mutex>
 
 namespace host {
 namespace {
 
-// A fork that waits goes before those who come later.
-constexpr pthread_rwlock_t kFree = PTHREAD_RWLOCK_WRITER_NONRECURSIVE_INITIALIZER_NP;
-
-pthread_rwlock_t g_lock = kFree;
+// Who enters passes the gate, which a fork holds. Who is inside does not need it to leave.
+std::mutex g_gate;
+std::atomic<int> g_inside{0};
 void (*g_pfnInChild)() = nullptr;
 
 void Enter() {
-    pthread_rwlock_rdlock(&g_lock);
+    const std::lock_guard<std::mutex> gate(g_gate);
+    ++g_inside;
 }
 
 void Leave() {
-    pthread_rwlock_unlock(&g_lock);
+    --g_inside;
+}
+
+void AwaitNobodyInside() {
+    constexpr useconds_t kPause_us = 100;
+    g_gate.lock();
+    while (g_inside != 0) {
+        usleep(kPause_us);
+    }
 }
 
 }  // namespace
@@ -39,13 +51,12 @@ OutsideLibcurl::~OutsideLibcurl() {
 
 int GuardForks(void (*pfnInChild)()) {
     g_pfnInChild = pfnInChild;
-    return pthread_atfork([] { pthread_rwlock_wrlock(&g_lock); },
-                          [] { pthread_rwlock_unlock(&g_lock); },
-                          [] {
-                              // The parent's thread holds the lock; the child's has another id.
-                              g_lock = kFree;
-                              g_pfnInChild();
-                          });
+    return pthread_atfork(
+        AwaitNobodyInside, [] { g_gate.unlock(); },
+        [] {
+            g_gate.unlock();
+            g_pfnInChild();
+        });
 }
 
 }  // namespace host
